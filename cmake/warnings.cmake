@@ -1,0 +1,20 @@
+# Warnings are errors in our own targets; third-party headers are included as
+# system headers and stay quiet.
+function(mokuto_warnings target)
+  target_compile_options(${target} PRIVATE
+    -Wall -Wextra -Wpedantic -Wconversion -Wsign-conversion -Wshadow
+    -Wnon-virtual-dtor -Woverloaded-virtual -Wnull-dereference -Werror)
+  if(CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
+    # False positives of g++ 12 in std::variant and std::function internals.
+    target_compile_options(${target} PRIVATE -Wno-maybe-uninitialized -Wno-dangling-reference)
+  endif()
+endfunction()
+
+# A unit-test executable registered with CTest.
+function(mokuto_test name)
+  cmake_parse_arguments(T "" "" "SOURCES;LIBS" ${ARGN})
+  add_executable(${name} ${T_SOURCES})
+  mokuto_warnings(${name})
+  target_link_libraries(${name} PRIVATE ${T_LIBS} GTest::gmock GTest::gtest_main)
+  gtest_discover_tests(${name} DISCOVERY_TIMEOUT 60 PROPERTIES TIMEOUT 120)
+endfunction()

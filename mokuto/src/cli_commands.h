@@ -1,0 +1,13 @@
+#pragma once
+// The subcommands of the `mokuto` command. Each registers itself on the application;
+// its callback stores the process exit status in `status`.
+#include <CLI/CLI.hpp>
+
+namespace mokuto::cli {
+
+// mokuto config --apply JSON
+void addConfigCommand(CLI::App& app, int& status);
+// mokuto parse [--japanese] [TEXT]
+void addParseCommand(CLI::App& app, int& status);
+
+}  // namespace mokuto::cli
