@@ -8,20 +8,23 @@ const char* const kPostureFamilyFolders[3] = {"Stand", "Sit", "SitOnPod"};
 
 BodyLanguageMode bodyLanguageModeFromStr(std::string_view name) noexcept {
   for (BodyLanguageMode m = 0; m < BODY_LANGUAGE_MODE_END_OF_ENUM; ++m) {
-    if (name == kBodyLanguageModeNames[m]) return m;
+    if (name == kBodyLanguageModeNames[m])
+      return m;
   }
   return BODY_LANGUAGE_MODE_END_OF_ENUM;
 }
 
 const char* bodyLanguageModeToStr(BodyLanguageMode mode) noexcept {
-  if (mode < 0 || mode >= BODY_LANGUAGE_MODE_END_OF_ENUM) return kBodyLanguageModeNames[3];
+  if (mode < 0 || mode >= BODY_LANGUAGE_MODE_END_OF_ENUM)
+    return kBodyLanguageModeNames[3];
   return kBodyLanguageModeNames[mode];
 }
 
 std::string bodyLanguageModeNameList() {
   std::string out;
   for (BodyLanguageMode m = 0; m < BODY_LANGUAGE_MODE_END_OF_ENUM; ++m) {
-    if (m > 0) out += (m == BODY_LANGUAGE_MODE_END_OF_ENUM - 1) ? " and " : ", ";
+    if (m > 0)
+      out += (m == BODY_LANGUAGE_MODE_END_OF_ENUM - 1) ? " and " : ", ";
     out += '"';
     out += kBodyLanguageModeNames[m];
     out += '"';
@@ -31,13 +34,15 @@ std::string bodyLanguageModeNameList() {
 
 PostureFamily postureFamilyFromStr(std::string_view name) noexcept {
   for (PostureFamily f = 0; f < Unknown; ++f) {
-    if (name == kPostureFamilyNames[f]) return f;
+    if (name == kPostureFamilyNames[f])
+      return f;
   }
   return Unknown;
 }
 
 const char* postureFamilyToStr(PostureFamily family) noexcept {
-  if (family < 0 || family > Unknown) return kPostureFamilyNames[Unknown];
+  if (family < 0 || family > Unknown)
+    return kPostureFamilyNames[Unknown];
   return kPostureFamilyNames[family];
 }
 

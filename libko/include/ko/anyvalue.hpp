@@ -66,7 +66,8 @@ class Box {
   Box(const Box& o) : p_(std::make_unique<T>(*o.p_)) {}
   Box(Box&&) noexcept = default;
   Box& operator=(const Box& o) {
-    if (this != &o) p_ = std::make_unique<T>(*o.p_);
+    if (this != &o)
+      p_ = std::make_unique<T>(*o.p_);
     return *this;
   }
   Box& operator=(Box&&) noexcept = default;
@@ -107,7 +108,7 @@ class AnyValue {
     std::vector<std::uint8_t> bytes;
   };
   struct Pointer {
-    AnyObject object;  // set when it points to an object
+    AnyObject object;                         // set when it points to an object
     std::shared_ptr<const AnyValue> pointee;  // otherwise, the value pointed to
   };
 
@@ -137,8 +138,7 @@ class AnyValue {
   // written inline: obj.call<int>("add", {1, 2}).
   AnyValue(bool b) : AnyValue(boolean(b)) {}
   template <std::integral T>
-    requires(!std::same_as<T, bool> && !std::same_as<T, char>)
-  AnyValue(T v)
+  requires(!std::same_as<T, bool> && !std::same_as<T, char>) AnyValue(T v)
       : AnyValue(integer(static_cast<std::int64_t>(v), sizeof(T), std::is_signed_v<T>)) {}
   AnyValue(float f) : AnyValue(floating(f, 4)) {}
   AnyValue(double d) : AnyValue(floating(d, 8)) {}
@@ -215,8 +215,7 @@ struct TypeSignature<bool> {
   static std::string get() { return "b"; }
 };
 template <std::integral T>
-  requires(!std::same_as<T, bool>)
-struct TypeSignature<T> {
+requires(!std::same_as<T, bool>) struct TypeSignature<T> {
   static std::string get() {
     constexpr const char* s[] = {"cC", "wW", "iI", "lL"};
     constexpr int idx = sizeof(T) == 1 ? 0 : sizeof(T) == 2 ? 1 : sizeof(T) == 4 ? 2 : 3;
@@ -271,7 +270,8 @@ struct ValueConverter<std::vector<T>> {
   static AnyValue toAny(const std::vector<T>& v) {
     AnyValue::List l;
     l.reserve(v.size());
-    for (const auto& e : v) l.push_back(AnyValue::from(e));
+    for (const auto& e : v)
+      l.push_back(AnyValue::from(e));
     return AnyValue::list(std::move(l));
   }
 };
@@ -280,7 +280,8 @@ struct ValueConverter<std::map<K, V>> {
   static AnyValue toAny(const std::map<K, V>& m) {
     AnyValue::Map out;
     out.reserve(m.size());
-    for (const auto& [k, v] : m) out.emplace_back(AnyValue::from(k), AnyValue::from(v));
+    for (const auto& [k, v] : m)
+      out.emplace_back(AnyValue::from(k), AnyValue::from(v));
     return AnyValue::map(std::move(out));
   }
 };
@@ -293,8 +294,7 @@ struct ValueConverter<std::pair<A, B>> {
 template <class... T>
 struct ValueConverter<std::tuple<T...>> {
   static AnyValue toAny(const std::tuple<T...>& t) {
-    return std::apply(
-        [](const auto&... e) { return AnyValue::tuple({AnyValue::from(e)...}); }, t);
+    return std::apply([](const auto&... e) { return AnyValue::tuple({AnyValue::from(e)...}); }, t);
   }
 };
 
@@ -317,22 +317,24 @@ struct ValueReader<AnyValue> {
 template <>
 struct ValueReader<bool> {
   static bool read(const AnyValue& v) {
-    if (v.kind() != Kind::Int) throwConversion(v, "b");
+    if (v.kind() != Kind::Int)
+      throwConversion(v, "b");
     return v.asInt().value != 0;
   }
 };
 template <std::integral T>
-  requires(!std::same_as<T, bool>)
-struct ValueReader<T> {
+requires(!std::same_as<T, bool>) struct ValueReader<T> {
   static T read(const AnyValue& v) {
     std::int64_t n = 0;
     if (v.kind() == Kind::Int) {
       const auto& i = v.asInt();
-      if (!i.isSigned && i.size == 8 && i.value < 0) throwConversion(v, signatureOf<T>());
+      if (!i.isSigned && i.size == 8 && i.value < 0)
+        throwConversion(v, signatureOf<T>());
       n = i.value;
     } else if (v.kind() == Kind::Float) {
       const double d = v.asFloat().value;
-      if (!(d > -9.3e18 && d < 9.3e18)) throwConversion(v, signatureOf<T>());
+      if (!(d > -9.3e18 && d < 9.3e18))
+        throwConversion(v, signatureOf<T>());
       n = static_cast<std::int64_t>(d);
     } else {
       throwConversion(v, signatureOf<T>());
@@ -351,15 +353,18 @@ struct ValueReader<T> {
 template <std::floating_point T>
 struct ValueReader<T> {
   static T read(const AnyValue& v) {
-    if (v.kind() == Kind::Float) return static_cast<T>(v.asFloat().value);
-    if (v.kind() == Kind::Int) return static_cast<T>(v.asInt().value);
+    if (v.kind() == Kind::Float)
+      return static_cast<T>(v.asFloat().value);
+    if (v.kind() == Kind::Int)
+      return static_cast<T>(v.asInt().value);
     throwConversion(v, signatureOf<T>());
   }
 };
 template <>
 struct ValueReader<std::string> {
   static std::string read(const AnyValue& v) {
-    if (v.kind() == Kind::String) return v.asString();
+    if (v.kind() == Kind::String)
+      return v.asString();
     if (v.kind() == Kind::Raw) {
       const auto& b = v.asRaw().bytes;
       return std::string(b.begin(), b.end());
@@ -370,8 +375,10 @@ struct ValueReader<std::string> {
 template <>
 struct ValueReader<AnyObject> {
   static AnyObject read(const AnyValue& v) {
-    if (v.kind() == Kind::Object) return v.asObject();
-    if (v.kind() == Kind::Pointer && v.asPointer().object) return v.asPointer().object;
+    if (v.kind() == Kind::Object)
+      return v.asObject();
+    if (v.kind() == Kind::Pointer && v.asPointer().object)
+      return v.asPointer().object;
     throwConversion(v, "o");
   }
 };
@@ -379,22 +386,29 @@ template <class T>
 struct ValueReader<std::vector<T>> {
   static std::vector<T> read(const AnyValue& v) {
     const AnyValue::List* items = nullptr;
-    if (v.kind() == Kind::List) items = &v.asList();
-    else if (v.kind() == Kind::VarArgs) items = &v.asVarArgs();
-    else if (v.kind() == Kind::Tuple) items = &v.asTuple().members;
-    else throwConversion(v, signatureOf<std::vector<T>>());
+    if (v.kind() == Kind::List)
+      items = &v.asList();
+    else if (v.kind() == Kind::VarArgs)
+      items = &v.asVarArgs();
+    else if (v.kind() == Kind::Tuple)
+      items = &v.asTuple().members;
+    else
+      throwConversion(v, signatureOf<std::vector<T>>());
     std::vector<T> out;
     out.reserve(items->size());
-    for (const auto& e : *items) out.push_back(e.template to<T>());
+    for (const auto& e : *items)
+      out.push_back(e.template to<T>());
     return out;
   }
 };
 template <class K, class V>
 struct ValueReader<std::map<K, V>> {
   static std::map<K, V> read(const AnyValue& v) {
-    if (v.kind() != Kind::Map) throwConversion(v, signatureOf<std::map<K, V>>());
+    if (v.kind() != Kind::Map)
+      throwConversion(v, signatureOf<std::map<K, V>>());
     std::map<K, V> out;
-    for (const auto& [k, e] : v.asMap()) out.insert_or_assign(k.template to<K>(), e.template to<V>());
+    for (const auto& [k, e] : v.asMap())
+      out.insert_or_assign(k.template to<K>(), e.template to<V>());
     return out;
   }
 };
@@ -402,9 +416,12 @@ template <class A, class B>
 struct ValueReader<std::pair<A, B>> {
   static std::pair<A, B> read(const AnyValue& v) {
     const AnyValue::List* items = nullptr;
-    if (v.kind() == Kind::Tuple) items = &v.asTuple().members;
-    else if (v.kind() == Kind::List) items = &v.asList();
-    if (!items || items->size() != 2) throwConversion(v, signatureOf<std::pair<A, B>>());
+    if (v.kind() == Kind::Tuple)
+      items = &v.asTuple().members;
+    else if (v.kind() == Kind::List)
+      items = &v.asList();
+    if (!items || items->size() != 2)
+      throwConversion(v, signatureOf<std::pair<A, B>>());
     return {(*items)[0].template to<A>(), (*items)[1].template to<B>()};
   }
 };

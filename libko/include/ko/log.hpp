@@ -45,8 +45,12 @@ class Category {
  public:
   explicit Category(std::string name, Level level) : name_(std::move(name)), level_(level) {}
   const std::string& name() const noexcept { return name_; }
-  Level level() const noexcept { return static_cast<Level>(level_.load(std::memory_order_relaxed)); }
-  bool enabled(Level l) const noexcept { return static_cast<int>(l) <= level_.load(std::memory_order_relaxed); }
+  Level level() const noexcept {
+    return static_cast<Level>(level_.load(std::memory_order_relaxed));
+  }
+  bool enabled(Level l) const noexcept {
+    return static_cast<int>(l) <= level_.load(std::memory_order_relaxed);
+  }
   void setLevel(Level l) noexcept { level_.store(static_cast<int>(l), std::memory_order_relaxed); }
 
  private:
@@ -108,10 +112,12 @@ class CapturingSink : public Sink, public std::enable_shared_from_this<Capturing
   std::vector<Record> records_;
 };
 
-// Installs a CapturingSink for the life of the guard.
+// For tests: installs a CapturingSink for the life of the guard, with every category
+// raised to `level`; `quiet` mutes the standard-error sink meanwhile. The previous
+// level rules come back on destruction. One guard at a time.
 class ScopedCapture {
  public:
-  ScopedCapture();
+  explicit ScopedCapture(Level level = Debug, bool quiet = true);
   ~ScopedCapture();
   ScopedCapture(const ScopedCapture&) = delete;
   ScopedCapture& operator=(const ScopedCapture&) = delete;
@@ -119,7 +125,10 @@ class ScopedCapture {
   CapturingSink* operator->() { return sink_.get(); }
 
  private:
+  struct Saved;
   std::shared_ptr<CapturingSink> sink_;
+  std::unique_ptr<Saved> saved_;
+  bool quiet_;
 };
 
 // "void ZU::MokutoConfig::fromZUValue(const ZU::ZUValue&)" -> "ZU::MokutoConfig::fromZUValue"
@@ -151,15 +160,15 @@ class LineStream {
 }  // namespace ko::log
 
 // The category of a literal name, looked up once per call site.
-#define KO_CATEGORY(name)                                                          \
-  ([]() -> ::ko::log::Category& {                                                  \
-    static ::ko::log::Category& koCategory_ = ::ko::log::category(name);           \
-    return koCategory_;                                                            \
+#define KO_CATEGORY(name)                                                \
+  ([]() -> ::ko::log::Category& {                                        \
+    static ::ko::log::Category& koCategory_ = ::ko::log::category(name); \
+    return koCategory_;                                                  \
   }())
 
-#define KO_LOG(name, lvl)                                                           \
+#define KO_LOG(name, lvl)                                                            \
   if (::ko::log::Category& koLogCat_ = KO_CATEGORY(name); !koLogCat_.enabled(lvl)) { \
-  } else                                                                            \
+  } else                                                                             \
     ::ko::log::LineStream(koLogCat_, lvl, __PRETTY_FUNCTION__, __FILE__, __LINE__).stream()
 
 #define KO_LOG_FATAL(name) KO_LOG(name, ::ko::log::Fatal)

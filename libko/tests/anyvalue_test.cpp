@@ -1,0 +1,92 @@
+#include <gtest/gtest.h>
+
+#include "ko/anyvalue.hpp"
+
+namespace {
+
+using ko::AnyValue;
+using ko::Kind;
+
+TEST(AnyValue, KindsOfConstructedValues) {
+  EXPECT_EQ(AnyValue().kind(), Kind::Void);
+  EXPECT_EQ(AnyValue::none().kind(), Kind::None);
+  EXPECT_EQ(AnyValue(true).kind(), Kind::Int);
+  EXPECT_EQ(AnyValue(true).asInt().size, 0);
+  EXPECT_EQ(AnyValue(std::int16_t{3}).asInt().size, 2);
+  EXPECT_EQ(AnyValue(2.5f).asFloat().size, 4);
+  EXPECT_EQ(AnyValue("abc").kind(), Kind::String);
+  EXPECT_EQ(AnyValue(AnyValue::List{1, "x"}).kind(), Kind::List);
+  EXPECT_EQ(AnyValue::map({{"a", 1}}).kind(), Kind::Map);
+  EXPECT_EQ(AnyValue::tuple({1, 2}).kind(), Kind::Tuple);
+  EXPECT_EQ(AnyValue::dynamic(1).kind(), Kind::Dynamic);
+  EXPECT_EQ(AnyValue::raw({1, 2}).kind(), Kind::Raw);
+  EXPECT_EQ(AnyValue::varArgs({1}).kind(), Kind::VarArgs);
+  EXPECT_EQ(AnyValue::pointerTo(1).kind(), Kind::Pointer);
+  EXPECT_EQ(AnyValue::opaque(Kind::Signal).kind(), Kind::Signal);
+  EXPECT_THROW(AnyValue::opaque(Kind::Int), ko::ConversionError);
+}
+
+TEST(AnyValue, SignaturesOfValuesAndTypes) {
+  EXPECT_EQ(AnyValue(true).signature(), "b");
+  EXPECT_EQ(AnyValue(1).signature(), "i");
+  EXPECT_EQ(AnyValue(std::uint64_t{1}).signature(), "L");
+  EXPECT_EQ(AnyValue(1.0).signature(), "d");
+  EXPECT_EQ(AnyValue(AnyValue::List{1, 2}).signature(), "[i]");
+  EXPECT_EQ(AnyValue(AnyValue::List{1, "a"}).signature(), "[m]");
+  EXPECT_EQ(AnyValue::map({{"a", 1}}).signature(), "{si}");
+  EXPECT_EQ(AnyValue::tuple({1, "a"}).signature(), "(is)");
+  EXPECT_EQ(ko::signatureOf<std::vector<std::string>>(), "[s]");
+  EXPECT_EQ((ko::signatureOf<std::map<std::string, int>>()), "{si}");
+  EXPECT_EQ(ko::signatureOf<unsigned>(), "I");
+  EXPECT_EQ(ko::signatureOf<void>(), "v");
+}
+
+TEST(AnyValue, TypedConversionsRoundTrip) {
+  EXPECT_EQ(AnyValue::from(std::vector<int>{1, 2, 3}).to<std::vector<int>>(),
+            (std::vector<int>{1, 2, 3}));
+  std::map<std::string, std::vector<std::string>> m{{"hello", {"hi", "hey"}}};
+  EXPECT_EQ((AnyValue::from(m).to<std::map<std::string, std::vector<std::string>>>()), m);
+  EXPECT_EQ((AnyValue::from(std::pair<int, std::string>{1, "a"}).to<std::pair<int, std::string>>()),
+            (std::pair<int, std::string>{1, "a"}));
+  EXPECT_EQ(AnyValue(7).to<double>(), 7.0);
+  EXPECT_EQ(AnyValue(2.9).to<int>(), 2);
+  EXPECT_TRUE(AnyValue(true).to<bool>());
+  EXPECT_EQ(AnyValue::dynamic("x").to<std::string>(), "x");
+  EXPECT_EQ(AnyValue(5).to<AnyValue>(), AnyValue(5));
+}
+
+TEST(AnyValue, FailedConversionsNameBothSignatures) {
+  try {
+    (void)AnyValue("abc").to<int>();
+    FAIL() << "no exception";
+  } catch (const ko::ConversionError& e) {
+    EXPECT_NE(std::string(e.what()).find("from s to i"), std::string::npos) << e.what();
+  }
+  EXPECT_THROW((void)AnyValue(300).to<std::uint8_t>(), ko::ConversionError);
+  EXPECT_THROW((void)AnyValue(-1).to<unsigned>(), ko::ConversionError);
+  EXPECT_THROW((void)AnyValue(1e300).to<int>(), ko::ConversionError);
+  EXPECT_THROW((void)AnyValue(AnyValue::List{1, "a"}).to<std::vector<int>>(), ko::ConversionError);
+  EXPECT_THROW((void)AnyValue().asString(), ko::ConversionError);
+}
+
+TEST(AnyValue, CopiesAreDeepAndCompareByContent) {
+  AnyValue a = AnyValue::list({1, AnyValue::map({{"k", AnyValue::list({"v"})}})});
+  AnyValue b = a;
+  EXPECT_EQ(a, b);
+  b.asList()[0] = 2;
+  EXPECT_NE(a, b);
+  EXPECT_EQ(a.asList()[0], AnyValue(1));
+  EXPECT_EQ(AnyValue(1), AnyValue(std::int64_t{1}));
+  EXPECT_NE(AnyValue(1), AnyValue(true));
+}
+
+TEST(AnyValue, FloatOfSizeFourIsNarrowed) {
+  EXPECT_EQ(AnyValue::floating(0.1, 4).asFloat().value, static_cast<double>(0.1f));
+}
+
+TEST(AnyValue, ReadableForm) {
+  EXPECT_EQ(AnyValue::list({1, "a\"b", true, AnyValue::map({{"k", 0.5}})}).toString(),
+            "[1, \"a\\\"b\", true, {\"k\": 0.5}]");
+}
+
+}  // namespace
