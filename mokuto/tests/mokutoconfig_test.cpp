@@ -1,0 +1,366 @@
+#include "mokuto/mokutoconfig.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <map>
+#include <set>
+#include <sstream>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+#include "ko/json.hpp"
+#include "ko/log.hpp"
+#include "zu/zuvalue.h"
+#include "zu/zuvalueconverter.h"
+
+namespace {
+
+using ko::log::Error;
+using ZU::MokutoConfig;
+using ZU::ZUValue;
+
+ZUValue json(const char* text) {
+  return ZU::fromAnyReference(ko::fromJson(text));
+}
+
+std::string printed(const MokutoConfig& config) {
+  std::ostringstream os;
+  os << config;
+  return os.str();
+}
+
+using Words = std::map<std::string, std::vector<std::string>>;
+using Anims = std::map<std::string, std::set<std::string>>;
+
+const char* const kDefaultPrinted =
+    "config: bodyLanguageMode: contextual\n"
+    "        msPauseBeforeSpeech: 500\n"
+    "        behaviorAtEndOfMokuto: \"\"\n"
+    "        ifBehaviorAtEndOfMokutoIsBlocking: True\n"
+    "        armsBreathingAllowed: True\n"
+    "        animationsPackages: \"animations/\"";
+
+void expectDefaults(const MokutoConfig& c) {
+  EXPECT_EQ(c.bodyLanguageMode, ZU::BODY_LANGUAGE_MODE_CONTEXTUAL);
+  EXPECT_EQ(c.msPauseBeforeSpeech, 500);
+  EXPECT_EQ(c.behaviorAtEndOfMokuto, "");
+  EXPECT_TRUE(c.ifBehaviorAtEndOfMokutoIsBlocking);
+  EXPECT_TRUE(c.armsBreathingAllowed);
+  EXPECT_EQ(c.animationsPackages, std::vector<std::string>{"animations/"});
+  EXPECT_TRUE(c.wordsToTags.empty());
+  for (const auto& m : c.tagsToAnimations)
+    EXPECT_TRUE(m.empty());
+  EXPECT_FALSE(c.inputMode2);
+}
+
+TEST(MokutoConfigTest, NewConfigurationHasTheDefaults) {
+  const MokutoConfig c;
+  expectDefaults(c);
+  EXPECT_EQ(printed(c), kDefaultPrinted);
+}
+
+TEST(MokutoConfigTest, ResetKeepsOnlyTheFirstPackageAndFourEmptyMaps) {
+  ko::log::ScopedCapture cap;
+  MokutoConfig c;
+  c.fromZUValue(json(R"([["bodyLanguageMode", "disabled"], ["msPauseBeforeSpeech", 3],
+      ["behaviorAtEndOfMokuto", "b"], ["ifBehaviorAtEndOfMokutoIsBlocking", false],
+      ["armsBreathingAllowed", false]])"));
+  c.animationsPackages.push_back("other/");
+  c.updateWordsToTags(json(R"([["hello", ["hi"]]])"));
+  c.updateTagsToAnimations(json(R"([["hello", ["animations/Stand/a", "other/Sit/b"]]])"));
+  c.inputMode2 = true;
+  c.reset();
+  expectDefaults(c);
+
+  c.animationsPackages.clear();
+  c.reset();
+  EXPECT_EQ(c.animationsPackages, std::vector<std::string>{""});
+}
+
+// ---- fromZUValue ----
+
+TEST(MokutoConfigFromZUValueTest, SetsEveryKeyAndLaterPairsOverrideEarlierOnes) {
+  ko::log::ScopedCapture cap;
+  MokutoConfig c;
+  c.fromZUValue(json(R"([["msPauseBeforeSpeech", 100], ["bodyLanguageMode", "random"],
+      ["behaviorAtEndOfMokuto", "animations/Stand/Gestures/Hey_1"],
+      ["ifBehaviorAtEndOfMokutoIsBlocking", false], ["armsBreathingAllowed", false],
+      ["msPauseBeforeSpeech", 0], ["bodyLanguageMode", "disabled"]])"));
+  EXPECT_EQ(c.bodyLanguageMode, ZU::BODY_LANGUAGE_MODE_DISABLED);
+  EXPECT_EQ(c.msPauseBeforeSpeech, 0);
+  EXPECT_EQ(c.behaviorAtEndOfMokuto, "animations/Stand/Gestures/Hey_1");
+  EXPECT_FALSE(c.ifBehaviorAtEndOfMokutoIsBlocking);
+  EXPECT_FALSE(c.armsBreathingAllowed);
+  EXPECT_EQ(cap->count(), 0u);
+  EXPECT_EQ(printed(c),
+            "config: bodyLanguageMode: disabled\n"
+            "        msPauseBeforeSpeech: 0\n"
+            "        behaviorAtEndOfMokuto: \"animations/Stand/Gestures/Hey_1\"\n"
+            "        ifBehaviorAtEndOfMokutoIsBlocking: False\n"
+            "        armsBreathingAllowed: False\n"
+            "        animationsPackages: \"animations/\"");
+}
+
+struct RejectedCase {
+  const char* name;
+  const char* value;
+  const char* message;
+};
+
+class MokutoConfigRejectedTest : public ::testing::TestWithParam<RejectedCase> {};
+
+TEST_P(MokutoConfigRejectedTest, LogsOneErrorAndChangesNothing) {
+  const RejectedCase& c = GetParam();
+  ko::log::ScopedCapture cap;
+  MokutoConfig config;
+  config.fromZUValue(json(c.value));
+  expectDefaults(config);
+  const auto records = cap->records();
+  ASSERT_EQ(records.size(), 1u);
+  EXPECT_EQ(records[0].level, Error);
+  EXPECT_EQ(records[0].category, "MokutoConfig");
+  EXPECT_EQ(records[0].function, "ZU::MokutoConfig::fromZUValue");
+  EXPECT_EQ(records[0].message, c.message);
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Values, MokutoConfigRejectedTest,
+    ::testing::Values(
+        RejectedCase{"floatPause", R"([["msPauseBeforeSpeech", 1.5]])",
+                     "uknown key \"msPauseBeforeSpeech\" with the value: 1.5"},
+        RejectedCase{"intMode", R"([["bodyLanguageMode", 1]])",
+                     "uknown key \"bodyLanguageMode\" with the value: 1"},
+        RejectedCase{"intFlag", R"([["armsBreathingAllowed", 0]])",
+                     "uknown key \"armsBreathingAllowed\" with the value: 0"},
+        RejectedCase{"stringFlag", R"([["ifBehaviorAtEndOfMokutoIsBlocking", "true"]])",
+                     "uknown key \"ifBehaviorAtEndOfMokutoIsBlocking\" with the value: \"true\""},
+        RejectedCase{"nullBehavior", R"([["behaviorAtEndOfMokuto", null]])",
+                     "uknown key \"behaviorAtEndOfMokuto\" with the value: "},
+        RejectedCase{"unknownKey", R"([["tagsToWords", [["a", ["b"]]]]])",
+                     "uknown key \"tagsToWords\" with the value: [[\"a\", [\"b\"]]]"},
+        RejectedCase{"modeCase", R"([["bodyLanguageMode", "Random"]])",
+                     "Invalid body language mode: \"Random\"\n"
+                     "All the possible body language modes are: \"disabled\", \"random\" and "
+                     "\"contextual\"."},
+        RejectedCase{"modeEndOfEnum", R"([["bodyLanguageMode", "endOfEnum"]])",
+                     "Invalid body language mode: \"endOfEnum\"\n"
+                     "All the possible body language modes are: \"disabled\", \"random\" and "
+                     "\"contextual\"."},
+        RejectedCase{"negativePause", R"([["msPauseBeforeSpeech", -1]])",
+                     "pause time can't be negative."}),
+    [](const ::testing::TestParamInfo<RejectedCase>& p) { return p.param.name; });
+
+TEST(MokutoConfigFromZUValueTest, GoesOnAfterARejectedPair) {
+  ko::log::ScopedCapture cap;
+  MokutoConfig c;
+  c.fromZUValue(json(R"([["msPauseBeforeSpeech", -5], ["msPauseBeforeSpeech", 20]])"));
+  EXPECT_EQ(c.msPauseBeforeSpeech, 20);
+  EXPECT_TRUE(cap->contains("MokutoConfig", Error, "pause time can't be negative."));
+}
+
+TEST(MokutoConfigFromZUValueTest, MalformedValuesAndElementsAreSkippedSilently) {
+  ko::log::ScopedCapture cap;
+  MokutoConfig c;
+  for (const char* text :
+       {"5", "null", R"("msPauseBeforeSpeech")", R"([5, [], ["msPauseBeforeSpeech"],
+            ["msPauseBeforeSpeech", 0, 1], [1, 0], [["msPauseBeforeSpeech"], 0]])"}) {
+    c.fromZUValue(json(text));
+  }
+  // A key held as a Binary is not a string, and is not turned into one.
+  ZUValue binaryKey;
+  binaryKey.arraySetSize(1);
+  binaryKey[0].arraySetSize(2);
+  const std::string key = "msPauseBeforeSpeech";
+  binaryKey[0][0].binaryRef().assign(key.begin(), key.end());
+  binaryKey[0][1] = 0;
+  ::testing::internal::CaptureStdout();
+  c.fromZUValue(binaryKey);
+  EXPECT_EQ(::testing::internal::GetCapturedStdout(), "");
+  EXPECT_TRUE(binaryKey[0][0].isBinary());
+
+  expectDefaults(c);
+  EXPECT_EQ(cap->count(), 0u);
+}
+
+TEST(MokutoConfigFromZUValueTest, JsonObjectArrivesAsPairs) {
+  MokutoConfig c;
+  c.fromZUValue(json(R"({"msPauseBeforeSpeech": 0, "bodyLanguageMode": "random"})"));
+  EXPECT_EQ(c.msPauseBeforeSpeech, 0);
+  EXPECT_EQ(c.bodyLanguageMode, ZU::BODY_LANGUAGE_MODE_RANDOM);
+}
+
+// ---- updateWordsToTags ----
+
+TEST(MokutoConfigWordsTest, AddsTheTagToEachWordAndKeepsDuplicates) {
+  ko::log::ScopedCapture cap;
+  MokutoConfig c;
+  const ZUValue value = json(R"([["hello", ["hi", "hey"]]])");
+  c.updateWordsToTags(value);
+  EXPECT_EQ(c.wordsToTags, (Words{{"hey", {"hello"}}, {"hi", {"hello"}}}));
+  c.updateWordsToTags(value);
+  c.updateWordsToTags(json(R"([["greet", ["hi"]]])"));
+  EXPECT_EQ(c.wordsToTags,
+            (Words{{"hey", {"hello", "hello"}}, {"hi", {"hello", "hello", "greet"}}}));
+  EXPECT_EQ(cap->count(), 0u);
+}
+
+TEST(MokutoConfigWordsTest, SkipsElementsAndWordsOfAnotherShape) {
+  ko::log::ScopedCapture cap;
+  MokutoConfig c;
+  c.updateWordsToTags(json(R"([[1, ["a"]], ["t", "a"], ["t", ["b"], 3], "t", [],
+      ["t", [1, "c", null, ["d"]]]])"));
+  EXPECT_EQ(c.wordsToTags, (Words{{"c", {"t"}}}));
+  c.updateWordsToTags(json("[]"));
+  EXPECT_EQ(cap->count(), 0u);
+}
+
+TEST(MokutoConfigWordsTest, NonArrayValueIsLogged) {
+  for (const char* text : {"null", R"("hello")", "3"}) {
+    ko::log::ScopedCapture cap;
+    MokutoConfig c;
+    c.updateWordsToTags(json(text));
+    EXPECT_TRUE(c.wordsToTags.empty());
+    const auto records = cap->records();
+    ASSERT_EQ(records.size(), 1u) << text;
+    EXPECT_EQ(records[0].function, "ZU::MokutoConfig::updateWordsToTags");
+    EXPECT_TRUE(cap->contains("MokutoConfig", Error, "The new tags to words should be an array"));
+  }
+}
+
+TEST(MokutoConfigWordsTest, PrintedFormListsWordsByTag) {
+  MokutoConfig c;
+  c.updateWordsToTags(json(R"([["hello", ["hi", "hey"]], ["greet", ["hi"]], ["hello", ["hey"]]])"));
+  EXPECT_EQ(printed(c),
+            std::string(kDefaultPrinted) +
+                "\n        tagsToWords: "
+                "\n                    tag: \"greet\" have words \"hi\""
+                "\n                    tag: \"hello\" have words \"hey\" \"hey\" \"hi\"");
+  c.animationsPackages.clear();
+  EXPECT_THAT(printed(c), ::testing::HasSubstr("True\n        tagsToWords: \n"));
+}
+
+// ---- updateTagsToAnimations ----
+
+TEST(MokutoConfigAnimationsTest, StoresEachAnimationUnderItsPostureAndLogsNonStrings) {
+  ko::log::ScopedCapture cap;
+  MokutoConfig c;
+  c.updateTagsToAnimations(
+      json(R"([["hello", ["animations/Stand/Gestures/Hey_1", "animations/Sit/Gestures/Hey_1", 7,
+                          "animations/Stand/Gestures/Hey_1"]]])"));
+  EXPECT_EQ(c.tagsToAnimations[ZU::Standing],
+            (Anims{{"hello", {"animations/Stand/Gestures/Hey_1"}}}));
+  EXPECT_EQ(c.tagsToAnimations[ZU::Sitting], (Anims{{"hello", {"animations/Sit/Gestures/Hey_1"}}}));
+  EXPECT_TRUE(c.tagsToAnimations[ZU::SittingOnChair].empty());
+  EXPECT_TRUE(c.tagsToAnimations[ZU::Unknown].empty());
+  const auto records = cap->records();
+  ASSERT_EQ(records.size(), 1u);
+  EXPECT_EQ(records[0].function, "ZU::MokutoConfig::updateTagsToAnimations");
+  EXPECT_TRUE(
+      cap->contains("MokutoConfig", Error, "The animation: \"7\" is not formatted as a string"));
+}
+
+TEST(MokutoConfigAnimationsTest, FirstMalformedElementEndsTheWalk) {
+  ko::log::ScopedCapture cap;
+  MokutoConfig c;
+  c.updateTagsToAnimations(
+      json(R"([["a", ["animations/Stand/x"]], "bad", ["b", ["animations/Stand/y"]]])"));
+  EXPECT_EQ(c.tagsToAnimations[ZU::Standing], (Anims{{"a", {"animations/Stand/x"}}}));
+  ASSERT_EQ(cap->count(), 1u);
+  EXPECT_TRUE(cap->contains("MokutoConfig", Error,
+                            "The new tags to animations should be an array following this "
+                            "pattern: [ [tag1, [anim1, anim2, anim3]], [tag2, [anim4]] ]"));
+  EXPECT_EQ(cap->records()[0].function, "ZU::MokutoConfig::updateTagsToAnimations");
+}
+
+TEST(MokutoConfigAnimationsTest, NonArrayValueAndOtherPairShapesLogThePattern) {
+  for (const char* text : {"null", "3", R"(["a"])", R"([["a", "animations/Stand/x"]])",
+                           R"([["a", ["animations/Stand/x"], 1]])", R"([[1, []]])"}) {
+    ko::log::ScopedCapture cap;
+    MokutoConfig c;
+    c.updateTagsToAnimations(json(text));
+    EXPECT_TRUE(c.tagsToAnimations[ZU::Standing].empty()) << text;
+    EXPECT_TRUE(
+        cap->containsPart("MokutoConfig", Error, "The new tags to animations should be an array"))
+        << text;
+  }
+  ko::log::ScopedCapture cap;
+  MokutoConfig c;
+  c.updateTagsToAnimations(json("[]"));
+  c.updateTagsToAnimations(json(R"([["a", []]])"));
+  EXPECT_EQ(cap->count(), 0u);
+  for (const auto& m : c.tagsToAnimations)
+    EXPECT_TRUE(m.empty());
+}
+
+TEST(MokutoConfigAnimationsTest, AnimationsOfUnknownPostureAreLoggedAndNotStored) {
+  ko::log::ScopedCapture cap;
+  MokutoConfig c;
+  c.updateTagsToAnimations(json(R"([["wave", ["animations/Crouch/Wave_1"]]])"));
+  for (const auto& m : c.tagsToAnimations)
+    EXPECT_TRUE(m.empty());
+  ASSERT_EQ(cap->count(), 1u);
+  EXPECT_EQ(cap->records()[0].function, "ZU::MokutoConfig::xPostureFamilyFormAnimPath");
+  EXPECT_TRUE(cap->contains("MokutoConfig", Error,
+                            "Unknown posture of animation: animations/Crouch/Wave_1 the root "
+                            "folder after declareAnimationsPackage has to be: Stand, Sit or "
+                            "SitOnPod"));
+}
+
+// ---- xPostureFamilyFormAnimPath ----
+
+struct PostureCase {
+  std::vector<std::string> packages;
+  const char* path;
+  ZU::PostureFamily family;
+};
+
+class MokutoConfigPostureTest : public ::testing::TestWithParam<PostureCase> {};
+
+TEST_P(MokutoConfigPostureTest, FolderAfterThePackageNamesTheFamily) {
+  const PostureCase& p = GetParam();
+  ko::log::ScopedCapture cap;
+  MokutoConfig c;
+  c.animationsPackages = p.packages;
+  EXPECT_EQ(c.xPostureFamilyFormAnimPath(p.path), p.family) << p.path;
+  EXPECT_EQ(cap->count(), p.family == ZU::Unknown ? 1u : 0u);
+}
+
+const std::vector<std::string> kDefaultPackages{"animations/"};
+
+INSTANTIATE_TEST_SUITE_P(
+    Paths, MokutoConfigPostureTest,
+    ::testing::Values(
+        PostureCase{kDefaultPackages, "animations/Stand/Gestures/Hey_1", ZU::Standing},
+        PostureCase{kDefaultPackages, "animations/Sit/Gestures/Hey_1", ZU::Sitting},
+        PostureCase{kDefaultPackages, "animations/SitOnPod/Emotions/Happy_1", ZU::SittingOnChair},
+        PostureCase{kDefaultPackages, "animations/Stand/", ZU::Standing},
+        // Only the package's length counts, not its characters.
+        PostureCase{kDefaultPackages, "somethingX/Sit/a", ZU::Sitting},
+        PostureCase{kDefaultPackages, "animations/Standing/a", ZU::Unknown},
+        PostureCase{kDefaultPackages, "animations/Sit", ZU::Unknown},
+        PostureCase{kDefaultPackages, "animations/stand/a", ZU::Unknown},
+        PostureCase{kDefaultPackages, "animations/", ZU::Unknown},
+        PostureCase{{}, "animations/Stand/a", ZU::Unknown},
+        // The first package that gives a match wins; later ones are not tried.
+        PostureCase{{"animations/", "a/very/long/package/"}, "animations/Sit/a", ZU::Sitting},
+        PostureCase{{"pkg/", "animations/"}, "animations/SitOnPod/a", ZU::SittingOnChair}));
+
+TEST(MokutoConfigOutOfRangeTest, PathShorterThanAPackageTriedThrowsAndKeepsWhatWasStored) {
+  ko::log::ScopedCapture cap;
+  MokutoConfig c;
+  c.animationsPackages = {"animations/", "a/very/long/package/"};
+  EXPECT_THROW(c.xPostureFamilyFormAnimPath("animations/Foo"), std::out_of_range);
+  EXPECT_THROW(c.xPostureFamilyFormAnimPath("anim"), std::out_of_range);
+
+  c.updateTagsToAnimations(json(R"([["a", ["animations/Stand/x"]]])"));
+  EXPECT_THROW(c.updateTagsToAnimations(json(R"([["b", ["animations/Sit/y", "short"]],
+                                                  ["c", ["animations/Stand/z"]]])")),
+               std::out_of_range);
+  EXPECT_EQ(c.tagsToAnimations[ZU::Standing], (Anims{{"a", {"animations/Stand/x"}}}));
+  EXPECT_EQ(c.tagsToAnimations[ZU::Sitting], (Anims{{"b", {"animations/Sit/y"}}}));
+  EXPECT_EQ(cap->count(), 0u);
+}
+
+}  // namespace
