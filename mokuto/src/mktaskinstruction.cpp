@@ -1,1 +1,105 @@
-// placeholder
+#include "mokuto/mktaskinstruction.h"
+
+#include <algorithm>
+#include <charconv>
+#include <stdexcept>
+#include <utility>
+
+namespace ZU {
+
+MKTaskAction::MKTaskAction(MKTaskActionType actionType)
+    : type(actionType), condition(std::make_shared<std::condition_variable>()) {}
+
+void MKTaskAction::appendBookmark(std::string& out) const {
+  char digits[16];
+  const auto [end, ec] = std::to_chars(digits, digits + sizeof digits, id);
+  (void)ec;  // an unsigned 32-bit number always fits
+  out += '\\';
+  out += MKTaskActionType_bookmarkKind(type);
+  out += '=';
+  out.append(digits, end);
+  out += '\\';
+}
+
+std::string MKTaskAction::bookmark() const {
+  std::string out;
+  appendBookmark(out);
+  return out;
+}
+
+void MKTaskAction::markAsError(std::string_view code) {
+  type = UNKNOWN;
+  std::string prefixed;
+  prefixed.reserve(code.size() + 1 + text.size());
+  prefixed += code;
+  prefixed += ' ';
+  prefixed += text;
+  text = std::move(prefixed);
+}
+
+MKTaskInstruction::MKTaskInstruction(MKID textId, std::string callerText, MokutoConfig textConfig,
+                                     PostureFamily family)
+    : id(textId),
+      config(std::move(textConfig)),
+      text(std::move(callerText)),
+      postureFamily(family) {}
+
+void MKTaskInstruction::addAction(std::shared_ptr<MKTaskAction> action) {
+  if (!action) {
+    throw std::invalid_argument("MKTaskInstruction::addAction: null action");
+  }
+  std::int64_t n = actions.empty() ? 0 : static_cast<std::int64_t>(actions.back()->id);
+
+  // Numbers at or below lastGiven_ were dropped from bookmarksAhead_; start over if the
+  // count now starts below them or if usedBookmarks was replaced.
+  if (n < lastGiven_ || usedBookmarks.size() < usedSeen_) {
+    bookmarksAhead_.clear();
+    aheadFrom_ = 0;
+    usedSeen_ = 0;
+    lastGiven_ = n;
+  }
+  if (usedSeen_ < usedBookmarks.size()) {
+    bookmarksAhead_.erase(bookmarksAhead_.begin(),
+                          bookmarksAhead_.begin() + static_cast<std::ptrdiff_t>(aheadFrom_));
+    aheadFrom_ = 0;
+    for (std::size_t k = usedSeen_; k < usedBookmarks.size(); ++k) {
+      if (usedBookmarks[k] > n) {
+        bookmarksAhead_.push_back(usedBookmarks[k]);
+      }
+    }
+    std::sort(bookmarksAhead_.begin(), bookmarksAhead_.end());
+  }
+
+  bool taken = true;
+  while (taken) {
+    ++n;
+    while (aheadFrom_ < bookmarksAhead_.size() && bookmarksAhead_[aheadFrom_] < n) {
+      ++aheadFrom_;
+    }
+    taken = aheadFrom_ < bookmarksAhead_.size() && bookmarksAhead_[aheadFrom_] == n;
+  }
+
+  usedBookmarks.push_back(static_cast<std::int32_t>(n));
+  usedSeen_ = usedBookmarks.size();
+  lastGiven_ = n;
+  action->id = static_cast<std::uint32_t>(n);
+  actions.push_back(std::move(action));
+  currentAction = 0;
+}
+
+std::ostream& operator<<(std::ostream& os, const MKTaskInstruction& job) {
+  os << job.text;
+  for (std::size_t k = 0; k < job.actions.size(); ++k) {
+    const MKTaskAction* action = job.actions[k].get();
+    if (action == nullptr) {
+      continue;
+    }
+    os << '\n' << MKTaskActionType_toStr(action->type) << '=' << action->id << ": " << action->text;
+    if (k < job.currentAction) {
+      os << "\taction already done";
+    }
+  }
+  return os;
+}
+
+}  // namespace ZU
