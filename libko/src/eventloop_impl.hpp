@@ -1,0 +1,45 @@
+#pragma once
+// The inside of an EventLoop, shared with the framework's own timers (periodic tasks).
+
+#include <atomic>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <thread>
+#include <unordered_map>
+#include <vector>
+
+#include <boost/asio/executor_work_guard.hpp>
+#include <boost/asio/io_context.hpp>
+
+#include "ko/eventloop.hpp"
+
+namespace ko {
+
+// Owned by the EventLoop and by each of its threads (the last one out destroys it).
+// `io` is run by the pool; the listeners are told when the loop stops so that they
+// cancel their timers.
+struct EventLoop::Impl : std::enable_shared_from_this<EventLoop::Impl> {
+  using WorkGuard = boost::asio::executor_work_guard<boost::asio::io_context::executor_type>;
+
+  explicit Impl(std::string loopName) : name(std::move(loopName)) {}
+
+  // Answers a token for removeStopListener; a listener added after the stop runs at once.
+  std::uint64_t addStopListener(std::function<void()> listener);
+  void removeStopListener(std::uint64_t token);
+
+  const std::string name;
+  boost::asio::io_context io;
+  std::optional<WorkGuard> work;
+  std::vector<std::thread> threads;
+  std::atomic<bool> stopped{false};
+
+  std::mutex mutex;  // listeners, stop
+  std::unordered_map<std::uint64_t, std::function<void()>> stopListeners;
+  std::uint64_t nextToken = 1;
+};
+
+}  // namespace ko
