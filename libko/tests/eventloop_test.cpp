@@ -1,0 +1,116 @@
+#include "ko/eventloop.hpp"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <cstdlib>
+#include <stdexcept>
+
+#include "ko/log.hpp"
+#include "ko_test_helpers.hpp"
+
+namespace {
+
+using ko::FutureState;
+using ko::test::Gate;
+
+TEST(EventLoop, AsyncPostAndDelayedJobsRunOnTheLoop) {
+  ko::EventLoop loop("jobs", 2);
+  EXPECT_EQ(loop.threadCount(), 2u);
+  EXPECT_EQ(loop.name(), "jobs");
+  EXPECT_FALSE(loop.isInThisLoop());
+
+  auto inLoop = loop.async([&] { return loop.isInThisLoop(); });
+  EXPECT_TRUE(inLoop.value(10000));
+
+  Gate posted;
+  loop.post([&] { posted.open(); });
+  EXPECT_TRUE(posted.wait());
+
+  auto delayed = loop.asyncDelay([] { return std::string("later"); }, std::chrono::milliseconds(5));
+  EXPECT_EQ(delayed.value(10000), "later");
+
+  Gate delayedPost;
+  loop.postDelayed([&] { delayedPost.open(); }, std::chrono::milliseconds(1));
+  EXPECT_TRUE(delayedPost.wait());
+}
+
+TEST(EventLoop, JobsRunInParallelOnThePool) {
+  ko::EventLoop loop("parallel", 2);
+  // Each job waits for the other: both finish only if they run at the same time.
+  Gate first, second;
+  auto a = loop.async([&] {
+    first.open();
+    return second.wait();
+  });
+  auto b = loop.async([&] {
+    second.open();
+    return first.wait();
+  });
+  EXPECT_TRUE(a.value(20000));
+  EXPECT_TRUE(b.value(20000));
+}
+
+TEST(EventLoop, ThrowingJobIsLoggedAndTheLoopGoesOn) {
+  ko::log::ScopedCapture cap;
+  ko::EventLoop loop("throwing", 1);
+  Gate thrown;
+  loop.post([&] {
+    thrown.open();
+    throw std::runtime_error("job failed");
+  });
+  EXPECT_TRUE(thrown.wait());
+  EXPECT_EQ(loop.async([] { return 1; }).value(10000), 1);
+  EXPECT_TRUE(cap->containsPart("ko.eventloop", ko::log::Error, "job failed"));
+}
+
+TEST(EventLoop, StopDropsQueuedAndLaterJobs) {
+  auto loop = std::make_shared<ko::EventLoop>("stopping", 1);
+  Gate holding, release;
+  auto blocker = loop->async([&] {
+    holding.open();
+    release.wait();
+    // Stopping from inside the loop must not wait for this very job.
+    loop->stop();
+    return true;
+  });
+  ASSERT_TRUE(holding.wait());
+  auto queued = loop->async([] { return 1; });
+  auto delayed = loop->asyncDelay([] { return 2; }, std::chrono::hours(1));
+  release.open();
+  EXPECT_TRUE(blocker.value(10000));
+  EXPECT_EQ(queued.error(10000), "Promise broken");
+  EXPECT_EQ(delayed.error(10000), "Promise broken");
+  EXPECT_EQ(loop->async([] { return 3; }).error(0), "Promise broken");
+}
+
+TEST(EventLoop, DestructionCancelsDelayedJobs) {
+  ko::Future<int> delayed;
+  {
+    ko::EventLoop loop("short-lived", 1);
+    delayed = loop.asyncDelay([] { return 1; }, std::chrono::hours(1));
+  }
+  EXPECT_EQ(delayed.error(0), "Promise broken");
+}
+
+TEST(EventLoop, DefaultLoopIsSharedAndSizedFromTheEnvironment) {
+  // Each child process runs the test from the start: nothing may create the default loop
+  // before the death tests.
+  GTEST_FLAG_SET(death_test_style, "threadsafe");
+  EXPECT_EXIT(
+      {
+        setenv("ZEFOKO_EVENTLOOP_THREADS", "3", 1);
+        std::exit(ko::getEventLoop()->threadCount() == 3 ? 0 : 1);
+      },
+      ::testing::ExitedWithCode(0), "");
+  EXPECT_EXIT(
+      {
+        setenv("ZEFOKO_EVENTLOOP_THREADS", "many", 1);
+        std::exit(ko::getEventLoop()->threadCount() == 4 ? 0 : 1);
+      },
+      ::testing::ExitedWithCode(0), "");
+  EXPECT_EQ(ko::getEventLoop(), ko::getEventLoop());
+}
+
+}  // namespace

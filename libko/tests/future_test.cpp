@@ -1,0 +1,166 @@
+#include "ko/future.hpp"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <stdexcept>
+#include <thread>
+#include <vector>
+
+#include "ko/eventloop.hpp"
+#include "ko_test_helpers.hpp"
+
+namespace {
+
+using ko::Future;
+using ko::FutureState;
+using ko::Promise;
+using ::testing::HasSubstr;
+
+TEST(Future, ValueSetFromAnotherThreadWakesEveryWaiter) {
+  Promise<int> promise;
+  Future<int> future = promise.future();
+  EXPECT_EQ(future.wait(0), FutureState::Timeout);
+  EXPECT_TRUE(future.isRunning());
+
+  std::vector<std::thread> waiters;
+  std::vector<int> seen(4, 0);
+  for (std::size_t i = 0; i < seen.size(); ++i)
+    waiters.emplace_back([&, i] { seen[i] = future.value(10000); });
+  promise.setValue(42);
+  for (auto& t : waiters)
+    t.join();
+  EXPECT_THAT(seen, ::testing::Each(42));
+  EXPECT_EQ(future.wait(std::chrono::milliseconds(0)), FutureState::FinishedWithValue);
+  EXPECT_FALSE(future.hasError());
+  EXPECT_EQ(future.error(), "");
+}
+
+TEST(Future, ErrorIsCarriedAndRaisedWithItsText) {
+  Promise<std::string> promise;
+  auto future = promise.future();
+  promise.setError("the speech engine is gone");
+  EXPECT_TRUE(future.hasError());
+  EXPECT_EQ(future.error(), "the speech engine is gone");
+  EXPECT_EQ(future.wait(), FutureState::FinishedWithError);
+  try {
+    future.value();
+    FAIL() << "value() did not throw";
+  } catch (const ko::FutureError& e) {
+    EXPECT_STREQ(e.what(), "the speech engine is gone");
+  }
+}
+
+TEST(Future, TimeoutLeavesTheFutureRunning) {
+  Promise<int> promise;
+  auto future = promise.future();
+  EXPECT_EQ(future.wait(std::chrono::milliseconds(20)), FutureState::Timeout);
+  EXPECT_THROW(
+      {
+        try {
+          future.value(5);
+        } catch (const ko::FutureError& e) {
+          EXPECT_STREQ(e.what(), "Future timeout");
+          throw;
+        }
+      },
+      ko::FutureError);
+  promise.setValue(7);
+  EXPECT_EQ(future.value(0), 7);
+}
+
+TEST(Future, SecondResultIsRefused) {
+  Promise<int> promise;
+  promise.setValue(1);
+  EXPECT_THROW(promise.setValue(2), ko::FutureError);
+  EXPECT_THROW(promise.setError("late"), ko::FutureError);
+  EXPECT_FALSE(promise.trySetError("late"));
+  EXPECT_EQ(promise.future().value(), 1);
+}
+
+TEST(Future, BrokenPromiseOnlyWhenTheLastCopyGoes) {
+  Future<int> future;
+  {
+    Promise<int> first;
+    future = first.future();
+    {
+      Promise<int> copy = first;
+      Promise<int> moved = std::move(copy);
+    }
+    EXPECT_TRUE(future.isRunning());
+  }
+  EXPECT_EQ(future.error(0), ko::kPromiseBrokenText);
+  EXPECT_EQ(future.error(0), "Promise broken");
+}
+
+TEST(Future, CanceledAndInvalidFutures) {
+  Promise<void> promise;
+  auto canceled = promise.future();
+  promise.setCanceled();
+  EXPECT_TRUE(canceled.isCanceled());
+  EXPECT_THROW(canceled.value(), ko::FutureError);
+
+  Future<int> invalid;
+  EXPECT_FALSE(invalid.isValid());
+  EXPECT_EQ(invalid.wait(), FutureState::None);
+  EXPECT_TRUE(invalid.hasError());
+  EXPECT_EQ(invalid.error(), "Invalid future");
+}
+
+TEST(Future, ReadyFutureNeedsNoPromise) {
+  auto f = ko::makeFutureValue(std::string("ready"));
+  EXPECT_EQ(f.state(), FutureState::FinishedWithValue);
+  EXPECT_EQ(f.value(), "ready");
+  EXPECT_EQ(std::move(f).value(), "ready");
+  EXPECT_EQ(ko::makeFutureValue().wait(), FutureState::FinishedWithValue);
+  EXPECT_EQ(ko::makeFutureError<int>("no").error(), "no");
+}
+
+TEST(FutureThen, RunsInTheFinishingThreadOrAtOnce) {
+  Promise<int> promise;
+  std::thread::id ranIn;
+  auto doubled = promise.future().then([&](Future<int> f) {
+    ranIn = std::this_thread::get_id();
+    return f.value() * 2;
+  });
+  EXPECT_TRUE(doubled.isRunning());
+  std::thread setter([&] { promise.setValue(21); });
+  const auto setterId = setter.get_id();
+  setter.join();
+  EXPECT_EQ(doubled.value(), 42);
+  EXPECT_EQ(ranIn, setterId);
+
+  // Already finished: the callback runs in this thread before then() returns.
+  bool called = false;
+  promise.future().then([&](const Future<int>&) { called = true; });
+  EXPECT_TRUE(called);
+  auto onReady = ko::makeFutureValue(3).then([](Future<int> f) { return f.value() + 1; });
+  EXPECT_EQ(onReady.value(0), 4);
+}
+
+TEST(FutureThen, ErrorsFlowThrough) {
+  Promise<int> promise;
+  auto seenError = promise.future().then([](Future<int> f) { return f.error(); });
+  auto chained = promise.future().andThen([](int v) { return v + 1; });
+  auto throwing = promise.future().then([](Future<int>) -> int { throw std::runtime_error("cb"); });
+  promise.setError("boom");
+  EXPECT_EQ(seenError.value(), "boom");
+  EXPECT_EQ(chained.error(), "boom");
+  EXPECT_EQ(throwing.error(), "cb");
+
+  Promise<void> done;
+  auto next = done.future().andThen([] { return std::string("after"); });
+  done.setValue();
+  EXPECT_EQ(next.value(), "after");
+}
+
+TEST(Future, AsyncJobThatThrowsCarriesTheExceptionText) {
+  ko::EventLoop loop("future-test", 1);
+  auto f = loop.async([]() -> int { throw std::invalid_argument("bad posture family"); });
+  EXPECT_EQ(f.wait(10000), FutureState::FinishedWithError);
+  EXPECT_EQ(f.error(), "bad posture family");
+  auto g = loop.async([] { throw 5; });
+  EXPECT_EQ(g.error(10000), "Unknown exception");
+}
+
+}  // namespace

@@ -1,0 +1,331 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <mutex>
+#include <set>
+#include <stdexcept>
+#include <thread>
+
+#include "ko/dynamicobject.hpp"
+#include "ko/genericobject.hpp"
+#include "ko_test_helpers.hpp"
+
+namespace {
+
+using ko::AnyObject;
+using ko::AnyValue;
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+
+class Speaker {
+ public:
+  std::string say(const std::string& text) { return "said " + text; }
+  std::string sayWith(const std::string& text, const std::string& config) {
+    return "said " + text + " with " + config;
+  }
+  int volume() const { return volume_; }
+  void setVolume(int v) { volume_ = v; }
+
+ private:
+  std::atomic<int> volume_{50};
+};
+
+// An object with overloads, members, a raw method, a failing method and a signal.
+AnyObject makeCalculator(ko::DynamicObjectBuilder& b, Speaker& speaker) {
+  b.setDescription("calculator");
+  b.advertiseMethod(
+      "add", [](int a, int c) { return a + c; }, "Adds integers.");
+  b.advertiseMethod("add", [](const std::string& a, const std::string& c) { return a + c; });
+  b.advertiseMethod("add", [](double a, double c) { return a + c; });
+  b.advertiseMethod("say", &speaker, &Speaker::say, "Says a text.");
+  b.advertiseMethod("say", &speaker, &Speaker::sayWith);
+  b.advertiseMethod("volume", &speaker, &Speaker::volume);
+  b.advertiseMethod("setVolume", &speaker, &Speaker::setVolume);
+  b.advertiseMethod("fail", []() -> int { throw std::runtime_error("engine overheated"); });
+  b.advertiseMethod("sum", "([m])", "m",
+                    [](const std::vector<AnyValue>& args) {
+                      int total = 0;
+                      for (const auto& v : args[0].asList())
+                        total += v.to<int>();
+                      return AnyValue(total);
+                    },
+                    "Sums a list.", {{"values", "The values to add."}}, {"total", "Their sum."});
+  b.advertiseSignal<int, std::string>("ticked");
+  return b.object();
+}
+
+class ObjectTest : public ::testing::Test {
+ protected:
+  Speaker speaker_;
+  ko::DynamicObjectBuilder builder_;
+  AnyObject obj_ = makeCalculator(builder_, speaker_);
+};
+
+struct OverloadCase {
+  const char* label;
+  std::vector<AnyValue> args;
+  AnyValue expected;
+};
+
+TEST_F(ObjectTest, OverloadsResolveExactThenByAcceptance) {
+  const std::vector<OverloadCase> cases = {
+      {"exact ints", {1, 2}, 3},
+      {"exact strings", {"ab", "cd"}, "abcd"},
+      {"exact doubles", {1.5, 2.0}, 3.5},
+      {"float and int only fit doubles", {1.5, 2}, 3.5},
+      {"dynamic string fits strings", {AnyValue::dynamic("x"), "y"}, "xy"},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.label);
+    EXPECT_EQ(obj_->call(std::string_view("add"), c.args), c.expected);
+  }
+  EXPECT_EQ(obj_->call<std::string>("say", "hello"), "said hello");
+  EXPECT_EQ(obj_->call<std::string>("say", "hello", "{}"), "said hello with {}");
+}
+
+TEST_F(ObjectTest, NoSingleMatchListsTheCandidates) {
+  try {
+    obj_->call<int>("add", "a", 1);
+    FAIL() << "ambiguous call accepted";
+  } catch (const ko::OverloadError& e) {
+    EXPECT_EQ(e.method(), "add");
+    EXPECT_EQ(e.argumentsSignature(), "(si)");
+    EXPECT_THAT(e.candidates(), ElementsAre("add::(ii)", "add::(ss)", "add::(dd)"));
+    EXPECT_THAT(e.what(), HasSubstr("add::(ss)"));
+  }
+  // Integers are accepted both as integers and as doubles, but the exact match wins...
+  EXPECT_EQ(obj_->call<int>("add", 2, 3), 5);
+  // ...while an 8-byte integer pair has no exact match and fits two overloads.
+  EXPECT_THROW(obj_->call("add", std::int64_t{2}, std::int64_t{3}), ko::OverloadError);
+  EXPECT_THROW(obj_->call("add", 1), ko::OverloadError);
+  EXPECT_THROW(obj_->call("volume", 1), ko::OverloadError);
+  try {
+    obj_->call("missing");
+    FAIL();
+  } catch (const ko::Error& e) {
+    EXPECT_STREQ(e.what(), "Cannot find method 'missing' on calculator");
+  }
+}
+
+TEST_F(ObjectTest, MetaObjectDescribesEveryMember) {
+  const ko::MetaObject meta = obj_->metaObject();
+  EXPECT_EQ(meta.description(), "calculator");
+  const auto adds = obj_->findMethod("add");
+  ASSERT_EQ(adds.size(), 3u);
+  EXPECT_EQ(adds[0].parametersSignature, "(ii)");
+  EXPECT_EQ(adds[0].returnSignature, "i");
+  EXPECT_EQ(adds[0].description, "Adds integers.");
+  EXPECT_EQ(adds[1].returnSignature, "s");
+  EXPECT_EQ(obj_->findMethod("setVolume").at(0).returnSignature, "v");
+  const auto sum = obj_->findMethod("sum").at(0);
+  EXPECT_EQ(sum.arity, 1u);
+  ASSERT_EQ(sum.parameters.size(), 1u);
+  EXPECT_EQ(sum.parameters[0].name, "values");
+  EXPECT_EQ(sum.returnValue.description, "Their sum.");
+
+  std::set<unsigned> ids;
+  for (const auto& m : meta.methods())
+    ids.insert(m.id);
+  for (const auto& s : meta.signals())
+    ids.insert(s.id);
+  EXPECT_EQ(ids.size(), meta.methods().size() + meta.signals().size());
+  const auto* ticked = meta.findSignal("ticked");
+  ASSERT_NE(ticked, nullptr);
+  EXPECT_EQ(ticked->parametersSignature, "(is)");
+  EXPECT_EQ(meta.method(ticked->id), nullptr);
+  EXPECT_TRUE(obj_->findMethod("nothing").empty());
+}
+
+TEST_F(ObjectTest, CallByIdAndRawMethods) {
+  const unsigned id = obj_->findMethod("add").at(1).id;
+  EXPECT_EQ(obj_->callById<std::string>(id, {"k", "o"}), "ko");
+  std::vector<AnyValue> listArg;
+  listArg.push_back(AnyValue::list({1, 2, 3}));
+  EXPECT_EQ(obj_->call<int>("sum", listArg), 6);
+  obj_->call<void>("setVolume", 80);
+  EXPECT_EQ(obj_->call<int>("volume"), 80);
+}
+
+TEST_F(ObjectTest, FailuresCarryTheirText) {
+  struct Case {
+    const char* label;
+    std::function<void()> call;
+    std::string text;
+  };
+  const std::vector<Case> cases = {
+      {"method throws", [&] { obj_->call<int>("fail"); }, "engine overheated"},
+      {"argument does not convert", [&] { obj_->call("setVolume", "loud"); },
+       "Cannot convert argument 1 of setVolume::(i): "},
+      {"unknown id", [&] { obj_->callById(12345, {}); }, "No method with id 12345"},
+      {"wrong count by id", [&] { obj_->callById(obj_->findMethod("volume")[0].id, {1}); },
+       "Method volume::() takes 0 argument(s), got 1"},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.label);
+    try {
+      c.call();
+      ADD_FAILURE() << "no error";
+    } catch (const ko::Error& e) {
+      EXPECT_THAT(e.what(), HasSubstr(c.text));
+    }
+  }
+}
+
+TEST_F(ObjectTest, ResultConversionErrorNamesBothSignatures) {
+  try {
+    obj_->call<std::string>("add", 1, 2);
+    FAIL() << "converted an int to a string";
+  } catch (const ko::ResultConversionError& e) {
+    EXPECT_EQ(e.sourceSignature(), "i");
+    EXPECT_EQ(e.targetSignature(), "s");
+    EXPECT_STREQ(e.what(), "Unable to convert call result to target type: from i to s");
+  }
+  EXPECT_THROW(obj_->call<std::vector<int>>("say", "x"), ko::ResultConversionError);
+  EXPECT_EQ(obj_->async<std::string>("add", 1, 2).error(10000),
+            "Unable to convert call result to target type: from i to s");
+}
+
+TEST_F(ObjectTest, AsyncRunsOnTheEventLoop) {
+  auto loop = std::make_shared<ko::EventLoop>("object", 2);
+  builder_.dynamicObject()->setEventLoop(loop);
+  auto object = builder_.dynamicObject();
+  builder_.advertiseMethod("inLoop", [loop] { return loop->isInThisLoop(); });
+  EXPECT_TRUE(obj_->async<bool>("inLoop").value(10000));
+  EXPECT_EQ(obj_->async<int>("add", 20, 22).value(10000), 42);
+  EXPECT_EQ(obj_->async<int>("fail").error(10000), "engine overheated");
+  EXPECT_THAT(obj_->async("nope").error(0), HasSubstr("Cannot find method 'nope'"));
+  auto queued = object->metaCall(obj_->findMethod("inLoop")[0].id, {}, ko::MetaCallType::Queued);
+  EXPECT_TRUE(queued.value(10000).to<bool>());
+}
+
+TEST_F(ObjectTest, ManyThreadsCallWhileMethodsAreAdded) {
+  constexpr int kThreads = 8;
+  constexpr int kCalls = 2000;
+  std::atomic<int> wrong{0};
+  std::vector<std::thread> threads;
+  for (int t = 0; t < kThreads; ++t) {
+    threads.emplace_back([&, t] {
+      for (int i = 0; i < kCalls; ++i) {
+        if (obj_->call<int>("add", t, i) != t + i)
+          ++wrong;
+        if (obj_->call<std::string>("add", "a", "b") != "ab")
+          ++wrong;
+      }
+    });
+  }
+  // Publishing goes on meanwhile: every addition publishes a new member table.
+  for (int m = 0; m < 50; ++m)
+    builder_.advertiseMethod("late" + std::to_string(m), [m] { return m; });
+  for (auto& th : threads)
+    th.join();
+  EXPECT_EQ(wrong.load(), 0);
+  EXPECT_EQ(obj_->call<int>("late49"), 49);
+}
+
+TEST_F(ObjectTest, DuplicatesAndMalformedSignaturesAreRefused) {
+  EXPECT_THROW(builder_.advertiseMethod("add", [](int a, int c) { return a * c; }), ko::Error);
+  EXPECT_THROW(builder_.advertiseSignal<int>("ticked"), ko::Error);
+  EXPECT_THROW(builder_.advertiseSignal<int>("add"), ko::Error);
+  EXPECT_THROW(builder_.advertiseMethod("raw", "([i", "v", [](const auto&) { return AnyValue(); }),
+               ko::Error);
+  EXPECT_THROW(builder_.advertiseMethod("raw", "(i)", "v", ko::MethodFunction()), ko::Error);
+  // A refused member leaves the object as it was.
+  EXPECT_TRUE(obj_->findMethod("raw").empty());
+}
+
+TEST_F(ObjectTest, SignalConnectedFromAnotherObject) {
+  // A listener service whose method is called from the calculator's signal.
+  ko::DynamicObjectBuilder listenerBuilder;
+  std::vector<std::string> heard;
+  std::mutex heardMutex;
+  listenerBuilder.advertiseMethod("onTick", [&](int n, const std::string& what) {
+    std::lock_guard lock(heardMutex);
+    heard.push_back(what + std::to_string(n));
+  });
+  AnyObject listener = listenerBuilder.object();
+
+  const ko::SignalLink link = obj_->connect(
+      "ticked", [listener](int n, std::string what) { listener->call<void>("onTick", n, what); });
+  std::vector<AnyValue> raw;
+  const ko::SignalLink rawLink =
+      obj_->connect("ticked", [&](const std::vector<AnyValue>& args) { raw = args; });
+
+  obj_->post("ticked", 1, "tick");
+  builder_.dynamicObject()->signal<int, std::string>("ticked")->operator()(2, "tock");
+  obj_->disconnect(link);
+  obj_->post("ticked", 3, "gone");
+  EXPECT_THAT(heard, ElementsAre("tick1", "tock2"));
+  ASSERT_EQ(raw.size(), 2u);
+  EXPECT_EQ(raw[0].to<int>(), 3);
+
+  obj_->disconnect(rawLink);
+  EXPECT_THROW(obj_->disconnect(rawLink), ko::Error);
+  EXPECT_THROW(obj_->post("ticked", "wrong", "types"), ko::Error);
+  EXPECT_THROW(obj_->post("nope"), ko::Error);
+  EXPECT_THROW(obj_->connect("nope", [](int) {}), ko::Error);
+}
+
+TEST_F(ObjectTest, PropertiesHoldValues) {
+  builder_.advertiseProperty("language", "French");
+  EXPECT_EQ(obj_->property("language").value().to<std::string>(), "French");
+  obj_->setProperty("language", "English").value();
+  EXPECT_EQ(obj_->property("language").value().to<std::string>(), "English");
+  EXPECT_TRUE(obj_->property("volume").hasError());
+}
+
+TEST(WeakObject, CallsOnAGoneObjectFailClearly) {
+  auto holder = std::make_shared<ko::DynamicObject>();
+  holder->advertiseMethod("ping", [] { return true; });
+  AnyObject weak = ko::GenericObject::makeWeak(holder, "ZUMokuto");
+  EXPECT_TRUE(weak->isWeak());
+  EXPECT_TRUE(weak->call<bool>("ping"));
+  holder.reset();
+  EXPECT_FALSE(weak->isValid());
+  EXPECT_EQ(weak->dynamicObject(), nullptr);
+  try {
+    weak->call<bool>("ping");
+    FAIL();
+  } catch (const ko::Error& e) {
+    EXPECT_STREQ(e.what(), "Object is gone: ZUMokuto");
+  }
+  EXPECT_THROW(weak->callById(100, {}), ko::Error);
+  EXPECT_THROW(weak->metaObject(), ko::Error);
+  EXPECT_THROW(weak->post("x"), ko::Error);
+  EXPECT_EQ(weak->async<bool>("ping").error(0), "Object is gone: ZUMokuto");
+  EXPECT_EQ(weak->asyncById<bool>(100, {}).error(0), "Object is gone: ZUMokuto");
+  EXPECT_THROW(ko::GenericObject::makeStrong(nullptr), ko::Error);
+}
+
+// The shape of the module layer: a subclass overrides the call by id.
+class Module : public ko::DynamicObject {
+ public:
+  Module() {
+    advertiseMethod("version", [] { return std::string("2.1.4"); });
+  }
+  ko::Future<AnyValue> metaCall(unsigned id, const std::vector<AnyValue>& args,
+                                ko::MetaCallType type) override {
+    ++calls;
+    if (!metaObject().method(id))
+      throw ko::Error("Cant call methodId:" + std::to_string(id) + " on module:Module");
+    return DynamicObject::metaCall(id, args, type);
+  }
+  std::atomic<int> calls{0};
+};
+
+TEST(DynamicObjectSubclass, OverriddenCallIsUsedByHandles) {
+  auto module = std::make_shared<Module>();
+  AnyObject obj = ko::GenericObject::makeStrong(module, "Module");
+  EXPECT_EQ(obj->call<std::string>("version"), "2.1.4");
+  EXPECT_EQ(obj->async<std::string>("version").value(10000), "2.1.4");
+  EXPECT_EQ(module->calls.load(), 2);
+  try {
+    obj->callById(7, {});
+    FAIL();
+  } catch (const ko::Error& e) {
+    EXPECT_STREQ(e.what(), "Cant call methodId:7 on module:Module");
+  }
+  EXPECT_EQ(obj->asyncById(7, {}).error(10000), "Cant call methodId:7 on module:Module");
+}
+
+}  // namespace

@@ -1,0 +1,96 @@
+#include "ko/path.hpp"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <set>
+#include <thread>
+
+#include "ko/os.hpp"
+
+namespace {
+
+namespace fs = std::filesystem;
+using ::testing::ElementsAre;
+
+// Two data roots under a temporary directory, set as ZEFOKO_DATA_PATH for the test.
+class FindDataTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    base_ = fs::temp_directory_path() / ("ko_path_test_" + std::to_string(ko::os::gettid()));
+    fs::remove_all(base_);
+    first_ = base_ / "first";
+    second_ = base_ / "second";
+    fs::create_directories(first_ / "zefoko" / "db");
+    fs::create_directories(second_ / "zefoko" / "db");
+    const char* old = std::getenv("ZEFOKO_DATA_PATH");
+    if (old)
+      saved_ = old;
+    hadOld_ = old != nullptr;
+    setenv("ZEFOKO_DATA_PATH", (first_.string() + "::" + second_.string()).c_str(), 1);
+  }
+  void TearDown() override {
+    if (hadOld_)
+      setenv("ZEFOKO_DATA_PATH", saved_.c_str(), 1);
+    else
+      unsetenv("ZEFOKO_DATA_PATH");
+    fs::remove_all(base_);
+  }
+  static void touch(const fs::path& p) { std::ofstream(p) << "x"; }
+
+  fs::path base_, first_, second_;
+  std::string saved_;
+  bool hadOld_ = false;
+};
+
+TEST_F(FindDataTest, FirstDirectoryOfTheVariableWins) {
+  touch(first_ / "zefoko" / "db" / "both.bdb");
+  touch(second_ / "zefoko" / "db" / "both.bdb");
+  touch(second_ / "zefoko" / "db" / "second.bdb");
+  EXPECT_EQ(ko::path::findData("zefoko", "db/both.bdb"), (first_ / "zefoko/db/both.bdb").string());
+  EXPECT_EQ(ko::path::findData("zefoko", "db/second.bdb"),
+            (second_ / "zefoko/db/second.bdb").string());
+  EXPECT_EQ(ko::path::findData("zefoko", "db/none.bdb"), "");
+  EXPECT_EQ(ko::path::findData("other", "db/both.bdb"), "");
+}
+
+TEST_F(FindDataTest, RootsInOrderAndExistingDirectories) {
+  const auto roots = ko::path::dataRoots();
+  ASSERT_EQ(roots.size(), 4u);  // the empty entry between "::" is skipped
+  EXPECT_EQ(roots[0], first_.string());
+  EXPECT_EQ(roots[1], second_.string());
+  EXPECT_EQ(roots[2], KO_TEST_BUILD_SHARE_DIR);
+  EXPECT_THAT(
+      ko::path::dataDirectories("zefoko"),
+      ::testing::IsSupersetOf({(first_ / "zefoko").string(), (second_ / "zefoko").string()}));
+  EXPECT_EQ(ko::path::dataDirectories("zefoko").front(), (first_ / "zefoko").string());
+  EXPECT_TRUE(ko::path::dataDirectories("no-such-application").empty());
+}
+
+TEST_F(FindDataTest, PathsLeavingTheDataDirectoryAreRefused) {
+  touch(first_ / "secret.txt");
+  touch(first_ / "zefoko" / "db" / "ok.bdb");
+  for (const char* bad : {"", "../secret.txt", "db/../../secret.txt", "/etc/hostname"}) {
+    SCOPED_TRACE(bad);
+    EXPECT_EQ(ko::path::findData("zefoko", bad), "");
+  }
+  EXPECT_EQ(ko::path::findData("zefoko", "db/./ok.bdb"), (first_ / "zefoko/db/ok.bdb").string());
+  EXPECT_EQ(ko::path::findData("..", "secret.txt"), "");
+}
+
+TEST(Os, ClockEnvironmentAndThreadIds) {
+  const auto t0 = ko::os::ustime();
+  EXPECT_LE(t0, ko::os::ustime());
+  EXPECT_EQ(ko::os::getenv("KO_TEST_SURELY_UNSET_VARIABLE"), "");
+  setenv("KO_TEST_SET_VARIABLE", "0x1F4", 1);
+  EXPECT_EQ(ko::os::getenv("KO_TEST_SET_VARIABLE"), "0x1F4");
+  int other = 0;
+  std::thread([&] { other = ko::os::gettid(); }).join();
+  EXPECT_GT(ko::os::gettid(), 0);
+  EXPECT_NE(other, ko::os::gettid());
+}
+
+}  // namespace

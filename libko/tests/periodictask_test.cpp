@@ -1,0 +1,218 @@
+#include "ko/periodictask.hpp"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <future>
+#include <stdexcept>
+
+#include "ko/log.hpp"
+#include "ko/os.hpp"
+#include "ko_test_helpers.hpp"
+
+namespace {
+
+using ko::test::Counter;
+using ko::test::eventually;
+using ko::test::Gate;
+
+class PeriodicTaskTest : public ::testing::Test {
+ protected:
+  std::shared_ptr<ko::EventLoop> loop_ = std::make_shared<ko::EventLoop>("periodic", 4);
+};
+
+TEST_F(PeriodicTaskTest, DelayedStartWaitsOnePeriodImmediateStartDoesNot) {
+  constexpr std::int64_t period = 50000;
+  for (const bool immediate : {false, true}) {
+    SCOPED_TRACE(immediate ? "immediate" : "delayed");
+    ko::PeriodicTask task(loop_);
+    Counter calls;
+    std::atomic<std::int64_t> firstCall{0};
+    task.setCallback([&] {
+      std::int64_t unset = 0;
+      firstCall.compare_exchange_strong(unset, ko::os::ustime());
+      calls.increment();
+    });
+    task.setUsPeriod(period);
+    const std::int64_t started = ko::os::ustime();
+    task.start(immediate);
+    EXPECT_TRUE(task.isRunning());
+    ASSERT_TRUE(calls.waitFor(2));
+    task.stop();
+    EXPECT_FALSE(task.isRunning());
+    if (!immediate) {
+      EXPECT_GE(firstCall.load() - started, period);
+    }
+  }
+}
+
+TEST_F(PeriodicTaskTest, PeriodSetFromTheCallbackDelaysTheNextRun) {
+  ko::PeriodicTask task(loop_);
+  task.setName("period change");
+  constexpr std::int64_t longPeriod = 80000;
+  Counter calls;
+  std::atomic<std::int64_t> firstEnd{0}, secondStart{0};
+  task.setCallback([&] {
+    const int n = calls.value() + 1;
+    if (n == 1) {
+      task.setUsPeriod(longPeriod);
+      firstEnd = ko::os::ustime();
+    } else if (n == 2) {
+      secondStart = ko::os::ustime();
+    }
+    calls.increment();
+  });
+  task.setUsPeriod(0);
+  task.start(true);
+  ASSERT_TRUE(calls.waitFor(2));
+  task.stop();
+  EXPECT_EQ(task.usPeriod(), longPeriod);
+  EXPECT_GE(secondStart.load() - firstEnd.load(), longPeriod);
+}
+
+TEST_F(PeriodicTaskTest, StopWaitsForTheRunningCallback) {
+  ko::PeriodicTask task(loop_);
+  Gate entered, release;
+  std::atomic<bool> callbackDone{false};
+  Counter calls;
+  task.setCallback([&] {
+    if (calls.increment() == 1) {
+      entered.open();
+      release.wait();
+    }
+    callbackDone = true;
+  });
+  task.setUsPeriod(1000);
+  task.start();
+  ASSERT_TRUE(entered.wait());
+
+  std::atomic<bool> stopReturned{false};
+  bool doneWhenStopReturned = false;
+  std::thread stopper([&] {
+    task.stop();
+    doneWhenStopReturned = callbackDone.load();
+    stopReturned = true;
+  });
+  ASSERT_TRUE(eventually([&] { return task.isStopping(); }));
+  EXPECT_FALSE(stopReturned.load());
+  EXPECT_TRUE(task.isRunning());
+  release.open();
+  stopper.join();
+  EXPECT_TRUE(doneWhenStopReturned);
+  EXPECT_FALSE(task.isRunning());
+  EXPECT_FALSE(task.isStopping());
+  EXPECT_EQ(calls.value(), 1);
+}
+
+TEST_F(PeriodicTaskTest, StopFromInsideTheCallbackDoesNotDeadlock) {
+  ko::PeriodicTask task(loop_);
+  Counter calls;
+  Gate stopReturned;
+  task.setCallback([&] {
+    calls.increment();
+    task.stop();
+    EXPECT_TRUE(task.isStopping());
+    stopReturned.open();
+  });
+  task.setUsPeriod(0);
+  task.start();
+  ASSERT_TRUE(stopReturned.wait());
+  task.stop();  // waits for the callback to return
+  EXPECT_FALSE(task.isRunning());
+  EXPECT_EQ(calls.value(), 1);
+}
+
+TEST_F(PeriodicTaskTest, CallbacksNeverOverlap) {
+  ko::PeriodicTask task(loop_);
+  std::atomic<int> inside{0}, overlaps{0};
+  Counter calls;
+  task.setCallback([&] {
+    if (inside.fetch_add(1) != 0)
+      ++overlaps;
+    std::this_thread::yield();
+    inside.fetch_sub(1);
+    calls.increment();
+  });
+  task.setUsPeriod(0);
+  task.start();
+  // Restarting and period changes while it runs must not produce a second chain of runs.
+  for (int i = 0; i < 20; ++i) {
+    task.start();
+    task.setUsPeriod(i % 2);
+  }
+  ASSERT_TRUE(calls.waitFor(300));
+  task.stop();
+  EXPECT_EQ(overlaps.load(), 0);
+}
+
+TEST_F(PeriodicTaskTest, RestartFromTheCallbackCancelsItsOwnStop) {
+  ko::PeriodicTask task(loop_);
+  Counter calls;
+  task.setCallback([&] {
+    if (calls.increment() == 1) {
+      task.asyncStop();
+      task.start();
+    }
+  });
+  task.setUsPeriod(0);
+  task.start();
+  ASSERT_TRUE(calls.waitFor(3));
+  task.stop();
+}
+
+TEST_F(PeriodicTaskTest, ThrowingCallbackIsLoggedAndTheTaskGoesOn) {
+  ko::log::ScopedCapture cap;
+  ko::PeriodicTask task(loop_);
+  task.setName("thrower");
+  Counter calls;
+  task.setCallback([&] {
+    calls.increment();
+    throw std::runtime_error("no motion");
+  });
+  task.setUsPeriod(0);
+  task.start();
+  ASSERT_TRUE(calls.waitFor(3));
+  task.stop();
+  EXPECT_TRUE(cap->containsPart("ko.periodictask", ko::log::Error, "'thrower' threw: no motion"));
+}
+
+TEST_F(PeriodicTaskTest, BadUseIsRefused) {
+  ko::PeriodicTask task(loop_);
+  task.setName("empty");
+  EXPECT_THROW(task.start(), ko::Error);
+  EXPECT_THROW(task.setUsPeriod(-1), ko::Error);
+  task.stop();  // stopping a task that never ran is harmless
+  task.asyncStop();
+  EXPECT_FALSE(task.isRunning());
+  EXPECT_EQ(task.name(), "empty");
+}
+
+TEST_F(PeriodicTaskTest, StoppingTheLoopStopsItsTasks) {
+  ko::PeriodicTask task(loop_);
+  task.setCallback([] {});
+  task.setUsPeriod(3600LL * 1000000);
+  task.start(false);
+  loop_->stop();
+  EXPECT_TRUE(eventually([&] { return !task.isRunning(); }));
+  EXPECT_THROW(task.start(), ko::Error);
+}
+
+TEST(PeriodicTask, DerivedWorkerOnTheDefaultLoop) {
+  // The shape of a worker that derives from the task and stops it in its destructor.
+  class Worker : public ko::PeriodicTask {
+   public:
+    Worker() {
+      setName("worker");
+      setCallback([this] { runs.increment(); });
+      setUsPeriod(100);
+    }
+    ~Worker() override { stop(); }
+    Counter runs;
+  };
+  Worker w;
+  w.start(false);
+  EXPECT_TRUE(w.runs.waitFor(2));
+}
+
+}  // namespace

@@ -1,0 +1,130 @@
+#include "ko/session.hpp"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <thread>
+
+#include "ko/dynamicobject.hpp"
+#include "ko/genericobject.hpp"
+
+namespace {
+
+using ko::AnyObject;
+using ko::FutureState;
+using ::testing::ElementsAre;
+
+AnyObject makeService(const std::string& answer) {
+  ko::DynamicObjectBuilder b;
+  b.advertiseMethod("whoami", [answer] { return answer; });
+  return b.object();
+}
+
+class SessionTest : public ::testing::Test {
+ protected:
+  ko::Session session_;
+};
+
+TEST_F(SessionTest, RegisteredServiceIsFoundInBothScopes) {
+  const unsigned id = session_.registerService("ZUMemory", makeService("memory"));
+  EXPECT_NE(id, 0u);
+  for (const std::string scope : {"local", ""}) {
+    SCOPED_TRACE("scope '" + scope + "'");
+    auto found = session_.service("ZUMemory", scope);
+    ASSERT_EQ(found.wait(0), FutureState::FinishedWithValue);
+    EXPECT_EQ(found.value()->call<std::string>("whoami"), "memory");
+  }
+  EXPECT_THAT(session_.services(), ElementsAre("ZUMemory"));
+}
+
+TEST_F(SessionTest, NameInUseIsRefused) {
+  const unsigned id = session_.registerService("ZUMotion", makeService("first"));
+  try {
+    session_.registerService("ZUMotion", makeService("second"));
+    FAIL() << "duplicate accepted";
+  } catch (const ko::Error& e) {
+    EXPECT_STREQ(e.what(), "Service 'ZUMotion' is already registered");
+  }
+  EXPECT_EQ(session_.service("ZUMotion").value()->call<std::string>("whoami"), "first");
+  session_.unregisterService(id);
+  EXPECT_NE(session_.registerService("ZUMotion", makeService("second")), id);
+}
+
+TEST_F(SessionTest, MissingServicesAndBadInput) {
+  EXPECT_EQ(session_.service("ZUTextToSpeech", "local").error(0),
+            "Cannot find service 'ZUTextToSpeech'");
+  EXPECT_EQ(session_.service("ZUTextToSpeech").error(0), "Cannot find service 'ZUTextToSpeech'");
+  EXPECT_EQ(session_.service("x", "galaxy").error(0), "Unknown scope 'galaxy'");
+  EXPECT_THROW(session_.registerService("", makeService("x")), ko::Error);
+  EXPECT_THROW(session_.registerService("empty", nullptr), ko::Error);
+  EXPECT_THROW(session_.unregisterService(42u), ko::Error);
+  EXPECT_THROW(session_.unregisterService("nobody"), ko::Error);
+}
+
+TEST_F(SessionTest, UnregisterByIdOrNameAndSignals) {
+  std::vector<std::string> events;
+  session_.serviceRegistered.connect([&](unsigned id, const std::string& name) {
+    events.push_back("+" + name + std::to_string(id));
+  });
+  session_.serviceUnregistered.connect([&](unsigned id, const std::string& name) {
+    events.push_back("-" + name + std::to_string(id));
+  });
+  const unsigned a = session_.registerService("A", makeService("a"));
+  const unsigned b = session_.registerService("B", makeService("b"));
+  session_.unregisterService(a);
+  session_.unregisterService("B");
+  EXPECT_TRUE(session_.services().empty());
+  EXPECT_TRUE(session_.service("A").hasError());
+  EXPECT_THAT(events, ElementsAre("+A" + std::to_string(a), "+B" + std::to_string(b),
+                                  "-A" + std::to_string(a), "-B" + std::to_string(b)));
+}
+
+TEST_F(SessionTest, LookupHookCanHangFailOrPassThrough) {
+  session_.registerService("ZURobotPosture", makeService("posture"));
+  ko::Promise<AnyObject> never;
+  std::vector<std::string> asked;
+  session_.setLookupHook([&](const std::string& name,
+                             const std::string& scope) -> std::optional<ko::Future<AnyObject>> {
+    asked.push_back(name + "@" + scope);
+    if (name == "hang")
+      return never.future();
+    if (name == "fail")
+      return ko::makeFutureError<AnyObject>("network down");
+    if (name == "throw")
+      throw std::runtime_error("hook broke");
+    return std::nullopt;
+  });
+  EXPECT_EQ(session_.service("hang", "local").wait(std::chrono::milliseconds(20)),
+            FutureState::Timeout);
+  EXPECT_EQ(session_.service("fail").error(0), "network down");
+  EXPECT_EQ(session_.service("throw").error(0), "hook broke");
+  EXPECT_TRUE(session_.service("ZURobotPosture", "local").hasValue(0));
+  EXPECT_THAT(asked, ElementsAre("hang@local", "fail@", "throw@", "ZURobotPosture@local"));
+  session_.setLookupHook(nullptr);
+  EXPECT_EQ(session_.service("hang").error(0), "Cannot find service 'hang'");
+}
+
+TEST_F(SessionTest, ConcurrentRegistrationAndLookup) {
+  std::atomic<int> failures{0};
+  std::vector<std::thread> threads;
+  for (int t = 0; t < 4; ++t) {
+    threads.emplace_back([&, t] {
+      for (int i = 0; i < 200; ++i) {
+        const std::string name = "svc" + std::to_string(t) + "_" + std::to_string(i);
+        const unsigned id = session_.registerService(name, makeService(name));
+        auto found = session_.service(name, "local");
+        if (!found.hasValue(0) || found.value()->call<std::string>("whoami") != name)
+          ++failures;
+        session_.services();
+        session_.unregisterService(id);
+      }
+    });
+  }
+  for (auto& th : threads)
+    th.join();
+  EXPECT_EQ(failures.load(), 0);
+  EXPECT_TRUE(session_.services().empty());
+}
+
+}  // namespace
