@@ -54,8 +54,20 @@ AnyValue fromJsonValue(const nlohmann::ordered_json& json) {
 }
 
 AnyValue fromJson(std::string_view text) {
+  using Json = nlohmann::ordered_json;
+  bool tooDeep = false;
+  // Refuse deep nesting while parsing: the conversion below recurses once per level.
+  auto limit = [&tooDeep](int depth, Json::parse_event_t, Json&) {
+    if (depth > kMaxJsonDepth)
+      tooDeep = true;
+    return !tooDeep;
+  };
   try {
-    return fromJsonValue(nlohmann::ordered_json::parse(text.begin(), text.end()));
+    Json json = Json::parse(text.begin(), text.end(), limit);
+    if (tooDeep) {
+      throw JsonError("JSON nested deeper than " + std::to_string(kMaxJsonDepth) + " levels");
+    }
+    return fromJsonValue(json);
   } catch (const nlohmann::json::exception& e) {
     throw JsonError(e.what());
   }

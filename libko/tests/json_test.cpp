@@ -27,6 +27,13 @@ TEST(Json, MalformedTextIsAClearError) {
   EXPECT_THROW(ko::fromJson("[\"a\"] trailing"), ko::JsonError);
 }
 
+TEST(Json, DeepNestingIsRefusedNotACrash) {
+  const std::string deep(100000, '[');
+  EXPECT_THROW(ko::fromJson(deep + std::string(100000, ']')), ko::JsonError);
+  const int ok = ko::kMaxJsonDepth - 1;
+  EXPECT_NO_THROW(ko::fromJson(std::string(ok, '[') + std::string(ok, ']')));
+}
+
 TEST(Json, EncodesBack) {
   const std::string text = R"(["a",1,2.5,true,null,{"k":[1,2]}])";
   EXPECT_EQ(ko::toJson(ko::fromJson(text)).dump(), text);

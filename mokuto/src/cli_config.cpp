@@ -15,29 +15,12 @@ namespace mokuto::cli {
 
 namespace {
 
-// Configuration values nest three levels deep; deeper documents are refused before the
-// recursive conversions see them.
-constexpr int kMaxJsonDepth = 64;
-
-struct TooDeep {};
-
 int applyConfig(const std::string& text) {
   ko::AnyValue any;
   try {
-    using Json = nlohmann::ordered_json;
-    const Json json =
-        Json::parse(text, [](int depth, Json::parse_event_t /*event*/, Json& /*parsed*/) {
-          if (depth > kMaxJsonDepth)
-            throw TooDeep{};
-          return true;
-        });
-    any = ko::fromJsonValue(json);
-  } catch (const nlohmann::json::exception& e) {
+    any = ko::fromJson(text);
+  } catch (const ko::JsonError& e) {
     std::cerr << "mokuto config: invalid JSON: " << e.what() << std::endl;
-    return 1;
-  } catch (const TooDeep&) {
-    std::cerr << "mokuto config: invalid JSON: nested deeper than " << kMaxJsonDepth << " levels"
-              << std::endl;
     return 1;
   }
   ZU::ZUValue value;

@@ -20,7 +20,10 @@ class JsonError : public std::runtime_error {
   using std::runtime_error::runtime_error;
 };
 
-// Throws JsonError with the decoder's message (position included) on malformed text.
+constexpr int kMaxJsonDepth = 128;
+
+// Throws JsonError with the decoder's message (position included) on malformed text,
+// and on text nested deeper than kMaxJsonDepth.
 AnyValue fromJson(std::string_view text);
 AnyValue fromJsonValue(const nlohmann::ordered_json& json);
 
