@@ -1,0 +1,60 @@
+#pragma once
+// The simulated robot's timeline: one shared record of everything that happens to its
+// services (speech started, bookmark reached, behaviour started, joint move posted,
+// sound played, event raised), with the time in microseconds since the timeline began.
+//
+// Any thread may record; readers get a copy. Listeners are called in the recording
+// thread, after the entry is stored and outside the timeline's lock.
+
+#include <chrono>
+#include <cstdint>
+#include <functional>
+#include <mutex>
+#include <ostream>
+#include <string>
+#include <vector>
+
+#include "ko/anyvalue.hpp"
+
+namespace robotsim {
+
+struct TimelineEntry {
+  std::int64_t us = 0;  // since the timeline began
+  std::string service;
+  std::string operation;
+  ko::AnyValue arguments;  // a list, usually
+  ko::AnyValue result;     // void when there is none
+};
+
+class Timeline {
+ public:
+  Timeline();
+
+  void record(std::string service, std::string operation, ko::AnyValue arguments = {},
+              ko::AnyValue result = {});
+  // Microseconds since the timeline began (or was last cleared).
+  std::int64_t now() const;
+
+  std::vector<TimelineEntry> entries() const;
+  // The entries of one service and operation, in order.
+  std::vector<TimelineEntry> entries(const std::string& service,
+                                     const std::string& operation) const;
+  void clear();
+
+  // One JSON object per line: {"us":…,"service":…,"operation":…,"arguments":…,"result":…}.
+  void writeJsonLines(std::ostream& os) const;
+
+  using Listener = std::function<void(const TimelineEntry&)>;
+  // Listeners cannot be removed; add them before the services run.
+  void addListener(Listener listener);
+
+ private:
+  mutable std::mutex mutex_;
+  std::chrono::steady_clock::time_point start_;
+  std::vector<TimelineEntry> entries_;
+  std::vector<Listener> listeners_;
+};
+
+std::ostream& operator<<(std::ostream& os, const TimelineEntry& entry);
+
+}  // namespace robotsim

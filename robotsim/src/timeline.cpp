@@ -1,0 +1,90 @@
+#include "robotsim/timeline.h"
+
+#include "ko/json.hpp"
+
+namespace robotsim {
+
+namespace {
+nlohmann::ordered_json toJson(const TimelineEntry& e) {
+  nlohmann::ordered_json j;
+  j["us"] = e.us;
+  j["service"] = e.service;
+  j["operation"] = e.operation;
+  j["arguments"] = ko::toJson(e.arguments);
+  if (!e.result.isVoid())
+    j["result"] = ko::toJson(e.result);
+  return j;
+}
+}  // namespace
+
+Timeline::Timeline() : start_(std::chrono::steady_clock::now()) {}
+
+std::int64_t Timeline::now() const {
+  std::lock_guard lock(mutex_);
+  return std::chrono::duration_cast<std::chrono::microseconds>(std::chrono::steady_clock::now() -
+                                                               start_)
+      .count();
+}
+
+void Timeline::record(std::string service, std::string operation, ko::AnyValue arguments,
+                      ko::AnyValue result) {
+  TimelineEntry entry;
+  std::vector<Listener> listeners;
+  {
+    std::lock_guard lock(mutex_);
+    entry = TimelineEntry{std::chrono::duration_cast<std::chrono::microseconds>(
+                              std::chrono::steady_clock::now() - start_)
+                              .count(),
+                          std::move(service), std::move(operation), std::move(arguments),
+                          std::move(result)};
+    entries_.push_back(entry);
+    listeners = listeners_;
+  }
+  for (const auto& listener : listeners)
+    listener(entry);
+}
+
+std::vector<TimelineEntry> Timeline::entries() const {
+  std::lock_guard lock(mutex_);
+  return entries_;
+}
+
+std::vector<TimelineEntry> Timeline::entries(const std::string& service,
+                                             const std::string& operation) const {
+  std::vector<TimelineEntry> out;
+  std::lock_guard lock(mutex_);
+  for (const auto& e : entries_) {
+    if (e.service == service && e.operation == operation)
+      out.push_back(e);
+  }
+  return out;
+}
+
+void Timeline::clear() {
+  std::lock_guard lock(mutex_);
+  entries_.clear();
+  start_ = std::chrono::steady_clock::now();
+}
+
+void Timeline::writeJsonLines(std::ostream& os) const {
+  for (const auto& e : entries()) {
+    os << toJson(e).dump(-1, ' ', false, nlohmann::json::error_handler_t::replace) << '\n';
+  }
+}
+
+void Timeline::addListener(Listener listener) {
+  std::lock_guard lock(mutex_);
+  listeners_.push_back(std::move(listener));
+}
+
+std::ostream& operator<<(std::ostream& os, const TimelineEntry& e) {
+  const auto ms = static_cast<double>(e.us) / 1000.0;
+  os << std::fixed;
+  os.precision(1);
+  os << ms << " ms  " << e.service << "." << e.operation << " " << e.arguments.toString();
+  if (!e.result.isVoid())
+    os << " -> " << e.result.toString();
+  return os;
+}
+
+}  // namespace robotsim
