@@ -113,7 +113,8 @@ Future<void> DynamicObject::metaDisconnect(SignalLink link) {
     links_.erase(it);
   }
   // Outside the lock: this waits for running calls of the subscriber.
-  table().signal(signalId)->disconnect(link);
+  if (SignalBase* s = table().signal(signalId))
+    s->disconnect(link);
   return makeFutureValue();
 }
 

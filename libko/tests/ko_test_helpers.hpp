@@ -14,11 +14,10 @@ inline constexpr auto kBound = std::chrono::seconds(10);
 // A one-shot gate: wait() blocks until open() (or the bound passes; answers false then).
 class Gate {
  public:
+  // Notifies under the lock: a waiter may destroy the gate as soon as it wakes.
   void open() {
-    {
-      std::lock_guard lock(mutex_);
-      open_ = true;
-    }
+    std::lock_guard lock(mutex_);
+    open_ = true;
     cv_.notify_all();
   }
   bool wait() {
@@ -40,13 +39,9 @@ class Gate {
 class Counter {
  public:
   int increment() {
-    int now = 0;
-    {
-      std::lock_guard lock(mutex_);
-      now = ++value_;
-    }
+    std::lock_guard lock(mutex_);
     cv_.notify_all();
-    return now;
+    return ++value_;
   }
   bool waitFor(int target) {
     std::unique_lock lock(mutex_);
