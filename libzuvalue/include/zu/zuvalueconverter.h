@@ -3,7 +3,10 @@
 // travel through ko calls, events and signals. Both are pure functions of their
 // argument and may be called from any thread.
 
+#include <string>
+
 #include "ko/anyvalue.hpp"
+#include "zu/zuerror.h"
 #include "zu/zuvalue.h"
 
 namespace ZU {
@@ -18,3 +21,32 @@ ko::AnyValue toAnyReference(const ZUValue& value);
 ZUValue fromAnyReference(const ko::AnyValue& value);
 
 }  // namespace ZU
+
+namespace ko {
+
+// A ZUValue travels through ko as a dynamic value: as a parameter or result of a bound
+// method its signature is "m", so it accepts any argument.
+template <>
+struct TypeSignature<ZU::ZUValue> {
+  static std::string get() { return "m"; }
+};
+
+template <>
+struct ValueConverter<ZU::ZUValue> {
+  static AnyValue toAny(const ZU::ZUValue& value) { return ZU::toAnyReference(value); }
+};
+
+// A kind that has no ZUValue form is reported as a ko conversion failure, so that a bad
+// argument or result is described like any other.
+template <>
+struct ValueReader<ZU::ZUValue> {
+  static ZU::ZUValue read(const AnyValue& value) {
+    try {
+      return ZU::fromAnyReference(value);
+    } catch (const ZU::ZUError& e) {
+      throw ConversionError(e.description());
+    }
+  }
+};
+
+}  // namespace ko

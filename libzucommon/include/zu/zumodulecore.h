@@ -1,0 +1,212 @@
+#pragma once
+// ZUModuleCore: the part of a service module that the module layer owns: its name and
+// broker, its method table with descriptions, and the posted calls (tasks) that it runs.
+
+#include <atomic>
+#include <condition_variable>
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <shared_mutex>
+#include <string>
+#include <type_traits>
+#include <vector>
+
+#include "ko/dynamicobject.hpp"
+#include "ko/future.hpp"
+#include "zu/zuerror.h"
+#include "zu/zuvalue.h"
+#include "zu/zuvalueconverter.h"
+
+namespace ZU {
+
+class ZUBroker;
+class ZUModuleCore;
+
+// One posted call of a module. Created by the thread that posts the call, run by a thread
+// of the ko event loop; any thread may ask it to stop or wait for its end. The method that
+// runs finds its task through ZUModuleCore::currentTask() and polls isStopRequested() (or
+// waits in waitForStopRequest()).
+class ZUPCallTask {
+ public:
+  ZUPCallTask(const ZUModuleCore* owner, std::string methodName);
+  ZUPCallTask(const ZUPCallTask&) = delete;
+  ZUPCallTask& operator=(const ZUPCallTask&) = delete;
+
+  // -1 until the module assigns it.
+  std::int32_t id() const noexcept { return fId; }
+  const std::string& methodName() const noexcept { return fMethodName; }
+  const ZUModuleCore* owner() const noexcept { return fOwner; }
+
+  bool isStopRequested() const noexcept { return fStop.load(std::memory_order_acquire); }
+  void requestStop();
+  // Waits at most `timeoutMs` (negative: no limit) for a stop request; answers whether
+  // one came.
+  bool waitForStopRequest(int timeoutMs) const;
+
+  // Finishes when the call has ended (with the call's error text if it failed).
+  ko::Future<void> future() const { return fPromise.future(); }
+
+ private:
+  friend class ZUModuleCore;
+
+  const ZUModuleCore* const fOwner;
+  const std::string fMethodName;
+  std::int32_t fId = -1;
+  std::atomic<bool> fStop{false};
+  mutable std::mutex fStopMutex;
+  mutable std::condition_variable fStopCondition;
+  ko::Promise<void> fPromise;
+};
+
+// The callable of a bound method. The base class is a placeholder that runs nothing.
+class ZUFunctorBase {
+ public:
+  ZUFunctorBase() = default;
+  ZUFunctorBase(const ZUFunctorBase&) = delete;
+  ZUFunctorBase& operator=(const ZUFunctorBase&) = delete;
+  virtual ~ZUFunctorBase();
+  virtual ko::AnyValue call(const std::vector<ko::AnyValue>& args);
+};
+
+// A bound member function, as ko runs it.
+class ZUFunctor : public ZUFunctorBase {
+ public:
+  explicit ZUFunctor(ko::MethodFunction function) : fFunction(std::move(function)) {}
+  ko::AnyValue call(const std::vector<ko::AnyValue>& args) override { return fFunction(args); }
+
+ private:
+  ko::MethodFunction fFunction;
+};
+
+struct ZUMethodParameter {
+  std::string name;
+  std::string description;
+};
+
+// What a module publishes about one bound method.
+struct ZUMethodInfo {
+  unsigned id = 0;  // the ko method id
+  std::string name;
+  std::string moduleClass;
+  std::string description;
+  std::vector<ZUMethodParameter> parameters;
+  std::optional<ZUMethodParameter> returnValue;  // absent for a void method
+  std::string parametersSignature;               // "(is)"
+  std::string returnSignature;                   // "s", "v"
+  std::shared_ptr<ZUFunctorBase> functor;
+};
+
+// The base of every module: a ko dynamic object with a name, a weak link to its broker, a
+// method table and a table of posted calls.
+//
+// Methods are bound by the module's constructor (and possibly its init) with
+// beginMethod / describeParameter / describeReturn / bindMethod, one thread at a time.
+// Calls arrive on ko threads, several at once; posted calls run on the ko event loop.
+// The task table is guarded by a reader/writer lock, the method table and the module
+// description by their own locks. A module must be owned by a std::shared_ptr.
+class ZUModuleCore : public ko::DynamicObject, public std::enable_shared_from_this<ZUModuleCore> {
+ public:
+  ZUModuleCore(const std::shared_ptr<ZUBroker>& broker, std::string name);
+  ~ZUModuleCore() override;
+  ZUModuleCore(const ZUModuleCore&) = delete;
+  ZUModuleCore& operator=(const ZUModuleCore&) = delete;
+
+  // The call of a method by id; an id that is no method of this module gives the error
+  // "Cant call methodId:<id> on module:<name>".
+  ko::Future<ko::AnyValue> metaCall(unsigned methodId, const std::vector<ko::AnyValue>& args,
+                                    ko::MetaCallType callType = ko::MetaCallType::Auto) override;
+
+  virtual void execute();
+  virtual std::string version();
+  // Unregisters the module from its broker.
+  virtual void exit();
+  virtual std::string httpGet();
+  virtual void init();
+  // Asks the posted call `id` to stop (sets its stop flag).
+  virtual void stop(int id);
+  // Waits at most `timeoutPeriod` ms (0 or less: no limit) for the end of the posted call
+  // `id`; true when the time ran out, false when the call ended or is unknown.
+  virtual bool wait(int id, int timeoutPeriod);
+  virtual bool isRunning(int id);
+  virtual std::string getUsage(const std::string& name);
+  virtual ZUValue moduleHelp();
+  virtual std::string getBrokerName();
+
+  const std::string& getName() const noexcept { return fName; }
+  std::shared_ptr<ZUBroker> getParentBroker() const;
+  std::string getModuleDescription() const;
+  void setModuleDescription(const std::string& description);
+
+  // The bound methods, in binding order.
+  std::vector<ZUMethodInfo> getMethodInfos() const;
+  // The first bound method of that name.
+  std::optional<ZUMethodInfo> getMethodInfo(const std::string& name) const;
+
+  // ---- binding ----
+  void beginMethod(const std::string& name, const std::string& moduleClass,
+                   const std::string& description);
+  void describeParameter(const std::string& name, const std::string& description);
+  void describeReturn(const std::string& name, const std::string& description);
+  // Completes the method record begun last with a member function of this module (of its
+  // own class or a base): bindMethod(&ZUMokuto::_reset), or, to pick one overload,
+  // bindMethod<void(const std::string&)>(&ZUMokuto::say). Raises ZUError when no record
+  // was begun or ko refuses the method (same name and signature bound twice).
+  template <class Signature, class C>
+  requires std::is_function_v<Signature>
+  void bindMethod(Signature C::*method) {
+    static_assert(std::is_base_of_v<ZUModuleCore, C>, "bind a member function of the module");
+    C* self = dynamic_cast<C*>(this);
+    if (!self)
+      xThrowBindError("the member function does not belong to this module's class");
+    xBind(ko::bindMethod(self, method));
+  }
+
+  // ---- posted calls ----
+  // Posts the method `methodId` with the arguments in the list `args` and answers the new
+  // task's id at once. An unknown id raises "Cant find methodId #<id> on module:<name>".
+  int pCallById(int methodId, const ko::AnyValue& args);
+  // `args` is a list: the method name, then its arguments. Posts that method through a
+  // proxy on this module and answers the task id; raises "missing function name" when the
+  // list holds no name.
+  int pCall(const ko::AnyValue& args);
+  // The posted call of this module that the calling thread runs; nullptr when none.
+  std::shared_ptr<ZUPCallTask> currentTask() const;
+
+ protected:
+  // Called by the broker that registers the module.
+  friend class ZUBroker;
+  void setParentBroker(const std::weak_ptr<ZUBroker>& broker);
+
+ private:
+  class CurrentTaskScope;
+  class TaskJob;
+
+  [[noreturn]] void xThrowBindError(const std::string& reason) const;
+  void xBind(ko::MethodBinding binding);
+  // Removes a task at its end, from the thread that runs it.
+  void xRemoveTask(std::int32_t id);
+  // Removes a task from any thread (a call that was dropped before it ran).
+  void xRemoveRemoteTask(std::int32_t id);
+  void xRunTask(const std::shared_ptr<ZUPCallTask>& task, unsigned methodId,
+                const std::vector<ko::AnyValue>& args);
+
+  const std::string fName;
+
+  mutable std::mutex fStateMutex;  // broker link and description
+  std::weak_ptr<ZUBroker> fBroker;
+  std::string fModuleDescription;
+
+  std::mutex fBindMutex;
+  std::optional<ZUMethodInfo> fPendingMethod;
+  mutable std::shared_mutex fMethodsMutex;
+  std::vector<ZUMethodInfo> fMethods;
+
+  mutable std::shared_mutex fTasksMutex;
+  std::map<std::int32_t, std::shared_ptr<ZUPCallTask>> fTasks;
+  std::int32_t fNextTaskId = 1;  // under the exclusive fTasksMutex
+};
+
+}  // namespace ZU

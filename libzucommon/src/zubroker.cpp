@@ -1,0 +1,214 @@
+#include "zu/zubroker.h"
+
+#include <algorithm>
+#include <atomic>
+#include <cerrno>
+#include <climits>
+#include <cstdlib>
+
+#include "ko/genericobject.hpp"
+#include "ko/log.hpp"
+#include "ko/os.hpp"
+#include "zu/zuerror.h"
+#include "zu/zumodulecore.h"
+
+namespace ZU {
+
+namespace {
+
+constexpr const char* kCategory = "ZUBroker";
+constexpr int kDefaultDeadlockTimeout = 30000;
+constexpr int kUnread = INT_MIN;
+
+std::atomic<int> gDeadlockTimeout{kUnread};
+
+// The text of a lookup that finished without a value.
+std::string failureText(const ko::Future<ko::AnyObject>& lookup) {
+  try {
+    (void)lookup.value(ko::FutureTimeout_None);
+  } catch (const std::exception& e) {
+    return e.what();
+  }
+  return "empty service object";
+}
+
+}  // namespace
+
+ZUBroker::ZUBroker(std::shared_ptr<ko::Session> session, std::string name,
+                   std::shared_ptr<ZUBrokerManager> manager)
+    : fName(std::move(name)),
+      fSession(std::move(session)),
+      fManager(manager ? std::move(manager) : ZUBrokerManager::getInstance()) {
+  if (!fSession)
+    ZU_THROW_ERROR("ZUBroker", "ZUBroker", "A broker needs a ko session");
+}
+
+ZUBroker::~ZUBroker() = default;
+
+void ZUBroker::registerModule(const std::shared_ptr<ZUModuleCore>& module) {
+  if (!module)
+    ZU_THROW_ERROR("ZUBroker", "registerModule", "Can't register module ''no module given");
+  const std::string& name = module->getName();
+  std::lock_guard lock(fMutex);
+  unsigned serviceId = 0;
+  try {
+    serviceId = fSession->registerService(name, ko::GenericObject::makeWeak(module, name));
+  } catch (const ko::Error& e) {
+    const std::vector<std::string> names = fSession->services();
+    if (std::find(names.begin(), names.end(), name) != names.end())
+      ZU_THROW_ERROR("ZUBroker", "registerModule", "module '" + name + "'already exists");
+    ZU_THROW_ERROR("ZUBroker", "registerModule",
+                   "Can't register module '" + name + "'" + std::string(e.what()));
+  }
+  fModules[name] = Registration{module, serviceId};
+  module->setParentBroker(weak_from_this());
+}
+
+bool ZUBroker::unregisterModule(const std::string& name) {
+  std::shared_ptr<ZUModuleCore> released;  // may be the last hold: dropped unlocked
+  bool done = false;
+  {
+    std::lock_guard lock(fMutex);
+    done = xUnregisterModule(name, released);
+  }
+  if (!done) {
+    KO_LOG_ERROR(kCategory) << "ZUBroker::unregisterModule can't unregister module: " << name;
+  }
+  return done;
+}
+
+bool ZUBroker::xUnregisterModule(const std::string& name, std::shared_ptr<ZUModuleCore>& released) {
+  try {
+    const auto it = fModules.find(name);
+    if (it == fModules.end()) {
+      fSession->unregisterService(name);
+      return true;
+    }
+    const unsigned serviceId = it->second.serviceId;
+    released = std::move(it->second.module);
+    fModules.erase(it);
+    fSession->unregisterService(serviceId);
+    return true;
+  } catch (const std::exception& e) {
+    KO_LOG_ERROR(kCategory) << "Cannot unregister module " << name << " : " << e.what();
+    return false;
+  }
+}
+
+std::shared_ptr<ZUModuleCore> ZUBroker::getModuleByName(const std::string& name) const {
+  std::lock_guard lock(fMutex);
+  const auto it = fModules.find(name);
+  return it == fModules.end() ? nullptr : it->second.module;
+}
+
+ko::AnyObject ZUBroker::service(const std::string& name) const {
+  const int timeout = deadlockTimeout();
+
+  const ko::Future<ko::AnyObject> local = fSession->service(name, "local");
+  const ko::FutureState localState = local.wait(timeout);
+  if (localState == ko::FutureState::Timeout) {
+    KO_LOG_ERROR(kCategory) << "session.service(" << name << ") timeout after 30sec.";
+  } else if (localState == ko::FutureState::FinishedWithValue && local.value()) {
+    return local.value();
+  } else {
+    KO_LOG_ERROR(kCategory) << "Future exception while checking local service: "
+                            << failureText(local);
+  }
+
+  const ko::Future<ko::AnyObject> any = fSession->service(name, "");
+  const ko::FutureState anyState = any.wait(timeout);
+  if (anyState == ko::FutureState::Timeout) {
+    KO_LOG_ERROR(kCategory) << "session.service(" << name << ") timed out after 30sec.";
+  } else if (anyState == ko::FutureState::FinishedWithValue && any.value()) {
+    return any.value();
+  } else {
+    KO_LOG_ERROR(kCategory) << "Future exception while checking remote service: "
+                            << failureText(any);
+  }
+  return nullptr;
+}
+
+int ZUBroker::parseDeadlockTimeout(const std::string& text) {
+  if (text.empty())
+    return kDefaultDeadlockTimeout;
+  errno = 0;
+  char* end = nullptr;
+  const long long value = std::strtoll(text.c_str(), &end, 0);
+  if (end == text.c_str()) {
+    KO_LOG_WARNING(kCategory) << "KO_DEADLOCK_TIMEOUT is not a number: '" << text << "'; using "
+                              << kDefaultDeadlockTimeout << " ms";
+    return kDefaultDeadlockTimeout;
+  }
+  return static_cast<int>(std::clamp<long long>(value, INT_MIN + 1, INT_MAX));
+}
+
+int ZUBroker::deadlockTimeout() {
+  int timeout = gDeadlockTimeout.load(std::memory_order_acquire);
+  if (timeout == kUnread) {
+    timeout = parseDeadlockTimeout(ko::os::getenv("KO_DEADLOCK_TIMEOUT"));
+    gDeadlockTimeout.store(timeout, std::memory_order_release);
+  }
+  return timeout;
+}
+
+void ZUBroker::resetDeadlockTimeoutForTesting() {
+  gDeadlockTimeout.store(kUnread, std::memory_order_release);
+}
+
+// ---- ZUBrokerManager ---------------------------------------------------------
+
+namespace {
+std::mutex gManagerMutex;
+std::shared_ptr<ZUBrokerManager> gManager;
+}  // namespace
+
+std::shared_ptr<ZUBrokerManager> ZUBrokerManager::getInstance() {
+  std::lock_guard lock(gManagerMutex);
+  if (!gManager)
+    gManager = std::make_shared<ZUBrokerManager>();
+  return gManager;
+}
+
+void ZUBrokerManager::setInstance(std::shared_ptr<ZUBrokerManager> manager) {
+  std::lock_guard lock(gManagerMutex);
+  gManager = std::move(manager);
+}
+
+void ZUBrokerManager::addBroker(const std::shared_ptr<ZUBroker>& broker) {
+  if (!broker)
+    return;
+  std::lock_guard lock(fMutex);
+  if (std::find(fBrokers.begin(), fBrokers.end(), broker) == fBrokers.end())
+    fBrokers.push_back(broker);
+}
+
+void ZUBrokerManager::removeBroker(const std::shared_ptr<ZUBroker>& broker) {
+  std::lock_guard lock(fMutex);
+  const auto it = std::find(fBrokers.begin(), fBrokers.end(), broker);
+  if (it == fBrokers.end()) {
+    KO_LOG_WARNING("ZUBroker.manager")
+        << "Broker " << (broker ? broker->getName() : std::string("(null)")) << " is not managed";
+    return;
+  }
+  fBrokers.erase(it);
+}
+
+std::shared_ptr<ZUBroker> ZUBrokerManager::getBroker() const {
+  std::lock_guard lock(fMutex);
+  return fBrokers.empty() ? nullptr : fBrokers.front();
+}
+
+std::shared_ptr<ZUBroker> ZUBrokerManager::getBrokerByName(const std::string& name) const {
+  std::lock_guard lock(fMutex);
+  for (const auto& b : fBrokers)
+    if (b->getName() == name)
+      return b;
+  return nullptr;
+}
+
+std::vector<std::shared_ptr<ZUBroker>> ZUBrokerManager::getBrokers() const {
+  std::lock_guard lock(fMutex);
+  return fBrokers;
+}
+
+}  // namespace ZU
