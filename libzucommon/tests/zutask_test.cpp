@@ -1,0 +1,163 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <memory>
+#include <set>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "ko/anyvalue.hpp"
+#include "ko/log.hpp"
+#include "zu/zumodule.h"
+#include "zu/zuproxy.h"
+#include "zutest_modules.h"
+
+namespace {
+
+using ko::AnyValue;
+using ::testing::HasSubstr;
+using zutest::Greeter;
+
+AnyValue callList(std::vector<AnyValue> items) {
+  return AnyValue::list(std::move(items));
+}
+
+class TaskTest : public ::testing::Test {
+ protected:
+  zutest::Process process_;
+  std::shared_ptr<Greeter> greeter_ =
+      ZU::ZUModule::createModule<Greeter>(process_.broker, "Greeter");
+};
+
+TEST_F(TaskTest, WaitWithoutLimitBlocksUntilTheCallEnds) {
+  const int id = greeter_->pCall(callList({"waitForRelease"}));
+  ASSERT_TRUE(greeter_->started.wait());
+  EXPECT_TRUE(greeter_->isRunning(id));
+  // A limited wait on a call that cannot end yet runs out of time.
+  EXPECT_TRUE(greeter_->wait(id, 1));
+
+  std::atomic<bool> released{false};
+  std::thread releaser([&] {
+    released = true;
+    greeter_->release.open();
+  });
+  EXPECT_FALSE(greeter_->wait(id, 0));
+  EXPECT_TRUE(released);
+  EXPECT_FALSE(greeter_->isRunning(id));
+  releaser.join();
+}
+
+TEST_F(TaskTest, AnIdThatNeverExistedAnswersAtOnce) {
+  ko::log::ScopedCapture cap;
+  EXPECT_FALSE(greeter_->wait(4242, 0));
+  EXPECT_FALSE(greeter_->isRunning(4242));
+  greeter_->stop(4242);
+  const auto lines = cap->records();
+  ASSERT_EQ(lines.size(), 2u);
+  for (const auto& line : lines) {
+    EXPECT_EQ(line.level, ko::log::Verbose);
+    EXPECT_EQ(line.category, "zucommon.zumodulecore");
+    EXPECT_EQ(line.message, "Cant stop task 4242 because it is not found.");
+  }
+  EXPECT_EQ(lines[0].function, "ZU::ZUModuleCore::wait");
+  EXPECT_EQ(lines[1].function, "ZU::ZUModuleCore::stop");
+}
+
+TEST_F(TaskTest, StopSetsTheFlagThatTheTaskReadsThroughItsCurrentTask) {
+  ko::log::ScopedCapture cap;
+  const int id = greeter_->pCall(callList({"waitForStop"}));
+  ASSERT_TRUE(greeter_->started.wait());
+  EXPECT_EQ(greeter_->taskId, id);
+  greeter_->stop(id);
+  EXPECT_FALSE(greeter_->wait(id, 0));
+  EXPECT_TRUE(greeter_->stopSeen);
+  EXPECT_TRUE(cap->contains("zucommon.zumodulecore", ko::log::Info,
+                            "Greeter :Task " + std::to_string(id) + " asked to stop"));
+  // Outside a posted call the thread runs no task.
+  EXPECT_EQ(greeter_->currentTask(), nullptr);
+}
+
+struct MissingNameCase {
+  const char* name;
+  AnyValue args;
+};
+
+class PCallMissingNameTest : public TaskTest,
+                             public ::testing::WithParamInterface<MissingNameCase> {};
+
+TEST_P(PCallMissingNameTest, Raises) {
+  try {
+    greeter_->pCall(GetParam().args);
+    FAIL() << "no error";
+  } catch (const ZU::ZUError& e) {
+    EXPECT_EQ(e.methodName(), "pCall");
+    EXPECT_EQ(e.description(), "missing function name");
+  }
+  // Called by name, as another service would.
+  const ZU::ZUProxy proxy("Greeter", process_.broker);
+  EXPECT_EQ(zutest::errorOf([&] { proxy.call<int>("pCall", GetParam().args); }),
+            "missing function name");
+}
+
+INSTANTIATE_TEST_SUITE_P(Arguments, PCallMissingNameTest,
+                         ::testing::Values(MissingNameCase{"noArguments", callList({})},
+                                           MissingNameCase{"void", AnyValue()},
+                                           MissingNameCase{"nameNotAString", callList({42, 1})}),
+                         [](const auto& param) { return std::string(param.param.name); });
+
+TEST_F(TaskTest, PCallPicksTheOverloadThatTakesTheArguments) {
+  const int first = greeter_->pCall(callList({"say", "hello"}));
+  EXPECT_FALSE(greeter_->wait(first, 0));
+  const int second = greeter_->pCall(callList({"say", "hi", callList({"mode", 2})}));
+  EXPECT_NE(first, second);
+  EXPECT_FALSE(greeter_->wait(second, 0));
+  EXPECT_THAT(greeter_->said(), ::testing::ElementsAre("hello", R"(hi with ["mode", 2])"));
+}
+
+TEST_F(TaskTest, PostedCallByAnUnknownIdIsRefused) {
+  EXPECT_EQ(zutest::errorOf([&] { greeter_->pCallById(9999, callList({})); }),
+            "Cant find methodId #9999 on module:Greeter");
+}
+
+TEST_F(TaskTest, AFailingCallEndsItsTaskAndIsLogged) {
+  ko::log::ScopedCapture cap;
+  const int id = greeter_->pCall(callList({"fail"}));
+  EXPECT_FALSE(greeter_->wait(id, 0));
+  EXPECT_FALSE(greeter_->isRunning(id));
+  EXPECT_TRUE(cap->containsPart("zucommon.zumodulecore", ko::log::Warning, "engine overheated"));
+}
+
+TEST_F(TaskTest, ACallWithArgumentsThatDoNotConvertEndsItsTask) {
+  ko::log::ScopedCapture cap;
+  const int id = greeter_->pCall(callList({"add", "one", "two"}));
+  EXPECT_FALSE(greeter_->wait(id, 0));
+  EXPECT_FALSE(greeter_->isRunning(id));
+  EXPECT_TRUE(cap->containsPart("zucommon.zumodulecore", ko::log::Warning, "Cannot convert"));
+}
+
+TEST_F(TaskTest, PostsFromManyThreadsGetDistinctIdsAndAllEnd) {
+  constexpr int kThreads = 4;
+  constexpr int kPosts = 25;
+  std::vector<std::vector<int>> ids(kThreads);
+  std::vector<std::thread> threads;
+  for (int t = 0; t < kThreads; ++t) {
+    threads.emplace_back([&, t] {
+      const ZU::ZUProxy proxy("Greeter", process_.broker);
+      for (int i = 0; i < kPosts; ++i)
+        ids[static_cast<std::size_t>(t)].push_back(proxy.post("say", "t" + std::to_string(t)));
+      for (const int id : ids[static_cast<std::size_t>(t)])
+        EXPECT_FALSE(proxy.wait(id, 0));
+    });
+  }
+  for (auto& th : threads)
+    th.join();
+  std::set<int> distinct;
+  for (const auto& list : ids)
+    distinct.insert(list.begin(), list.end());
+  EXPECT_EQ(distinct.size(), static_cast<std::size_t>(kThreads * kPosts));
+  EXPECT_EQ(greeter_->said().size(), static_cast<std::size_t>(kThreads * kPosts));
+}
+
+}  // namespace

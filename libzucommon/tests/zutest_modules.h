@@ -1,0 +1,135 @@
+#pragma once
+// Modules and helpers shared by the module-layer tests. Every wait is bounded.
+
+#include <atomic>
+#include <chrono>
+#include <condition_variable>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <vector>
+
+#include "ko/anyvalue.hpp"
+#include "ko/session.hpp"
+#include "zu/zubroker.h"
+#include "zu/zuerror.h"
+#include "zu/zumodule.h"
+#include "zu/zuvalue.h"
+
+namespace zutest {
+
+inline constexpr auto kBound = std::chrono::seconds(10);
+inline constexpr int kBoundMs = 10000;
+
+// A one-shot gate: wait() blocks until open() (or the bound passes; answers false then).
+class Gate {
+ public:
+  void open() {
+    {
+      std::lock_guard lock(fMutex);
+      fOpen = true;
+    }
+    fCondition.notify_all();
+  }
+  bool wait() {
+    std::unique_lock lock(fMutex);
+    return fCondition.wait_for(lock, kBound, [this] { return fOpen; });
+  }
+
+ private:
+  std::mutex fMutex;
+  std::condition_variable fCondition;
+  bool fOpen = false;
+};
+
+// A session with its broker, as a process of the robot has them.
+struct Process {
+  std::shared_ptr<ko::Session> session = std::make_shared<ko::Session>();
+  std::shared_ptr<ZU::ZUBroker> broker = std::make_shared<ZU::ZUBroker>(
+      session, "TestBroker", std::make_shared<ZU::ZUBrokerManager>());
+};
+
+// The description of the ZUError that f raises; "<no error>" when it raises none.
+inline std::string errorOf(const std::function<void()>& f) {
+  try {
+    f();
+  } catch (const ZU::ZUError& e) {
+    return e.description();
+  }
+  return "<no error>";
+}
+
+// A module with methods of each kind: overloads, ZUValue in and out, a failure, and two
+// methods that block until the test lets them go (for posted calls).
+class Greeter : public ZU::ZUModule {
+ public:
+  Greeter(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
+      : ZUModule(broker, name) {
+    setModuleDescription("A module of the tests.");
+    beginMethod("say", "Greeter", "Says a text.");
+    describeParameter("text", "The text to say.");
+    bindMethod<void(const std::string&)>(&Greeter::say);
+    beginMethod("say", "Greeter", "Says a text with a configuration.");
+    describeParameter("text", "The text to say.");
+    describeParameter("configuration", "The configuration.");
+    bindMethod<void(const std::string&, const ZU::ZUValue&)>(&Greeter::say);
+    beginMethod("echo", "Greeter", "Answers its argument.");
+    describeParameter("value", "Any value.");
+    describeReturn("echoed", "The same value.");
+    bindMethod(&Greeter::echo);
+    beginMethod("add", "Greeter", "Adds two integers.");
+    describeParameter("a", "First.");
+    describeParameter("b", "Second.");
+    describeReturn("sum", "a + b");
+    bindMethod(&Greeter::add);
+    beginMethod("fail", "Greeter", "Always fails.");
+    bindMethod(&Greeter::fail);
+    beginMethod("waitForRelease", "Greeter", "Blocks until the test releases it.");
+    bindMethod(&Greeter::waitForRelease);
+    beginMethod("waitForStop", "Greeter", "Blocks until its task is asked to stop.");
+    bindMethod(&Greeter::waitForStop);
+  }
+
+  void say(const std::string& text) { record(text); }
+  void say(const std::string& text, const ZU::ZUValue& configuration) {
+    record(text + " with " + configuration.toString(1));
+  }
+  ZU::ZUValue echo(const ZU::ZUValue& value) { return value; }
+  int add(int a, int b) const { return a + b; }
+  void fail() { ZU_THROW_ERROR("Greeter", "fail", "engine overheated"); }
+
+  int waitForRelease() {
+    started.open();
+    release.wait();
+    const auto task = currentTask();
+    return task ? task->id() : -1;
+  }
+  bool waitForStop() {
+    const auto task = currentTask();
+    taskId = task ? task->id() : -1;
+    started.open();
+    stopSeen = task && task->waitForStopRequest(kBoundMs);
+    return stopSeen;
+  }
+
+  std::vector<std::string> said() const {
+    std::lock_guard lock(fMutex);
+    return fSaid;
+  }
+
+  Gate started;
+  Gate release;
+  std::atomic<int> taskId{-2};
+  std::atomic<bool> stopSeen{false};
+
+ private:
+  void record(const std::string& s) {
+    std::lock_guard lock(fMutex);
+    fSaid.push_back(s);
+  }
+  mutable std::mutex fMutex;
+  std::vector<std::string> fSaid;
+};
+
+}  // namespace zutest
