@@ -11,14 +11,16 @@ MKTaskAction::MKTaskAction(MKTaskActionType actionType)
     : type(actionType), condition(std::make_shared<std::condition_variable>()) {}
 
 void MKTaskAction::appendBookmark(std::string& out) const {
-  char digits[16];
-  const auto [end, ec] = std::to_chars(digits, digits + sizeof digits, id);
-  (void)ec;  // an unsigned 32-bit number always fits
-  out += '\\';
-  out += MKTaskActionType_bookmarkKind(type);
-  out += '=';
-  out.append(digits, end);
-  out += '\\';
+  // backslash, kind (8 bytes at most), "=", 10 digits at most, backslash
+  char buffer[32];
+  const std::string_view kind = MKTaskActionType_bookmarkKind(type);
+  char* end = buffer;
+  *end++ = '\\';
+  end = std::copy(kind.begin(), kind.end(), end);
+  *end++ = '=';
+  end = std::to_chars(end, buffer + sizeof buffer, id).ptr;
+  *end++ = '\\';
+  out.append(buffer, end);
 }
 
 std::string MKTaskAction::bookmark() const {

@@ -2,8 +2,10 @@
 
 #include <algorithm>
 #include <array>
+#include <bit>
 #include <charconv>
 #include <cstdint>
+#include <cstring>
 #include <limits>
 #include <stdexcept>
 #include <string_view>
@@ -37,9 +39,41 @@ constexpr ByteSet kSpace = byteSet(" ");
 constexpr ByteSet kDot = byteSet(".");
 constexpr ByteSet kMethodEnd = byteSet(" (");
 constexpr ByteSet kNonSpace = byteSet(" ", true);
+constexpr ByteSet kWalkStops = byteSet("()\"\\");
 
 inline unsigned char byteAt(std::string_view text, std::size_t k) {
   return static_cast<unsigned char>(text[k]);
+}
+
+// The first "^", "$" or backslash at or after `from`, or the text's length. Reads eight
+// bytes at a time: a byte of the word equals one of the three exactly where the
+// classic "has a zero byte" test on the word xor that byte repeated finds a zero; the
+// lowest flagged byte is exact.
+std::size_t findScanStop(std::string_view text, std::size_t from) {
+  const std::size_t size = text.size();
+  std::size_t k = from;
+  if constexpr (std::endian::native == std::endian::little) {
+    constexpr std::uint64_t kOnes = 0x0101010101010101ULL;
+    constexpr std::uint64_t kHighs = 0x8080808080808080ULL;
+    constexpr std::uint64_t kCaret = kOnes * static_cast<unsigned char>('^');
+    constexpr std::uint64_t kDollar = kOnes * static_cast<unsigned char>('$');
+    constexpr std::uint64_t kBackslash = kOnes * static_cast<unsigned char>('\\');
+    const auto zeroBytes = [](std::uint64_t word) { return (word - kOnes) & ~word & kHighs; };
+    while (k + 8 <= size) {
+      std::uint64_t word = 0;
+      std::memcpy(&word, text.data() + k, sizeof word);
+      const std::uint64_t found =
+          zeroBytes(word ^ kCaret) | zeroBytes(word ^ kDollar) | zeroBytes(word ^ kBackslash);
+      if (found != 0) {
+        return k + static_cast<std::size_t>(std::countr_zero(found)) / 8;
+      }
+      k += 8;
+    }
+  }
+  while (k < size && !kScanStops[byteAt(text, k)]) {
+    ++k;
+  }
+  return k;
 }
 
 inline bool isNameByte(unsigned char c) {
@@ -154,10 +188,20 @@ class ParenMatcher {
     std::size_t depth = 0;
     bool quoted = false;
     for (std::size_t x = p; x < size; ++x) {
-      if (budget == 0) {
+      std::size_t stop = x;
+      while (stop < size && !kWalkStops[byteAt(text_, stop)]) {
+        ++stop;
+      }
+      const std::size_t steps = stop - x + 1;
+      if (steps > budget) {
+        budget = 0;
         return npos;
       }
-      --budget;
+      budget -= steps;
+      x = stop;
+      if (x >= size) {
+        break;
+      }
       const unsigned char c = byteAt(text_, x);
       if (c == '\\') {
         ++x;
@@ -180,20 +224,13 @@ class ParenMatcher {
   void buildIndex() {
     const std::size_t size = text_.size();
     flags_.assign(size + 1, 0);
-    std::array<std::vector<std::int32_t>, 2> counter;
-    for (auto& c : counter) {
-      c.assign(size + 1, 0);
-    }
     bool skip = false;
     std::uint8_t side = 0;
-    std::array<std::int32_t, 2> count{0, 0};
-    for (std::size_t k = 0; k <= size; ++k) {
+    std::array<std::int64_t, 2> count{0, 0};
+    std::int64_t lowest = 0;
+    std::int64_t highest = 0;
+    for (std::size_t k = 0; k < size; ++k) {
       flags_[k] = static_cast<std::uint8_t>((skip ? kSkipped : 0) | (side != 0 ? kQuoted : 0));
-      counter[0][k] = count[0];
-      counter[1][k] = count[1];
-      if (k == size) {
-        break;
-      }
       const unsigned char c = byteAt(text_, k);
       if (skip) {
         skip = false;
@@ -202,21 +239,34 @@ class ParenMatcher {
       } else if (c == '"') {
         side ^= 1;
       } else if (c == '(') {
-        ++count[side];
+        highest = std::max(highest, ++count[side]);
       } else if (c == ')') {
-        --count[side];
+        lowest = std::min(lowest, --count[side]);
       }
     }
-    // Counters stay within [-size, size]; lastAt is indexed by value + size + 1.
-    const auto offset = static_cast<std::int64_t>(size) + 1;
-    std::vector<std::uint32_t> lastAt;
+    flags_[size] = static_cast<std::uint8_t>((skip ? kSkipped : 0) | (side != 0 ? kQuoted : 0));
+
+    // Backwards, undoing each byte's count: lastAt[value - lowest + 1] is the first
+    // position after k where that side's counter has that value.
+    std::array<std::vector<std::uint32_t>, 2> lastAt;
     for (std::size_t s = 0; s < 2; ++s) {
       down_[s].assign(size + 1, kNone);
-      lastAt.assign(2 * size + 3, kNone);
-      for (std::size_t k = size + 1; k-- > 0;) {
-        const std::int64_t value = counter[s][k] + offset;
-        down_[s][k] = lastAt[static_cast<std::size_t>(value - 1)];
-        lastAt[static_cast<std::size_t>(value)] = static_cast<std::uint32_t>(k);
+      lastAt[s].assign(static_cast<std::size_t>(highest - lowest) + 2, kNone);
+    }
+    for (std::size_t k = size + 1; k-- > 0;) {
+      if (k < size && (flags_[k] & kSkipped) == 0) {
+        const unsigned char c = byteAt(text_, k);
+        const std::size_t s = (flags_[k] & kQuoted) != 0 ? 1 : 0;
+        if (c == '(') {
+          --count[s];
+        } else if (c == ')') {
+          ++count[s];
+        }
+      }
+      for (std::size_t s = 0; s < 2; ++s) {
+        const auto slot = static_cast<std::size_t>(count[s] - lowest + 1);
+        down_[s][k] = lastAt[s][slot - 1];
+        lastAt[s][slot] = static_cast<std::uint32_t>(k);
       }
     }
     indexed_ = true;
@@ -324,10 +374,33 @@ struct ZUMokutoParser::Cursor {
   std::shared_ptr<MKTaskAction> action;
 };
 
+namespace {
+
+// The written keywords (types 0 to 17) grouped by length, in type order.
+struct KeywordsByLength {
+  static constexpr std::size_t kMaxLength = 15;
+  std::array<std::array<std::uint8_t, 4>, kMaxLength + 1> types{};
+  std::array<std::uint8_t, kMaxLength + 1> count{};
+};
+
+constexpr KeywordsByLength kKeywordsByLength = [] {
+  KeywordsByLength table;
+  for (std::size_t type = 0; type <= static_cast<std::size_t>(AFFECTATION); ++type) {
+    const std::size_t length = kMKTaskActionKeywords[type].size();
+    table.types[length][table.count[length]++] = static_cast<std::uint8_t>(type);
+  }
+  return table;
+}();
+
+}  // namespace
+
 MKTaskActionType MKTaskActionType_fromStr(std::string_view name) {
-  for (std::size_t k = 0; k <= static_cast<std::size_t>(AFFECTATION); ++k) {
-    if (name == kMKTaskActionKeywords[k]) {
-      return static_cast<MKTaskActionType>(k);
+  if (name.size() <= KeywordsByLength::kMaxLength) {
+    for (std::size_t k = 0; k < kKeywordsByLength.count[name.size()]; ++k) {
+      const std::uint8_t type = kKeywordsByLength.types[name.size()][k];
+      if (name == kMKTaskActionKeywords[type]) {
+        return type;
+      }
     }
   }
   if (name == "^tag") {
@@ -345,7 +418,7 @@ void ZUMokutoParser::parse(std::shared_ptr<MKTaskInstruction> job, std::string t
   const std::string_view t = text;
   const std::size_t size = t.size();
   job->text.clear();
-  job->text.reserve(size + size / 8 + 16);
+  job->text.reserve(size + 16);
 
   // The caller's own bookmarks: the actions' numbers must avoid them.
   for (std::size_t i = t.find('\\'); i != npos; i = t.find('\\', i)) {
@@ -390,10 +463,7 @@ void ZUMokutoParser::parse(std::shared_ptr<MKTaskInstruction> job, std::string t
 
     // The bytes up to the next "^", "$" or backslash are words: they only end an
     // "after a backslash" stretch unless they are spaces.
-    std::size_t next = i;
-    while (next < size && !kScanStops[byteAt(t, next)]) {
-      ++next;
-    }
+    const std::size_t next = findScanStop(t, i);
     if (isJapanese && state.afterBackslash) {
       for (std::size_t k = i; k < next; ++k) {
         if (t[k] != ' ') {
@@ -453,20 +523,24 @@ bool ZUMokutoParser::xReadInstruction(ParseState& state, std::size_t& pos) const
   bool consumed = false;
   if (type >= AUTO_START_TAG && type <= STOP_TAG) {
     auto action = std::make_shared<MKAnimationAction>(type);
-    cursor.action = action;
-    consumed = xActionContent(cursor, pos, *action);
+    MKAnimationAction& record = *action;
+    cursor.action = std::move(action);
+    consumed = xActionContent(cursor, pos, record);
   } else if (type == MODE) {
     auto action = std::make_shared<MKModeAction>(type);
-    cursor.action = action;
-    consumed = xActionContent(cursor, pos, *action);
+    MKModeAction& record = *action;
+    cursor.action = std::move(action);
+    consumed = xActionContent(cursor, pos, record);
   } else if (type >= START_SOUND && type <= RUN_SOUND) {
     auto action = std::make_shared<MKSoundAction>(type);
-    cursor.action = action;
-    consumed = xActionContent(cursor, pos, *action);
+    MKSoundAction& record = *action;
+    cursor.action = std::move(action);
+    consumed = xActionContent(cursor, pos, record);
   } else if (type == CALL || type == PCALL) {
     auto action = std::make_shared<MKCallAction>(type);
-    cursor.action = action;
-    consumed = xActionContent(cursor, pos, *action);
+    MKCallAction& record = *action;
+    cursor.action = std::move(action);
+    consumed = xActionContent(cursor, pos, record);
   } else {
     cursor.action = std::make_shared<MKTaskAction>(type);
     consumed = xActionContent(cursor, pos, *cursor.action);
