@@ -112,6 +112,8 @@ class GenericObject {
 
   // Calls a method in this thread and reads the result as R (ResultConversionError when
   // it does not fit). The method's failure raises ko::FutureError with its text.
+  // A single std::vector<AnyValue> argument is the argument list itself; a method that
+  // takes one list is called with AnyValue::list(...) or with a one-element vector.
   template <class R = AnyValue, class... A>
   requires(!detail::isSingleArgVector<A...>) R call(std::string_view name, A&&... args)
   const {
