@@ -361,6 +361,15 @@ TEST(ParsedJob, UsedBookmarksAreTheCallersThenTheActions) {
   EXPECT_EQ(job->currentAction, 0u);
 }
 
+TEST(ParsedJob, AutomaticTagsContinueTheCount) {
+  const auto job = parse(R"(^start(a) \mrk=3\ ^start(b) \mrk=5\)");
+  auto tag = std::make_shared<MKAnimationAction>(AUTO_START_TAG);
+  job->addAction(tag);
+  EXPECT_EQ(job->actions[1]->id, 2u);
+  EXPECT_EQ(tag->id, 4u);
+  EXPECT_EQ(job->usedBookmarks, (std::vector<std::int32_t>{3, 5, 1, 2, 4}));
+}
+
 TEST(ParsedJob, ReplacesTheSpeechTextOfTheJob) {
   auto job = std::make_shared<MKTaskInstruction>();
   job->text = "the caller's text";
