@@ -5,8 +5,8 @@ function(mokuto_warnings target)
     -Wall -Wextra -Wpedantic -Wconversion -Wsign-conversion -Wshadow
     -Wnon-virtual-dtor -Woverloaded-virtual -Wnull-dereference -Werror)
   if(CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
-    # False positives of g++ 12 in std::variant and std::function internals.
-    target_compile_options(${target} PRIVATE -Wno-maybe-uninitialized -Wno-dangling-reference)
+    # False positives of g++ 12 in std::variant, std::function and std::string internals.
+    target_compile_options(${target} PRIVATE -Wno-maybe-uninitialized -Wno-dangling-reference -Wno-restrict)
   endif()
 endfunction()
 
