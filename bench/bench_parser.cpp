@@ -1,0 +1,129 @@
+// Throughput of the annotated-text parser on plain words, on a typical annotated
+// paragraph and on pathological text, beside a scan that only looks for the bytes that
+// start something ("^", "$" and backslash): the floor that any parse pays.
+#include <benchmark/benchmark.h>
+
+#include <cstddef>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "mokuto/mktaskinstruction.h"
+#include "mokuto/zumokutoparser.h"
+
+namespace {
+
+using Matching = ZU::ZUMokutoParser::Matching;
+
+// Repeats the pieces in turn until the text has `size` bytes.
+std::string cycle(const std::vector<std::string>& pieces, std::size_t size) {
+  std::string text;
+  text.reserve(size + 128);
+  for (std::size_t k = 0; text.size() < size; ++k) {
+    text += pieces[k % pieces.size()];
+  }
+  text.resize(size);
+  return text;
+}
+
+std::string plainText(std::size_t size) {
+  return cycle({"Hello my friend, it is such a lovely day to go for a walk in the park. ",
+                "The robot waves its hand and says that it is happy to see you again! ",
+                "Would you like to hear a story about the sea, the wind and the stars? "},
+               size);
+}
+
+// About one instruction every 60 bytes, every kind in turn.
+std::string annotatedText(std::size_t size) {
+  return cycle({"Hello my friend, nice to meet you. ^start(animations/Stand/Gestures/Hey_1) ",
+                "I am so happy to see you again today ^startTag(happy) ",
+                "and I want to show you something ^run(animations/Stand/Gestures/Explain_2) ",
+                "look at this: ^wait(animations/Stand/Gestures/Hey_1) well done. ",
+                "Now listen to that music ^runSound(fun/laugh, 80) isn't it ",
+                "funny? ^stop(animations/Stand/Gestures/Explain_2) Let me think a ",
+                "little ^mode(random) about it ^startSound(bells/ding) before I ",
+                "answer. ^call(ZUMemory.raiseEvent(\"faceSeen\", 1)) Here we go. ",
+                "$Mokuto/lastTopic=walk Shall we go for a walk ^runTag(yes) in ",
+                "the park? ^pCall(ZULeds.fadeRGB(\"FaceLeds\", 255, 0.5)) It's ",
+                "sunny. ^waitSound(fun/laugh) ^stopTag(happy) ^waitTag(yes) And ",
+                "then ^stopSound(bells/ding) we can rest for a while, my friend. "},
+               size);
+}
+
+// Instructions that never close, nested parentheses and quotes: every closing
+// parenthesis search runs to the end of the text.
+std::string pathologicalText(std::size_t size) {
+  return cycle({"^start(a ", "^runSound(b/c, ", "((((", "^call(X.y(\" z ", "\"^run( ",
+                "^foo (\"(\" ", "word "},
+               size);
+}
+
+void runParse(benchmark::State& state, const std::string& text, Matching matching) {
+  const ZU::ZUMokutoParser parser(matching);
+  std::size_t actions = 0;
+  for (auto _ : state) {
+    auto job = std::make_shared<ZU::MKTaskInstruction>();
+    parser.parse(job, text, false);
+    actions = job->actions.size();
+    benchmark::DoNotOptimize(job->text.data());
+  }
+  state.SetBytesProcessed(static_cast<std::int64_t>(state.iterations()) *
+                          static_cast<std::int64_t>(text.size()));
+  state.counters["actions"] = static_cast<double>(actions);
+}
+
+std::size_t sizeArg(const benchmark::State& state) {
+  return static_cast<std::size_t>(state.range(0));
+}
+
+void BM_ScanBaseline_Plain(benchmark::State& state) {
+  const std::string text = plainText(sizeArg(state));
+  for (auto _ : state) {
+    std::size_t found = 0;
+    for (const char c : text) {
+      found += (c == '^' || c == '$' || c == '\\') ? 1 : 0;
+    }
+    benchmark::DoNotOptimize(found);
+  }
+  state.SetBytesProcessed(static_cast<std::int64_t>(state.iterations()) *
+                          static_cast<std::int64_t>(text.size()));
+}
+
+void BM_ScanBaseline_Annotated(benchmark::State& state) {
+  const std::string text = annotatedText(sizeArg(state));
+  for (auto _ : state) {
+    std::size_t found = 0;
+    for (const char c : text) {
+      found += (c == '^' || c == '$' || c == '\\') ? 1 : 0;
+    }
+    benchmark::DoNotOptimize(found);
+  }
+  state.SetBytesProcessed(static_cast<std::int64_t>(state.iterations()) *
+                          static_cast<std::int64_t>(text.size()));
+}
+
+void BM_Parse_Plain(benchmark::State& state) {
+  runParse(state, plainText(sizeArg(state)), Matching::Adaptive);
+}
+
+void BM_Parse_Annotated(benchmark::State& state) {
+  runParse(state, annotatedText(sizeArg(state)), Matching::Adaptive);
+}
+
+void BM_Parse_Pathological(benchmark::State& state) {
+  runParse(state, pathologicalText(sizeArg(state)), Matching::Adaptive);
+}
+
+// The same text when every search walks the text: what the index saves.
+void BM_Parse_Pathological_WalkOnly(benchmark::State& state) {
+  runParse(state, pathologicalText(sizeArg(state)), Matching::Walk);
+}
+
+}  // namespace
+
+BENCHMARK(BM_ScanBaseline_Plain)->Arg(1 << 10)->Arg(10 << 10)->Arg(100 << 10);
+BENCHMARK(BM_ScanBaseline_Annotated)->Arg(1 << 10)->Arg(10 << 10)->Arg(100 << 10);
+BENCHMARK(BM_Parse_Plain)->Arg(1 << 10)->Arg(10 << 10)->Arg(100 << 10);
+BENCHMARK(BM_Parse_Annotated)->Arg(1 << 10)->Arg(10 << 10)->Arg(100 << 10);
+BENCHMARK(BM_Parse_Pathological)->Arg(1 << 10)->Arg(10 << 10)->Arg(100 << 10);
+BENCHMARK(BM_Parse_Pathological_WalkOnly)->Arg(1 << 10)->Arg(10 << 10)->Arg(100 << 10);
