@@ -1,0 +1,59 @@
+#pragma once
+// The speech engine's reading of a text with inline tags: the words to speak, the
+// bookmarks ("\mrk=N\" reported as the current bookmark, "\mrkpause=N\" that holds the
+// speech until the blocking-bookmark handler returns) and the pauses ("\pau=N\", in
+// milliseconds). Other backslash tags are dropped from the spoken text.
+//
+// Plain values and pure functions: any thread may use them.
+
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace robotsim {
+
+struct SpeechMark {
+  std::int32_t number = 0;
+  bool blocking = false;  // "\mrkpause=N\"
+};
+
+struct SpeechScriptPart {
+  enum class Kind { Text, Mark, Break };
+  Kind kind = Kind::Text;
+  std::string text;          // Text: the words, as written
+  std::size_t mark = 0;      // Mark: its index in SpeechScript::marks
+  std::int32_t breakMs = 0;  // Break
+};
+
+struct SpeechScript {
+  std::vector<SpeechScriptPart> parts;
+  std::vector<SpeechMark> marks;  // in text order
+  // What was dropped or changed while reading, one line each, for the engine's log.
+  std::vector<std::string> notes;
+};
+
+// What playback made of one bookmark of a text. Times are on the text's playback clock,
+// which starts with the text and stands still while a blocking bookmark holds it; the
+// audio time is where synthesis put the mark.
+struct SpeechMarkRecord {
+  std::int32_t number = 0;
+  bool blocking = false;
+  std::int64_t audioUs = 0;     // the mark's position in the audio
+  std::int64_t playbackUs = 0;  // when the player reached it
+  std::int64_t heldUs = 0;      // how long a blocking mark held the speech
+};
+
+// The longest pause a "\pau=N\" tag asks for; longer ones are shortened to it.
+inline constexpr std::int32_t kSpeechMaxBreakMs = 60000;
+
+SpeechScript parseSpeechText(std::string_view text);
+
+// The script as SSML for espeak-ng. The text is escaped; each bookmark becomes
+// <mark name="I"/> with I its index in `marks`; each pause a break with strength
+// "x-weak" (espeak-ng ignores a plain break at the start of a text). A bookmark that
+// follows a full stop goes before the stop's punctuation, where espeak-ng reports it.
+std::string toEspeakSsml(const SpeechScript& script);
+
+}  // namespace robotsim

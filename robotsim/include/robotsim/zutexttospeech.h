@@ -1,0 +1,132 @@
+#pragma once
+// ZUTextToSpeech: the speech engine of the simulated robot. It speaks texts with the
+// inline tags "\mrk=N\", "\mrkpause=N\" and "\pau=N\" on espeak-ng (or, for tests and
+// benchmarks, on a timing-only estimate), plays them on a silent output with a real-time
+// playback clock, raises "ZUTextToSpeech/CurrentBookMark" and "ZUTextToSpeech/Status"
+// through ZUMemory, holds the speech at each "mrkpause" bookmark while the blocking
+// bookmark handler's "_mrkpauseCallback" runs, and keeps a recording of what it played.
+//
+// Threads: calls arrive on ko threads; posted says run on the module's own event loop and
+// wait there until their text ends; texts are played one at a time by the player thread,
+// which raises the events and makes the blocking calls (each on a thread of its own loop,
+// so that stopping a text never waits for the handler); espeak-ng runs on the one thread
+// of the process that owns it. The settings and the table of texts in progress are
+// guarded by one mutex.
+
+#include <cstdint>
+#include <filesystem>
+#include <limits>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <vector>
+
+#include "ko/eventloop.hpp"
+#include "robotsim/speechscript.h"
+#include "robotsim/timeline.h"
+#include "zu/zumodule.h"
+
+namespace robotsim {
+
+class SpeechPlayer;
+class SpeechRecording;
+class SpeechSynthesizer;
+struct SpeechUtterance;
+
+// A playback rate that plays without waiting (the timing backend's "as fast as possible").
+inline constexpr double kSpeechAsFastAsPossible = std::numeric_limits<double>::infinity();
+
+struct ZUTextToSpeechOptions {
+  enum class Backend { Espeak, Timing };
+  Backend backend = Backend::Espeak;
+  // 1 real time, 2 twice as fast, kSpeechAsFastAsPossible without waiting.
+  double playbackRate = 1.0;
+  // The timing backend's reading rate at speed 100.
+  double charactersPerSecond = 14.0;
+  std::string language = "English";
+  // The module whose "_mrkpauseCallback" handles blocking bookmarks.
+  std::string blockingBookmarkModule = "ZUMokuto";
+  std::string memoryModule = "ZUMemory";
+  // Whether the events are raised from the start (enableNotifications turns them on).
+  bool notifications = false;
+  // Whether the audio is kept for saveRecording.
+  bool recordAudio = true;
+  std::shared_ptr<Timeline> timeline;
+};
+
+class ZUTextToSpeech : public ZU::ZUModule {
+ public:
+  static constexpr const char* kCurrentBookMarkEvent = "ZUTextToSpeech/CurrentBookMark";
+  static constexpr const char* kStatusEvent = "ZUTextToSpeech/Status";
+
+  // Raises ZUError when the backend cannot start or the language is unknown.
+  ZUTextToSpeech(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name,
+                 ZUTextToSpeechOptions options = {});
+  ~ZUTextToSpeech() override;
+
+  // Stops every text, then unregisters.
+  void exit() override;
+  // Stops the text of the posted call `id` at once, then asks the task to stop.
+  void stop(int id) override;
+
+  // ---- bound methods ----
+  // Speaks the text and returns when it is done or stopped. Posted, its text is known by
+  // the task id; called directly, by an id of the engine's own (from 2^30 up).
+  void say(const std::string& text);
+  void stopAll();
+  // "speed" (percent, 50 to 400), "pitchShift" (0, or 1 to 4), "volume" (0 to 1),
+  // "inputMode" (kept as given); other names are logged and ignored.
+  void setParameter(const std::string& name, float value);
+  // Raises ZUError for an unknown name.
+  float getParameter(const std::string& name);
+  std::string getLanguage();
+  // Raises ZUError for a language that the backend cannot speak.
+  void setLanguage(const std::string& language);
+  std::vector<std::string> getAvailableLanguages();
+  void enableNotifications();
+  void disableNotifications();
+  bool areNotificationsEnabled();
+  // Writes everything played so far to a WAV file (mono, 16-bit); raises ZUError when
+  // the file cannot be written.
+  void saveRecording(const std::string& path);
+
+  // ---- inspection ----
+  // The marks of a text that ended (the last 256 texts are kept); empty when unknown.
+  std::vector<SpeechMarkRecord> markRecords(int id) const;
+  int sampleRate() const;
+
+ private:
+  class Listener;
+  struct Settings {
+    std::string language;
+    float speed = 100.0F;
+    float pitchShift = 1.0F;
+    float volume = 1.0F;
+    float inputMode = 0.0F;
+    bool notifications = false;
+  };
+
+  void xBindMethods();
+  void xRecord(const std::string& operation, ko::AnyValue arguments, ko::AnyValue result = {});
+  void xRaise(const std::string& key, const ZU::ZUValue& value);
+  bool xNotificationsEnabled() const;
+  void xStopText(int id);
+
+  const ZUTextToSpeechOptions fOptions;
+  std::unique_ptr<SpeechSynthesizer> fSynthesizer;
+  std::shared_ptr<SpeechRecording> fRecording;
+  std::unique_ptr<Listener> fListener;
+  std::shared_ptr<ko::EventLoop> fHoldLoop;  // the blocking calls
+
+  mutable std::mutex fMutex;
+  Settings fSettings;
+  std::map<int, std::shared_ptr<SpeechUtterance>> fTexts;  // in progress
+  std::map<int, std::vector<SpeechMarkRecord>> fHistory;   // ended
+  int fNextDirectId = 1 << 30;
+  ko::AnyObject fMemory;  // cached lookup of the memory service
+
+  std::unique_ptr<SpeechPlayer> fPlayer;  // last: stopped and joined first
+};
+
+}  // namespace robotsim

@@ -1,0 +1,211 @@
+#include "speechplayer.h"
+
+#include <algorithm>
+#include <cmath>
+#include <utility>
+
+namespace robotsim {
+
+namespace {
+
+using SteadyClock = std::chrono::steady_clock;
+
+std::int64_t microseconds(SteadyClock::duration d) {
+  return std::chrono::duration_cast<std::chrono::microseconds>(d).count();
+}
+
+}  // namespace
+
+SpeechPlayer::SpeechPlayer(SpeechPlayerListener& listener, double playbackRate,
+                           std::shared_ptr<SpeechRecording> recording)
+    : fListener(listener),
+      fRate(std::isfinite(playbackRate) && playbackRate > 0 ? playbackRate : 0.0),
+      fRecording(std::move(recording)),
+      fThread([this] { xRun(); }) {}
+
+SpeechPlayer::~SpeechPlayer() {
+  {
+    std::lock_guard lock(fMutex);
+    fQuit = true;
+  }
+  stopAll();
+  fQueued.notify_all();
+  fThread.join();
+}
+
+void SpeechPlayer::enqueue(std::shared_ptr<SpeechUtterance> utterance) {
+  {
+    std::lock_guard lock(fMutex);
+    if (!fQuit) {
+      fQueue.push_back(std::move(utterance));
+      utterance.reset();
+    }
+  }
+  if (utterance) {
+    utterance->performance->cancel();
+    xEnd(*utterance, true, 0, {});
+    return;
+  }
+  fQueued.notify_one();
+}
+
+bool SpeechPlayer::stop(int id) {
+  std::shared_ptr<SpeechUtterance> queued;
+  {
+    std::lock_guard lock(fMutex);
+    if (fCurrent && fCurrent->id == id) {
+      fCurrent->performance->cancel();
+      return true;
+    }
+    const auto it =
+        std::find_if(fQueue.begin(), fQueue.end(), [id](const auto& u) { return u->id == id; });
+    if (it == fQueue.end())
+      return false;
+    queued = std::move(*it);
+    fQueue.erase(it);
+  }
+  queued->performance->cancel();
+  xEnd(*queued, true, 0, {});
+  return true;
+}
+
+void SpeechPlayer::stopAll() {
+  std::deque<std::shared_ptr<SpeechUtterance>> queued;
+  {
+    std::lock_guard lock(fMutex);
+    if (fCurrent)
+      fCurrent->performance->cancel();
+    queued.swap(fQueue);
+  }
+  for (const auto& u : queued) {
+    u->performance->cancel();
+    xEnd(*u, true, 0, {});
+  }
+}
+
+void SpeechPlayer::xRun() {
+  for (;;) {
+    std::shared_ptr<SpeechUtterance> utterance;
+    {
+      std::unique_lock lock(fMutex);
+      fQueued.wait(lock, [this] { return fQuit || !fQueue.empty(); });
+      if (fQueue.empty())
+        return;
+      utterance = fQueue.front();
+      fQueue.pop_front();
+      fCurrent = utterance;
+    }
+    if (utterance->performance->isCancelled())
+      xEnd(*utterance, true, 0, {});
+    else
+      xPlay(*utterance);
+    std::lock_guard lock(fMutex);
+    fCurrent.reset();
+  }
+}
+
+void SpeechPlayer::xPlay(SpeechUtterance& utterance) {
+  SpeechPerformance& performance = *utterance.performance;
+  const std::int64_t hz = performance.sampleRate();
+  const bool realTime = fRate > 0;
+  auto audioUs = [hz](std::uint64_t sample) {
+    return static_cast<std::int64_t>(sample) * 1'000'000 / hz;
+  };
+  auto samplesOf = [hz](std::int64_t us) {
+    return static_cast<std::uint64_t>(std::max<std::int64_t>(us, 0) * hz / 1'000'000);
+  };
+  auto deadline = [this](SteadyClock::time_point origin, std::int64_t us) {
+    return origin +
+           std::chrono::microseconds(static_cast<std::int64_t>(static_cast<double>(us) / fRate));
+  };
+  auto clockUs = [this](SteadyClock::time_point origin) {
+    return static_cast<std::int64_t>(
+        static_cast<double>(microseconds(SteadyClock::now() - origin)) * fRate);
+  };
+
+  if (fRecording && realTime && fLastEnd != SteadyClock::time_point{})
+    fRecording->appendSilence(samplesOf(clockUs(fLastEnd)));
+
+  fListener.onStarted(utterance);
+  SteadyClock::time_point origin = SteadyClock::now();
+  std::vector<std::pair<std::uint64_t, std::uint64_t>> holds;
+  bool stopped = false;
+  std::string error;
+
+  for (std::size_t i = 0; i < utterance.script.marks.size(); ++i) {
+    const SpeechMark& mark = utterance.script.marks[i];
+    const auto position = performance.waitForMark(i);
+    if (!position) {
+      stopped = performance.isCancelled();
+      if (!stopped)
+        error = performance.error();
+      break;
+    }
+    SpeechMarkRecord record{mark.number, mark.blocking, audioUs(*position), 0, 0};
+    if (realTime) {
+      if (!performance.waitUntil(deadline(origin, record.audioUs))) {
+        stopped = true;
+        break;
+      }
+      record.playbackUs = clockUs(origin);
+    } else {
+      record.playbackUs = record.audioUs;
+    }
+
+    bool released = true;
+    if (mark.blocking) {
+      const std::uint64_t hold = performance.beginHold();
+      const auto holdStart = SteadyClock::now();
+      fListener.onBlockingBookmark(utterance, mark.number)
+          .then([synthesis = utterance.performance, hold](const ko::Future<void>&) {
+            synthesis->releaseHold(hold);
+          });
+      released = performance.waitForRelease(hold);
+      const auto held = SteadyClock::now() - holdStart;
+      record.heldUs = microseconds(held);
+      if (realTime)
+        origin += held;
+      holds.emplace_back(*position, samplesOf(record.heldUs));
+    } else {
+      fListener.onBookmark(utterance, mark.number);
+    }
+    utterance.marks.push_back(record);
+    fListener.onMarkDone(utterance, record);
+    if (!released) {
+      stopped = true;
+      break;
+    }
+  }
+
+  std::int64_t totalUs = -1;
+  if (!stopped && error.empty()) {
+    if (const auto total = performance.waitForEnd()) {
+      totalUs = audioUs(*total);
+      if (realTime && !performance.waitUntil(deadline(origin, totalUs)))
+        stopped = true;
+    } else if (performance.isCancelled()) {
+      stopped = true;
+    } else {
+      error = performance.error();
+    }
+  }
+  std::int64_t playedUs = realTime ? clockUs(origin) : std::max<std::int64_t>(totalUs, 0);
+  if (totalUs >= 0)
+    playedUs = std::min(playedUs, totalUs);
+
+  if (fRecording)
+    fRecording->appendText(performance.audio(), samplesOf(playedUs), holds);
+  xEnd(utterance, stopped, playedUs, error);
+  fLastEnd = SteadyClock::now();
+}
+
+void SpeechPlayer::xEnd(SpeechUtterance& utterance, bool stopped, std::int64_t playedUs,
+                        const std::string& error) {
+  fListener.onEnded(utterance, stopped, playedUs, error);
+  if (error.empty())
+    utterance.ended.trySetValue(stopped);
+  else
+    utterance.ended.trySetError(error);
+}
+
+}  // namespace robotsim

@@ -1,0 +1,100 @@
+#pragma once
+// SpeechPlayer: plays the speech engine's texts one after the other on a silent output,
+// with a real-time playback clock, and reaches each bookmark at its audio time.
+//
+// One thread of its own plays; it sleeps until each mark's deadline on the steady clock,
+// then tells its listener. At a blocking mark it asks the listener for the hold and stops
+// its clock until the hold is released. Any thread may queue a text or stop one; a text
+// stopped while it waits in the queue ends in the stopping thread.
+
+#include <chrono>
+#include <condition_variable>
+#include <cstdint>
+#include <deque>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "ko/future.hpp"
+#include "robotsim/speechscript.h"
+#include "speechperformance.h"
+#include "speechrecording.h"
+
+namespace robotsim {
+
+// One text queued for playback.
+struct SpeechUtterance {
+  SpeechUtterance(int textId, std::string spoken, SpeechScript parsed,
+                  std::shared_ptr<SpeechPerformance> synthesis)
+      : id(textId),
+        text(std::move(spoken)),
+        script(std::move(parsed)),
+        performance(std::move(synthesis)) {}
+
+  const int id;
+  const std::string text;
+  const SpeechScript script;
+  const std::shared_ptr<SpeechPerformance> performance;
+  // Set by the player when the text ends: whether it was stopped, or the synthesis error.
+  ko::Promise<bool> ended;
+  // Written by the player before `ended` is set.
+  std::vector<SpeechMarkRecord> marks;
+};
+
+// What the player tells, from its thread (onEnded also from a thread that stops a text
+// that waits in the queue).
+class SpeechPlayerListener {
+ public:
+  virtual ~SpeechPlayerListener() = default;
+  virtual void onStarted(const SpeechUtterance& utterance) = 0;
+  // A "mrk" mark is reached.
+  virtual void onBookmark(const SpeechUtterance& utterance, std::int32_t number) = 0;
+  // A "mrkpause" mark is reached: starts the blocking call; the speech holds until the
+  // future finishes or the text is stopped.
+  virtual ko::Future<void> onBlockingBookmark(const SpeechUtterance& utterance,
+                                              std::int32_t number) = 0;
+  // After each mark is dealt with (after the hold of a blocking one).
+  virtual void onMarkDone(const SpeechUtterance& utterance, const SpeechMarkRecord& record) = 0;
+  virtual void onEnded(const SpeechUtterance& utterance, bool stopped, std::int64_t playedUs,
+                       const std::string& error) = 0;
+};
+
+class SpeechPlayer {
+ public:
+  // `playbackRate`: 1 real time, 2 twice as fast; infinite (or 0) plays without waiting.
+  // `recording` may be null.
+  SpeechPlayer(SpeechPlayerListener& listener, double playbackRate,
+               std::shared_ptr<SpeechRecording> recording);
+  // Stops every text and joins the thread.
+  ~SpeechPlayer();
+  SpeechPlayer(const SpeechPlayer&) = delete;
+  SpeechPlayer& operator=(const SpeechPlayer&) = delete;
+
+  void enqueue(std::shared_ptr<SpeechUtterance> utterance);
+  // Stops the text `id`, playing or queued; false when there is none.
+  bool stop(int id);
+  void stopAll();
+
+ private:
+  void xRun();
+  void xPlay(SpeechUtterance& utterance);
+  void xEnd(SpeechUtterance& utterance, bool stopped, std::int64_t playedUs,
+            const std::string& error);
+
+  SpeechPlayerListener& fListener;
+  const double fRate;  // 0: as fast as possible
+  const std::shared_ptr<SpeechRecording> fRecording;
+
+  std::mutex fMutex;
+  std::condition_variable fQueued;
+  std::deque<std::shared_ptr<SpeechUtterance>> fQueue;
+  std::shared_ptr<SpeechUtterance> fCurrent;
+  bool fQuit = false;
+  // The player thread's only: when the last text ended, for the silence between texts.
+  std::chrono::steady_clock::time_point fLastEnd{};
+  std::thread fThread;
+};
+
+}  // namespace robotsim

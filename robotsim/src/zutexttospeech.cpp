@@ -1,0 +1,371 @@
+#include "robotsim/zutexttospeech.h"
+
+#include <algorithm>
+#include <cmath>
+#include <utility>
+
+#include "ko/log.hpp"
+#include "speechplayer.h"
+#include "speechrecording.h"
+#include "speechsynthesizer.h"
+#include "zu/zuserviceproxies.h"
+#include "zu/zuvalueconverter.h"
+
+namespace robotsim {
+
+namespace {
+
+constexpr const char* kCategory = "robotsim.texttospeech";
+constexpr const char* kModuleClass = "ZUTextToSpeech";
+constexpr std::size_t kHistorySize = 256;
+
+// The service of that name, without the broker's error lines for a missing one.
+ko::AnyObject findService(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name) {
+  if (!broker)
+    return nullptr;
+  const auto found = broker->session()->service(name, "local");
+  if (found.wait(ZU::ZUBroker::deadlockTimeout()) != ko::FutureState::FinishedWithValue)
+    return nullptr;
+  return found.value();
+}
+
+ko::AnyValue markResult(const SpeechMarkRecord& record) {
+  ko::AnyValue::Map result{{"audioUs", record.audioUs}, {"playbackUs", record.playbackUs}};
+  if (record.blocking)
+    result.emplace_back("heldUs", record.heldUs);
+  else
+    result.emplace_back("latenessUs", record.playbackUs - record.audioUs);
+  return ko::AnyValue::map(std::move(result));
+}
+
+}  // namespace
+
+// The player's listener: the events, the blocking calls and the timeline records.
+class ZUTextToSpeech::Listener : public SpeechPlayerListener {
+ public:
+  explicit Listener(ZUTextToSpeech& tts) : fTts(tts) {}
+
+  void onStarted(const SpeechUtterance& u) override {
+    fTts.xRecord("started", ko::AnyValue::List{u.id});
+    if (fTts.xNotificationsEnabled())
+      fTts.xRaise(kStatusEvent, ZU::ZUValue::makeArray({u.id, "started"}));
+  }
+
+  void onBookmark(const SpeechUtterance& /*u*/, std::int32_t number) override {
+    if (fTts.xNotificationsEnabled())
+      fTts.xRaise(kCurrentBookMarkEvent, ZU::ZUValue(number));
+  }
+
+  ko::Future<void> onBlockingBookmark(const SpeechUtterance& u, std::int32_t number) override {
+    const std::string& handler = fTts.fOptions.blockingBookmarkModule;
+    ko::AnyObject object = findService(fTts.getParentBroker(), handler);
+    if (!object) {
+      KO_LOG_WARNING(kCategory) << "No module " << handler << " to hold text " << u.id
+                                << " at bookmark " << number;
+      return ko::makeFutureValue();
+    }
+    return fTts.fHoldLoop->async([object = std::move(object), handler, number] {
+      try {
+        object->call<void>("_mrkpauseCallback", number);
+      } catch (const std::exception& e) {
+        KO_LOG_ERROR(kCategory) << handler << "._mrkpauseCallback(" << number
+                                << ") failed: " << e.what();
+      }
+    });
+  }
+
+  void onMarkDone(const SpeechUtterance& u, const SpeechMarkRecord& record) override {
+    fTts.xRecord(record.blocking ? "mrkpause" : "bookmark", ko::AnyValue::List{u.id, record.number},
+                 markResult(record));
+  }
+
+  void onEnded(const SpeechUtterance& u, bool stopped, std::int64_t playedUs,
+               const std::string& error) override {
+    if (!error.empty()) {
+      KO_LOG_ERROR(kCategory) << "Text " << u.id << " could not be spoken: " << error;
+    }
+    fTts.xRecord(stopped || !error.empty() ? "stopped" : "done", ko::AnyValue::List{u.id},
+                 ko::AnyValue::map({{"playedUs", playedUs}}));
+    if (fTts.xNotificationsEnabled())
+      fTts.xRaise(kStatusEvent,
+                  ZU::ZUValue::makeArray({u.id, stopped || !error.empty() ? "stopped" : "done"}));
+  }
+
+ private:
+  ZUTextToSpeech& fTts;
+};
+
+ZUTextToSpeech::ZUTextToSpeech(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name,
+                               ZUTextToSpeechOptions options)
+    : ZU::ZUModule(broker, name), fOptions(std::move(options)) {
+  try {
+    fSynthesizer = fOptions.backend == ZUTextToSpeechOptions::Backend::Espeak
+                       ? makeEspeakSynthesizer()
+                       : makeTimingSynthesizer(fOptions.charactersPerSecond);
+  } catch (const std::exception& e) {
+    ZU_THROW_ERROR(name, "ZUTextToSpeech", e.what());
+  }
+  const auto languages = fSynthesizer->languages();
+  if (std::find(languages.begin(), languages.end(), fOptions.language) == languages.end())
+    ZU_THROW_ERROR(name, "ZUTextToSpeech", "Unknown language: " + fOptions.language);
+  fSettings.language = fOptions.language;
+  fSettings.notifications = fOptions.notifications;
+
+  setEventLoop(std::make_shared<ko::EventLoop>(name, 4));
+  fHoldLoop = std::make_shared<ko::EventLoop>(name + ".mrkpause", 2);
+  fRecording = std::make_shared<SpeechRecording>(fSynthesizer->sampleRate());
+  fListener = std::make_unique<Listener>(*this);
+  fPlayer = std::make_unique<SpeechPlayer>(*fListener, fOptions.playbackRate, fRecording);
+  xBindMethods();
+}
+
+ZUTextToSpeech::~ZUTextToSpeech() {
+  fPlayer.reset();
+}
+
+void ZUTextToSpeech::xBindMethods() {
+  setModuleDescription("The speech engine of the simulated robot.");
+  beginMethod("say", kModuleClass,
+              "Says the text, with its bookmarks and pauses; returns when it is done or stopped.");
+  describeParameter("stringToSay", "The text to say.");
+  bindMethod(&ZUTextToSpeech::say);
+  beginMethod("stopAll", kModuleClass, "Stops the text being spoken and every text waiting.");
+  bindMethod(&ZUTextToSpeech::stopAll);
+  beginMethod("setParameter", kModuleClass,
+              "Sets a parameter: speed, pitchShift, volume or inputMode.");
+  describeParameter("parameter", "The parameter's name.");
+  describeParameter("value", "Its value.");
+  bindMethod(&ZUTextToSpeech::setParameter);
+  beginMethod("getParameter", kModuleClass, "Returns a parameter's value.");
+  describeParameter("parameter", "The parameter's name.");
+  describeReturn("value", "Its value.");
+  bindMethod(&ZUTextToSpeech::getParameter);
+  beginMethod("getLanguage", kModuleClass, "Returns the language the texts are spoken in.");
+  describeReturn("language", "The language's name, for example \"English\".");
+  bindMethod(&ZUTextToSpeech::getLanguage);
+  beginMethod("setLanguage", kModuleClass, "Sets the language the texts are spoken in.");
+  describeParameter("language", "The language's name, for example \"French\".");
+  bindMethod(&ZUTextToSpeech::setLanguage);
+  beginMethod("getAvailableLanguages", kModuleClass, "Returns the languages the engine speaks.");
+  describeReturn("languages", "Their names.");
+  bindMethod(&ZUTextToSpeech::getAvailableLanguages);
+  beginMethod("enableNotifications", kModuleClass,
+              "Raises the bookmark and status events of the texts.");
+  bindMethod(&ZUTextToSpeech::enableNotifications);
+  beginMethod("disableNotifications", kModuleClass,
+              "Stops raising the bookmark and status events.");
+  bindMethod(&ZUTextToSpeech::disableNotifications);
+  beginMethod("areNotificationsEnabled", kModuleClass,
+              "Whether the bookmark and status events are raised.");
+  describeReturn("enabled", "True when they are.");
+  bindMethod(&ZUTextToSpeech::areNotificationsEnabled);
+  beginMethod("_saveRecording", kModuleClass,
+              "Writes everything spoken so far to a WAV file, silences included.");
+  describeParameter("path", "The file to write.");
+  bindMethod(&ZUTextToSpeech::saveRecording);
+}
+
+void ZUTextToSpeech::exit() {
+  stopAll();
+  ZU::ZUModule::exit();
+}
+
+void ZUTextToSpeech::xStopText(int id) {
+  if (fPlayer->stop(id))
+    return;
+  // A text that is not queued yet: stopped as soon as it is.
+  std::lock_guard lock(fMutex);
+  const auto it = fTexts.find(id);
+  if (it != fTexts.end())
+    it->second->performance->cancel();
+}
+
+void ZUTextToSpeech::stop(int id) {
+  xStopText(id);
+  ZU::ZUModule::stop(id);
+}
+
+void ZUTextToSpeech::say(const std::string& text) {
+  const auto task = currentTask();
+  SpeechScript script = parseSpeechText(text);
+  Settings settings;
+  int id = 0;
+  {
+    std::lock_guard lock(fMutex);
+    settings = fSettings;
+    id = task ? task->id() : fNextDirectId++;
+  }
+  for (const auto& note : script.notes) {
+    KO_LOG_WARNING(kCategory) << "Text " << id << ": " << note;
+  }
+  xRecord("say", ko::AnyValue::List{id, text});
+
+  const std::size_t markCount = script.marks.size();
+  auto performance = std::make_shared<SpeechPerformance>(
+      markCount, fSynthesizer->sampleRate(), fOptions.recordAudio && fSynthesizer->producesAudio());
+  auto utterance = std::make_shared<SpeechUtterance>(id, text, std::move(script), performance);
+  const ko::Future<bool> ended = utterance->ended.future();
+  {
+    std::lock_guard lock(fMutex);
+    fTexts[id] = utterance;
+  }
+  // A stop that came before the text was known.
+  if (task && task->isStopRequested())
+    performance->cancel();
+
+  SpeechVoiceSettings voice;
+  voice.language = settings.language;
+  voice.speed = settings.speed;
+  voice.pitchShift = settings.pitchShift;
+  voice.volume = settings.volume;
+  fSynthesizer->synthesize(utterance->script, voice, performance);
+  fPlayer->enqueue(utterance);
+
+  const ko::FutureState state = ended.wait();
+  {
+    std::lock_guard lock(fMutex);
+    fTexts.erase(id);
+    fHistory[id] = utterance->marks;
+    while (fHistory.size() > kHistorySize)
+      fHistory.erase(fHistory.begin());
+  }
+  for (const std::size_t index : performance->placedMarks()) {
+    KO_LOG_WARNING(kCategory) << "Text " << id << ": bookmark "
+                              << utterance->script.marks[index].number
+                              << " was not reported by the synthesis; placed by its neighbours";
+  }
+  if (state != ko::FutureState::FinishedWithValue)
+    ZU_THROW_ERROR(getName(), "say", ended.error());
+}
+
+void ZUTextToSpeech::stopAll() {
+  std::vector<std::shared_ptr<SpeechUtterance>> pending;
+  {
+    std::lock_guard lock(fMutex);
+    for (const auto& [id, u] : fTexts)
+      pending.push_back(u);
+  }
+  for (const auto& u : pending)
+    u->performance->cancel();
+  fPlayer->stopAll();
+}
+
+void ZUTextToSpeech::setParameter(const std::string& name, float value) {
+  if (!std::isfinite(value)) {
+    KO_LOG_ERROR(kCategory) << "Parameter " << name << " cannot be " << value;
+    return;
+  }
+  {
+    std::lock_guard lock(fMutex);
+    if (name == "speed") {
+      fSettings.speed = std::clamp(value, 50.0F, 400.0F);
+    } else if (name == "pitchShift") {
+      fSettings.pitchShift = value <= 0.0F ? 0.0F : std::clamp(value, 1.0F, 4.0F);
+    } else if (name == "volume") {
+      fSettings.volume = std::clamp(value, 0.0F, 1.0F);
+    } else if (name == "inputMode") {
+      fSettings.inputMode = value;
+    } else {
+      KO_LOG_WARNING(kCategory) << "Unknown parameter: " << name;
+      return;
+    }
+  }
+  xRecord("setParameter", ko::AnyValue::List{name, value});
+}
+
+float ZUTextToSpeech::getParameter(const std::string& name) {
+  std::lock_guard lock(fMutex);
+  if (name == "speed")
+    return fSettings.speed;
+  if (name == "pitchShift")
+    return fSettings.pitchShift;
+  if (name == "volume")
+    return fSettings.volume;
+  if (name == "inputMode")
+    return fSettings.inputMode;
+  ZU_THROW_ERROR(getName(), "getParameter", "Unknown parameter: " + name);
+}
+
+std::string ZUTextToSpeech::getLanguage() {
+  std::lock_guard lock(fMutex);
+  return fSettings.language;
+}
+
+void ZUTextToSpeech::setLanguage(const std::string& language) {
+  const auto languages = fSynthesizer->languages();
+  if (std::find(languages.begin(), languages.end(), language) == languages.end())
+    ZU_THROW_ERROR(getName(), "setLanguage", "Unknown language: " + language);
+  {
+    std::lock_guard lock(fMutex);
+    fSettings.language = language;
+  }
+  xRecord("setLanguage", ko::AnyValue::List{language});
+}
+
+std::vector<std::string> ZUTextToSpeech::getAvailableLanguages() {
+  return fSynthesizer->languages();
+}
+
+void ZUTextToSpeech::enableNotifications() {
+  std::lock_guard lock(fMutex);
+  fSettings.notifications = true;
+}
+
+void ZUTextToSpeech::disableNotifications() {
+  std::lock_guard lock(fMutex);
+  fSettings.notifications = false;
+}
+
+bool ZUTextToSpeech::areNotificationsEnabled() {
+  return xNotificationsEnabled();
+}
+
+bool ZUTextToSpeech::xNotificationsEnabled() const {
+  std::lock_guard lock(fMutex);
+  return fSettings.notifications;
+}
+
+void ZUTextToSpeech::saveRecording(const std::string& path) {
+  try {
+    fRecording->writeWav(path);
+  } catch (const std::exception& e) {
+    ZU_THROW_ERROR(getName(), "saveRecording", e.what());
+  }
+}
+
+std::vector<SpeechMarkRecord> ZUTextToSpeech::markRecords(int id) const {
+  std::lock_guard lock(fMutex);
+  const auto it = fHistory.find(id);
+  return it == fHistory.end() ? std::vector<SpeechMarkRecord>{} : it->second;
+}
+
+int ZUTextToSpeech::sampleRate() const {
+  return fSynthesizer->sampleRate();
+}
+
+void ZUTextToSpeech::xRecord(const std::string& operation, ko::AnyValue arguments,
+                             ko::AnyValue result) {
+  if (fOptions.timeline)
+    fOptions.timeline->record(getName(), operation, std::move(arguments), std::move(result));
+}
+
+void ZUTextToSpeech::xRaise(const std::string& key, const ZU::ZUValue& value) {
+  ko::AnyObject memory;
+  {
+    std::lock_guard lock(fMutex);
+    if (!fMemory || !fMemory->isValid())
+      fMemory = findService(getParentBroker(), fOptions.memoryModule);
+    memory = fMemory;
+  }
+  if (!memory) {
+    KO_LOG_WARNING(kCategory) << "No module " << fOptions.memoryModule << " to raise " << key;
+    return;
+  }
+  try {
+    ZU::ZUMemoryProxy(memory).raiseEvent(key, value);
+  } catch (const std::exception& e) {
+    KO_LOG_ERROR(kCategory) << "Cannot raise " << key << ": " << e.what();
+  }
+}
+
+}  // namespace robotsim
