@@ -1,0 +1,106 @@
+#include "support/recording_module.h"
+
+#include <string>
+
+#include "zu/zuerror.h"
+
+namespace robotsim::testing {
+
+RecordingModule::RecordingModule(const std::shared_ptr<ZU::ZUBroker>& broker,
+                                 const std::string& name)
+    : ZU::ZUModule(broker, name) {
+  beginMethod("onEvent", "RecordingModule", "Records a memory event.");
+  bindMethod(&RecordingModule::onEvent);
+  beginMethod("failingCallback", "RecordingModule", "Fails.");
+  bindMethod(&RecordingModule::failingCallback);
+  beginMethod("_mrkpauseCallback", "RecordingModule", "Records a blocking bookmark.");
+  bindMethod(&RecordingModule::_mrkpauseCallback);
+}
+
+void RecordingModule::onEvent(const std::string& memoryKey, const ZU::ZUValue& value,
+                              const std::string& message) {
+  {
+    std::lock_guard lock(fMutex);
+    fEvents.push_back(ReceivedEvent{memoryKey, value, message, std::this_thread::get_id(),
+                                    std::chrono::steady_clock::now()});
+  }
+  fChanged.notify_all();
+}
+
+void RecordingModule::failingCallback(const std::string& memoryKey, const ZU::ZUValue& /*value*/,
+                                      const std::string& /*message*/) {
+  ZU_THROW_ERROR(getName(), "failingCallback", "refused " + memoryKey);
+}
+
+void RecordingModule::_mrkpauseCallback(int bookmark) {
+  std::unique_lock lock(fMutex);
+  fBlocking.push_back(bookmark);
+  fChanged.notify_all();
+  fChanged.wait(lock, [this] { return !fHold; });
+}
+
+void RecordingModule::holdBlockingBookmarks() {
+  std::lock_guard lock(fMutex);
+  fHold = true;
+}
+
+void RecordingModule::releaseBlockingBookmarks() {
+  {
+    std::lock_guard lock(fMutex);
+    fHold = false;
+  }
+  fChanged.notify_all();
+}
+
+std::vector<ReceivedEvent> RecordingModule::events() const {
+  std::lock_guard lock(fMutex);
+  return fEvents;
+}
+
+std::vector<ReceivedEvent> RecordingModule::events(const std::string& key) const {
+  std::vector<ReceivedEvent> out;
+  std::lock_guard lock(fMutex);
+  for (const auto& e : fEvents) {
+    if (e.key == key)
+      out.push_back(e);
+  }
+  return out;
+}
+
+std::vector<int> RecordingModule::blockingBookmarks() const {
+  std::lock_guard lock(fMutex);
+  return fBlocking;
+}
+
+bool RecordingModule::waitForEvents(
+    const std::function<bool(const std::vector<ReceivedEvent>&)>& condition,
+    std::chrono::milliseconds bound) const {
+  std::unique_lock lock(fMutex);
+  return fChanged.wait_for(lock, bound, [&] { return condition(fEvents); });
+}
+
+bool RecordingModule::waitForBlockingBookmarks(std::size_t count,
+                                               std::chrono::milliseconds bound) const {
+  std::unique_lock lock(fMutex);
+  return fChanged.wait_for(lock, bound, [&] { return fBlocking.size() >= count; });
+}
+
+std::vector<std::string> statusesOf(const std::vector<ReceivedEvent>& events, int id) {
+  std::vector<std::string> out;
+  for (const auto& e : events) {
+    if (e.key == "ZUTextToSpeech/Status" && e.value.isArray() && e.value.arraySize() == 2 &&
+        e.value[0].isInt() && e.value[0].asInt() == id && e.value[1].isString())
+      out.push_back(e.value[1].asString());
+  }
+  return out;
+}
+
+bool hasStatus(const std::vector<ReceivedEvent>& events, int id, const std::string& word) {
+  for (const auto& s : statusesOf(events, id)) {
+    if (s == word)
+      return true;
+  }
+  return false;
+}
+
+}  // namespace robotsim::testing
