@@ -7,6 +7,7 @@
 #include <cstdlib>
 #include <mutex>
 #include <optional>
+#include <ostream>
 #include <string>
 #include <vector>
 
@@ -117,6 +118,10 @@ struct TimeoutCase {
   const char* text;
   int milliseconds;
 };
+
+void PrintTo(const TimeoutCase& c, std::ostream* os) {
+  *os << '"' << c.text << '"';
+}
 
 class DeadlockTimeoutParseTest : public ::testing::TestWithParam<TimeoutCase> {};
 

@@ -5,6 +5,7 @@
 
 #include <functional>
 #include <memory>
+#include <ostream>
 #include <string>
 #include <vector>
 
@@ -52,6 +53,10 @@ struct HelpCase {
   const char* method;
   const char* dump;
 };
+
+void PrintTo(const HelpCase& c, std::ostream* os) {
+  *os << '"' << c.method << '"';
+}
 
 class MethodHelpTest : public ModuleTest, public ::testing::WithParamInterface<HelpCase> {};
 
@@ -161,6 +166,10 @@ struct DefaultCase {
   const char* function;
   const char* message;
 };
+
+void PrintTo(const DefaultCase& c, std::ostream* os) {
+  *os << '"' << c.name << '"';
+}
 
 class DefaultOperationTest : public ::testing::TestWithParam<DefaultCase> {};
 

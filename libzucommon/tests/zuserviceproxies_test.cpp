@@ -6,6 +6,7 @@
 #include <functional>
 #include <memory>
 #include <mutex>
+#include <ostream>
 #include <string>
 #include <vector>
 
@@ -84,6 +85,10 @@ struct ServiceCase {
   const char* expectedCall;  // "" when the fake records nothing
   const char* expectedResult;
 };
+
+void PrintTo(const ServiceCase& c, std::ostream* os) {
+  *os << '"' << c.name << '"';
+}
 
 class ServiceProxyTest : public ::testing::TestWithParam<ServiceCase> {};
 

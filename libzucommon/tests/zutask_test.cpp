@@ -3,6 +3,7 @@
 
 #include <atomic>
 #include <memory>
+#include <ostream>
 #include <set>
 #include <string>
 #include <thread>
@@ -83,6 +84,10 @@ struct MissingNameCase {
   const char* name;
   AnyValue args;
 };
+
+void PrintTo(const MissingNameCase& c, std::ostream* os) {
+  *os << '"' << c.name << '"';
+}
 
 class PCallMissingNameTest : public TaskTest,
                              public ::testing::WithParamInterface<MissingNameCase> {};
