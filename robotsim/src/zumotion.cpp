@@ -1,0 +1,325 @@
+#include "robotsim/zumotion.h"
+
+#include <algorithm>
+#include <cmath>
+#include <sstream>
+#include <utility>
+
+#include "ko/eventloop.hpp"
+#include "ko/log.hpp"
+#include "robotsim/jointmodel.h"
+#include "zu/zuerror.h"
+
+namespace robotsim {
+
+namespace {
+
+constexpr const char* kCategory = "robotsim.motion";
+constexpr const char* kClass = "ZUMotion";
+constexpr std::size_t kLoopThreads = 4;
+
+const std::vector<std::string> kBreathChains = {"Head", "LArm", "RArm"};
+
+ko::AnyValue jointNameList(const std::vector<std::size_t>& joints) {
+  ko::AnyValue::List names;
+  for (const auto j : joints)
+    names.emplace_back(bodyJoints()[j].name);
+  return ko::AnyValue::list(std::move(names));
+}
+
+std::vector<std::size_t> jointsOfTracks(const std::vector<JointTrack>& tracks) {
+  std::vector<std::size_t> joints;
+  for (const auto& t : tracks)
+    joints.push_back(t.joint);
+  return joints;
+}
+
+double durationOf(const std::vector<JointTrack>& tracks) {
+  double d = 0;
+  for (const auto& t : tracks)
+    d = std::max(d, t.keys.back().time);
+  return d;
+}
+
+// The angles of setAngles: one number for every joint, or one per joint.
+std::vector<double> targetAngles(const ko::AnyValue& value, std::size_t jointCount) {
+  const ko::AnyValue* v = &value;
+  while (v->kind() == ko::Kind::Dynamic)
+    v = &v->asDynamic();
+  std::vector<double> angles;
+  try {
+    if (v->kind() == ko::Kind::Int || v->kind() == ko::Kind::Float)
+      angles.push_back(v->to<double>());
+    else
+      angles = v->to<std::vector<double>>();
+  } catch (const ko::ConversionError&) {
+    throw KeyframeError("The angles must be a number or a list of numbers, not " + v->toString());
+  }
+  if (angles.size() == 1 && jointCount > 1)
+    angles.resize(jointCount, angles.front());
+  if (angles.size() != jointCount) {
+    throw KeyframeError(std::to_string(jointCount) + " joints but " +
+                        std::to_string(angles.size()) + " angles");
+  }
+  for (const double a : angles) {
+    if (!std::isfinite(a))
+      throw KeyframeError("The angles must be finite");
+  }
+  return angles;
+}
+
+}  // namespace
+
+ZUMotion::ZUMotion(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name,
+                   std::shared_ptr<Timeline> timeline)
+    : ZU::ZUModule(broker, name), fTimeline(std::move(timeline)) {
+  setModuleDescription("The simulated robot's upper body: joints, moves and breathing.");
+  // Posted moves last as long as the move; they get threads of their own.
+  setEventLoop(std::make_shared<ko::EventLoop>(name, kLoopThreads));
+  for (const auto& chain : kBreathChains)
+    fBreath[chain] = true;
+  advertiseSignal<int, bool>("moveEnded");
+  fMoveEnded = signal<int, bool>("moveEnded");
+  fBody.setMoveEndListener(
+      [this](int moveId, bool interrupted) { xOnMoveEnded(moveId, interrupted); });
+  xBindMethods();
+}
+
+ZUMotion::~ZUMotion() {
+  fBody.setMoveEndListener(nullptr);
+}
+
+void ZUMotion::xBindMethods() {
+  beginMethod("getAngles", kClass, "Gets the angles of the joints.");
+  describeParameter("names", "A joint or chain name, or a list of them.");
+  describeParameter("useSensors", "Whether to read the sensors (the commanded angles here).");
+  describeReturn("angles", "The angles in radians, one per joint.");
+  bindMethod(&ZUMotion::getAngles);
+
+  beginMethod("setAngles", kClass, "Moves joints towards angles and returns at once.");
+  describeParameter("names", "A joint or chain name, or a list of them.");
+  describeParameter("angles", "One angle for all the joints, or one per joint, in radians.");
+  describeParameter("fractionMaxSpeed", "The fraction of the maximum speed, up to 1.");
+  bindMethod(&ZUMotion::setAngles);
+
+  beginMethod("angleInterpolationBezier", kClass,
+              "Moves joints through Bezier keys and returns when the move ends.");
+  describeParameter("jointNames", "A joint or chain name, or a list of them.");
+  describeParameter("times", "The key times in seconds, one list per joint.");
+  describeParameter("controlPoints",
+                    "The keys, one list per joint: [angle, [3, dTime, dAngle], [3, dTime, "
+                    "dAngle]].");
+  bindMethod(&ZUMotion::angleInterpolationBezier);
+
+  beginMethod("areResourcesAvailable", kClass,
+              "Whether no move holds a joint of the named joints or chains.");
+  describeParameter("resourceNames", "Joint or chain names.");
+  describeReturn("available", "True when all of them are free.");
+  bindMethod(&ZUMotion::areResourcesAvailable);
+
+  beginMethod("getBreathEnabled", kClass, "Whether a chain breathes.");
+  describeParameter("chainName", "\"Head\", \"LArm\", \"RArm\", \"Arms\" or \"Body\".");
+  describeReturn("enabled", "True when every joint chain named breathes.");
+  bindMethod(&ZUMotion::getBreathEnabled);
+
+  beginMethod("setBreathEnabled", kClass, "Starts or stops the breathing of a chain.");
+  describeParameter("chainName", "\"Head\", \"LArm\", \"RArm\", \"Arms\" or \"Body\".");
+  describeParameter("isEnabled", "True to breathe.");
+  bindMethod(&ZUMotion::setBreathEnabled);
+
+  beginMethod("_startBezierMove", kClass,
+              "Starts a Bezier move and answers its id at once (for the behaviour manager).");
+  describeParameter("jointNames", "A joint or chain name, or a list of them.");
+  describeParameter("times", "The key times in seconds, one list per joint.");
+  describeParameter("controlPoints", "The keys, one list per joint.");
+  describeParameter("minDuration", "The move holds its joints at least this long (seconds).");
+  describeReturn("moveId", "The id of the move.");
+  bindMethod(&ZUMotion::_startBezierMove);
+
+  beginMethod("_stopMove", kClass, "Ends a move at once.");
+  describeParameter("moveId", "The id answered by _startBezierMove.");
+  describeReturn("wasRunning", "False when the move had already ended.");
+  bindMethod(&ZUMotion::_stopMove);
+
+  beginMethod("_isMoveRunning", kClass, "Whether a move is running.");
+  describeParameter("moveId", "The id answered by _startBezierMove.");
+  describeReturn("running", "True while the move runs.");
+  bindMethod(&ZUMotion::_isMoveRunning);
+}
+
+void ZUMotion::xRecord(const std::string& operation, ko::AnyValue arguments, ko::AnyValue result) {
+  if (fTimeline)
+    fTimeline->record(getName(), operation, std::move(arguments), std::move(result));
+}
+
+void ZUMotion::xWarnBeyondLimits(const std::string& method, const std::vector<JointTrack>& tracks) {
+  for (const auto& track : tracks) {
+    const auto& joint = bodyJoints()[track.joint];
+    const auto beyond = std::find_if(track.keys.begin(), track.keys.end(), [&](const BezierKey& k) {
+      return k.angle < joint.minAngle || k.angle > joint.maxAngle;
+    });
+    if (beyond != track.keys.end()) {
+      KO_LOG_WARNING(kCategory) << method << ": " << joint.name << " asked for " << beyond->angle
+                                << " beyond its limits [" << joint.minAngle << ", "
+                                << joint.maxAngle << "]; clamped";
+    }
+  }
+}
+
+void ZUMotion::xOnMoveEnded(int moveId, bool interrupted) {
+  xRecord("moveEnded", ko::AnyValue::list({moveId, interrupted}));
+  (*fMoveEnded)(moveId, interrupted);
+}
+
+std::vector<float> ZUMotion::getAngles(const ko::AnyValue& names, bool useSensors) {
+  (void)useSensors;
+  std::vector<std::size_t> joints;
+  try {
+    joints = parseJointNames(names);
+  } catch (const KeyframeError& e) {
+    ZU_THROW_ERROR(getName(), "getAngles", e.what());
+  }
+  std::vector<float> out;
+  for (const double a : fBody.angles(joints))
+    out.push_back(static_cast<float>(a));
+  return out;
+}
+
+void ZUMotion::setAngles(const ko::AnyValue& names, const ko::AnyValue& angles,
+                         float fractionMaxSpeed) {
+  std::vector<std::size_t> joints;
+  std::vector<double> targets;
+  try {
+    joints = parseJointNames(names);
+    targets = targetAngles(angles, joints.size());
+  } catch (const KeyframeError& e) {
+    ZU_THROW_ERROR(getName(), "setAngles", e.what());
+  }
+  if (!std::isfinite(fractionMaxSpeed) || fractionMaxSpeed <= 0) {
+    ZU_THROW_ERROR(getName(), "setAngles",
+                   "fractionMaxSpeed must be above 0 (and at most 1), not " +
+                       std::to_string(fractionMaxSpeed));
+  }
+  for (std::size_t i = 0; i < joints.size(); ++i) {
+    const auto& joint = bodyJoints()[joints[i]];
+    if (targets[i] < joint.minAngle || targets[i] > joint.maxAngle) {
+      KO_LOG_WARNING(kCategory) << "setAngles: " << joint.name << " asked for " << targets[i]
+                                << " beyond its limits [" << joint.minAngle << ", "
+                                << joint.maxAngle << "]; clamped";
+    }
+  }
+  const int moveId = fBody.startSpeedMove(joints, targets, std::min(1.0f, fractionMaxSpeed));
+  xRecord("setAngles",
+          ko::AnyValue::list({jointNameList(joints), ko::AnyValue::from(targets),
+                              static_cast<double>(fractionMaxSpeed)}),
+          moveId);
+}
+
+void ZUMotion::angleInterpolationBezier(const ko::AnyValue& jointNames, const ko::AnyValue& times,
+                                        const ko::AnyValue& controlPoints) {
+  std::vector<JointTrack> tracks;
+  try {
+    tracks = parseBezierTracks(jointNames, times, controlPoints);
+  } catch (const KeyframeError& e) {
+    ZU_THROW_ERROR(getName(), "angleInterpolationBezier", e.what());
+  }
+  xWarnBeyondLimits("angleInterpolationBezier", tracks);
+  const int moveId = fBody.startBezierMove(tracks);
+  xRecord("angleInterpolationBezier",
+          ko::AnyValue::list({jointNameList(jointsOfTracks(tracks)), durationOf(tracks)}), moveId);
+
+  // stop(id) looks the move up after setting the task's flag; the flag is read after the
+  // move is registered, so one of the two sees the other.
+  const auto task = currentTask();
+  if (task) {
+    {
+      std::lock_guard lock(fMutex);
+      fTaskMoves[task->id()] = moveId;
+    }
+    if (task->isStopRequested())
+      fBody.stopMove(moveId);
+  }
+  fBody.waitMove(moveId, -1);
+  if (task) {
+    std::lock_guard lock(fMutex);
+    fTaskMoves.erase(task->id());
+  }
+}
+
+bool ZUMotion::areResourcesAvailable(const ko::AnyValue& resourceNames) {
+  std::vector<std::size_t> joints;
+  try {
+    joints = parseJointNames(resourceNames);
+  } catch (const KeyframeError& e) {
+    ZU_THROW_ERROR(getName(), "areResourcesAvailable", e.what());
+  }
+  return !fBody.isAnyJointHeld(joints);
+}
+
+std::vector<std::string> ZUMotion::xBreathChains(const std::string& method,
+                                                 const std::string& chain) {
+  if (chain == "Body")
+    return kBreathChains;
+  if (chain == "Arms")
+    return {"LArm", "RArm"};
+  if (std::find(kBreathChains.begin(), kBreathChains.end(), chain) != kBreathChains.end())
+    return {chain};
+  ZU_THROW_ERROR(getName(), method, "Unknown chain name '" + chain + "'");
+}
+
+bool ZUMotion::getBreathEnabled(const std::string& chainName) {
+  const auto chains = xBreathChains("getBreathEnabled", chainName);
+  std::lock_guard lock(fMutex);
+  return std::all_of(chains.begin(), chains.end(), [this](const auto& c) { return fBreath[c]; });
+}
+
+void ZUMotion::setBreathEnabled(const std::string& chainName, bool isEnabled) {
+  const auto chains = xBreathChains("setBreathEnabled", chainName);
+  {
+    std::lock_guard lock(fMutex);
+    for (const auto& c : chains)
+      fBreath[c] = isEnabled;
+  }
+  xRecord("setBreathEnabled", ko::AnyValue::list({chainName, isEnabled}));
+}
+
+void ZUMotion::stop(int id) {
+  ZU::ZUModule::stop(id);
+  int moveId = 0;
+  {
+    std::lock_guard lock(fMutex);
+    const auto it = fTaskMoves.find(id);
+    if (it != fTaskMoves.end())
+      moveId = it->second;
+  }
+  xRecord("stop", ko::AnyValue::list({id}));
+  if (moveId != 0)
+    fBody.stopMove(moveId);
+}
+
+int ZUMotion::_startBezierMove(const ko::AnyValue& jointNames, const ko::AnyValue& times,
+                               const ko::AnyValue& controlPoints, float minDuration) {
+  std::vector<JointTrack> tracks;
+  try {
+    tracks = parseBezierTracks(jointNames, times, controlPoints);
+  } catch (const KeyframeError& e) {
+    ZU_THROW_ERROR(getName(), "_startBezierMove", e.what());
+  }
+  xWarnBeyondLimits("_startBezierMove", tracks);
+  const int moveId = fBody.startBezierMove(tracks, minDuration);
+  xRecord("startBezierMove",
+          ko::AnyValue::list({jointNameList(jointsOfTracks(tracks)),
+                              std::max(durationOf(tracks), static_cast<double>(minDuration))}),
+          moveId);
+  return moveId;
+}
+
+bool ZUMotion::_stopMove(int moveId) {
+  return fBody.stopMove(moveId);
+}
+
+bool ZUMotion::_isMoveRunning(int moveId) {
+  return fBody.isMoveRunning(moveId);
+}
+
+}  // namespace robotsim
