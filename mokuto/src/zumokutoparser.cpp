@@ -340,6 +340,17 @@ struct ZUMokutoParser::ParseState {
         methodEndScan(callerText, kMethodEnd),
         nonSpaceScan(callerText, kNonSpace) {}
 
+  // Adds an action to the job; the first one makes room for as many as the rest of the
+  // text may hold at a typical density, so that the lists rarely grow one by one.
+  void addAction(std::shared_ptr<MKTaskAction> action, std::size_t at) {
+    if (job.actions.empty()) {
+      const std::size_t expected = std::min<std::size_t>((text.size() - at) / 48 + 1, 1024);
+      job.actions.reserve(expected);
+      job.usedBookmarks.reserve(job.usedBookmarks.size() + expected);
+    }
+    job.addAction(std::move(action));
+  }
+
   // Appends the caller's text from copiedUpTo to `end` to the speech text.
   void copyUpTo(std::size_t end) {
     if (end > copiedUpTo) {
@@ -398,7 +409,8 @@ MKTaskActionType MKTaskActionType_fromStr(std::string_view name) {
   if (name.size() <= KeywordsByLength::kMaxLength) {
     for (std::size_t k = 0; k < kKeywordsByLength.count[name.size()]; ++k) {
       const std::uint8_t type = kKeywordsByLength.types[name.size()][k];
-      if (name == kMKTaskActionKeywords[type]) {
+      const std::string_view keyword = kMKTaskActionKeywords[type];
+      if (std::equal(keyword.begin(), keyword.end(), name.begin())) {
         return type;
       }
     }
@@ -556,7 +568,7 @@ bool ZUMokutoParser::xReadInstruction(ParseState& state, std::size_t& pos) const
     return true;
   }
   MKTaskAction& added = *cursor.action;
-  state.job.addAction(std::move(cursor.action));
+  state.addAction(std::move(cursor.action), cursor.start);
   added.appendBookmark(state.speech);
   return true;
 }
@@ -577,7 +589,7 @@ bool ZUMokutoParser::xReadAffectation(ParseState& state, std::size_t& pos) const
   state.copyUpTo(dollar);
   state.copiedUpTo = end;
   MKTaskAction& added = *action;
-  state.job.addAction(std::move(action));
+  state.addAction(std::move(action), dollar);
   added.appendBookmark(state.speech);
   state.afterBackslash = true;
   pos = end;
