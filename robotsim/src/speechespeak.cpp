@@ -21,26 +21,18 @@ namespace {
 constexpr const char* kCategory = "robotsim.texttospeech";
 
 // The one thread of the process that owns espeak-ng (which keeps global state and is
-// not thread-safe): it initialises the library, runs every call into it, one job at a
-// time, and terminates it. Shared by every espeak-ng synthesizer of the process; jobs
+// not thread-safe): it initialises the library and runs every call into it, one job at a
+// time. Shared by every espeak-ng synthesizer of the process; jobs
 // are posted from any thread.
 class SpeechEspeakThread {
  public:
-  static std::shared_ptr<SpeechEspeakThread> instance() {
-    static std::mutex mutex;
-    static std::weak_ptr<SpeechEspeakThread> current;
-    std::lock_guard lock(mutex);
-    if (auto existing = current.lock())
-      return existing;
-    auto created = std::shared_ptr<SpeechEspeakThread>(new SpeechEspeakThread());
-    current = created;
-    return created;
+  // Started on first use and never stopped: espeak-ng cannot be terminated and
+  // initialised again reliably, so the thread lives as long as the process.
+  static SpeechEspeakThread& instance() {
+    static SpeechEspeakThread* const thread = new SpeechEspeakThread();
+    return *thread;
   }
 
-  ~SpeechEspeakThread() {
-    post([this] { fQuit = true; });
-    fThread.join();
-  }
   SpeechEspeakThread(const SpeechEspeakThread&) = delete;
   SpeechEspeakThread& operator=(const SpeechEspeakThread&) = delete;
 
@@ -97,20 +89,19 @@ class SpeechEspeakThread {
   SpeechEspeakThread() {
     std::promise<void> ready;
     auto started = ready.get_future();
-    fThread = std::thread([this, &ready] { run(ready); });
+    fThread = std::thread([this, ready = std::move(ready)]() mutable { run(ready); });
     try {
       started.get();
     } catch (...) {
       fThread.join();
       throw;
     }
+    fThread.detach();
   }
 
   void run(std::promise<void>& ready) {
-    // A thread of a synthesizer that was just released may still be terminating espeak-ng.
-    static std::mutex lifetime;
-    std::lock_guard life(lifetime);
-    const int rate = espeak_Initialize(AUDIO_OUTPUT_SYNCHRONOUS, 100, nullptr, 0);
+    const int rate =
+        espeak_Initialize(AUDIO_OUTPUT_SYNCHRONOUS, 100, nullptr, espeakINITIALIZE_DONT_EXIT);
     if (rate <= 0) {
       ready.set_exception(
           std::make_exception_ptr(std::runtime_error("espeak-ng could not be initialised")));
@@ -125,7 +116,7 @@ class SpeechEspeakThread {
     }
     ready.set_value();
 
-    while (!fQuit) {
+    for (;;) {
       std::function<void()> job;
       {
         std::unique_lock lock(fMutex);
@@ -139,8 +130,6 @@ class SpeechEspeakThread {
         KO_LOG_ERROR(kCategory) << "espeak-ng job failed: " << e.what();
       }
     }
-    espeak_Terminate();
-    sCurrent = nullptr;
   }
 
   // espeak-ng's callback, on the thread, during espeak_Synth.
@@ -179,7 +168,6 @@ class SpeechEspeakThread {
   // Touched by the thread only (the constructor reads the first two once it is ready).
   int fSampleRate = 0;
   std::vector<std::string> fLanguages;
-  bool fQuit = false;
   std::string fVoice;
   SpeechPerformance* fPerformance = nullptr;
   std::uint64_t fSamples = 0;
@@ -189,14 +177,14 @@ class EspeakSynthesizer : public SpeechSynthesizer {
  public:
   EspeakSynthesizer() : fThread(SpeechEspeakThread::instance()) {}
 
-  int sampleRate() const override { return fThread->sampleRate(); }
+  int sampleRate() const override { return fThread.sampleRate(); }
   bool producesAudio() const override { return true; }
-  std::vector<std::string> languages() const override { return fThread->languages(); }
+  std::vector<std::string> languages() const override { return fThread.languages(); }
 
   void synthesize(const SpeechScript& script, const SpeechVoiceSettings& voice,
                   std::shared_ptr<SpeechPerformance> performance) override {
-    fThread->post([thread = fThread.get(), ssml = toEspeakSsml(script), voice,
-                   performance = std::move(performance)] {
+    fThread.post([thread = &fThread, ssml = toEspeakSsml(script), voice,
+                  performance = std::move(performance)] {
       if (performance->isCancelled()) {
         performance->finish(0);
         return;
@@ -206,7 +194,7 @@ class EspeakSynthesizer : public SpeechSynthesizer {
   }
 
  private:
-  const std::shared_ptr<SpeechEspeakThread> fThread;
+  SpeechEspeakThread& fThread;
 };
 
 }  // namespace

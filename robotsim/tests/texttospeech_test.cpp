@@ -1,0 +1,426 @@
+// ZUTextToSpeech driven through its proxy as the service drives it: posted says, the
+// bookmark and status events through ZUMemory, and the blocking-bookmark calls to the
+// module registered as "ZUMokuto".
+#include <gtest/gtest.h>
+#include <sndfile.h>
+
+#include <chrono>
+#include <cstdlib>
+#include <filesystem>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "ko/log.hpp"
+#include "ko/session.hpp"
+#include "robotsim/speechscript.h"
+#include "robotsim/zumemory.h"
+#include "robotsim/zutexttospeech.h"
+#include "support/recording_module.h"
+#include "zu/zubroker.h"
+#include "zu/zuserviceproxies.h"
+
+namespace robotsim {
+namespace {
+
+using testing::ReceivedEvent;
+using testing::RecordingModule;
+using namespace std::chrono_literals;
+
+constexpr auto kBound = 30s;
+constexpr const char* kBookmark = "ZUTextToSpeech/CurrentBookMark";
+constexpr const char* kStatus = "ZUTextToSpeech/Status";
+// How far a bookmark may be from its audio time on the playback clock.
+constexpr std::int64_t kToleranceUs = 50'000;
+
+ZUTextToSpeechOptions espeak(double rate = 1.0) {
+  ZUTextToSpeechOptions o;
+  o.playbackRate = rate;
+  return o;
+}
+
+ZUTextToSpeechOptions timing(double rate = kSpeechAsFastAsPossible) {
+  ZUTextToSpeechOptions o;
+  o.backend = ZUTextToSpeechOptions::Backend::Timing;
+  o.playbackRate = rate;
+  return o;
+}
+
+// The simulated robot's memory and speech, with a recording module as "ZUMokuto"
+// subscribed to the speech events as the service subscribes.
+class Robot {
+ public:
+  explicit Robot(ZUTextToSpeechOptions options)
+      : broker(std::make_shared<ZU::ZUBroker>(std::make_shared<ko::Session>())),
+        timeline(std::make_shared<Timeline>()),
+        memoryModule(
+            ZU::ZUModule::createModule<ZUMemory>(broker, "ZUMemory", ZUMemoryOptions{timeline, 4})),
+        ttsModule(ZU::ZUModule::createModule<ZUTextToSpeech>(broker, "ZUTextToSpeech",
+                                                             withTimeline(std::move(options)))),
+        mokuto(ZU::ZUModule::createModule<RecordingModule>(broker, "ZUMokuto")),
+        memory(broker),
+        tts(broker) {
+    memory.subscribeToEvent(kBookmark, "ZUMokuto", "onEvent");
+    memory.subscribeToEvent(kStatus, "ZUMokuto", "onEvent");
+    tts.enableNotifications();
+  }
+
+  // Waits until the text's status `word` has been delivered.
+  bool waitForStatus(int id, const std::string& word) const {
+    return mokuto->waitForEvents(
+        [&](const std::vector<ReceivedEvent>& events) {
+          return testing::hasStatus(events, id, word);
+        },
+        kBound);
+  }
+  bool waitForBookmark(int number) const {
+    return mokuto->waitForEvents(
+        [&](const std::vector<ReceivedEvent>& events) { return hasBookmark(events, number); },
+        kBound);
+  }
+  static bool hasBookmark(const std::vector<ReceivedEvent>& events, int number) {
+    for (const auto& e : events) {
+      if (e.key == kBookmark && e.value.asInt() == number)
+        return true;
+    }
+    return false;
+  }
+  std::vector<int> bookmarks() const {
+    std::vector<int> out;
+    for (const auto& e : mokuto->events(kBookmark))
+      out.push_back(e.value.asInt());
+    return out;
+  }
+  std::vector<std::string> statuses(int id) const {
+    return testing::statusesOf(mokuto->events(), id);
+  }
+  // Speaks the text as the service does and waits for its last status.
+  int speak(const std::string& text) {
+    const int id = tts.post_say(text);
+    EXPECT_FALSE(tts.wait(id, 0));
+    EXPECT_TRUE(waitForStatus(id, "done"));
+    return id;
+  }
+
+  std::shared_ptr<ZU::ZUBroker> broker;
+  std::shared_ptr<Timeline> timeline;
+  std::shared_ptr<ZUMemory> memoryModule;
+  std::shared_ptr<ZUTextToSpeech> ttsModule;
+  std::shared_ptr<RecordingModule> mokuto;
+  ZU::ZUMemoryProxy memory;
+  ZU::ZUTextToSpeechProxy tts;
+
+ private:
+  ZUTextToSpeechOptions withTimeline(ZUTextToSpeechOptions options) {
+    options.timeline = timeline;
+    return options;
+  }
+};
+
+// ---- the reading of a text ------------------------------------------------------
+
+struct SsmlCase {
+  std::string text;
+  std::string ssml;
+};
+
+class SpeechScriptSsml : public ::testing::TestWithParam<SsmlCase> {};
+
+TEST_P(SpeechScriptSsml, TranslatesTagsForEspeak) {
+  EXPECT_EQ(toEspeakSsml(parseSpeechText(GetParam().text)),
+            "<speak>" + GetParam().ssml + "</speak>");
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Texts, SpeechScriptSsml,
+    ::testing::Values(
+        SsmlCase{"Hello \\mrk=3\\ world", "Hello <mark name=\"0\"/> world"},
+        SsmlCase{"a \\mrkpause=4\\ b \\mrk=5\\", "a <mark name=\"0\"/> b <mark name=\"1\"/>"},
+        // A mark after a full stop goes before the stop, in order.
+        SsmlCase{"One. \\mrk=1\\ \\mrk=2\\ Two", "One<mark name=\"0\"/><mark name=\"1\"/>.   Two"},
+        SsmlCase{"Wait... \\mrk=1\\", "Wait<mark name=\"0\"/>... "},
+        SsmlCase{"Really? \\mrk=1\\", "Really? <mark name=\"0\"/>"},
+        SsmlCase{"\\pau=500\\Hi", "<break strength=\"x-weak\" time=\"500ms\"/>Hi"},
+        SsmlCase{"\\pau=99999999\\", "<break strength=\"x-weak\" time=\"60000ms\"/>"},
+        SsmlCase{"a & b < c > d", "a &amp; b &lt; c &gt; d"},
+        // Other tags, malformed ones and a lone backslash are not spoken.
+        SsmlCase{"\\rspd=80\\Hi \\vct=120\\there", "Hi there"},
+        SsmlCase{"\\mrk=x\\a\\mrk=\\b\\mrk=-1\\c", "abc"}, SsmlCase{"\\mrk=99999999999\\a", "a"},
+        SsmlCase{"end \\mrk=1", "end "},
+        SsmlCase{"ctl\x01"
+                 "char",
+                 "ctl char"}));
+
+TEST(SpeechScript, NumbersMarksInTextOrderWithTheirKinds) {
+  const auto script = parseSpeechText("\\MRK=7\\ a \\mrkpause=2\\ b \\mrk=7\\ \\Pau=20\\");
+  ASSERT_EQ(script.marks.size(), 3U);
+  EXPECT_EQ(script.marks[0].number, 7);
+  EXPECT_FALSE(script.marks[0].blocking);
+  EXPECT_EQ(script.marks[1].number, 2);
+  EXPECT_TRUE(script.marks[1].blocking);
+  EXPECT_EQ(script.marks[2].number, 7);
+  EXPECT_EQ(script.parts.back().breakMs, 20);
+}
+
+// ---- espeak-ng in real time -------------------------------------------------------
+
+TEST(TextToSpeechEspeak, BookmarksArriveInOrderAtTheirAudioTimes) {
+  Robot robot(espeak());
+  const int id = robot.speak(
+      "Hello \\mrk=1\\ there. \\mrk=2\\ How are \\mrk=3\\ you \\pau=300\\ \\mrk=4\\ today? "
+      "\\mrk=5\\ Fine.");
+  EXPECT_EQ(robot.bookmarks(), (std::vector<int>{1, 2, 3, 4, 5}));
+  EXPECT_EQ(robot.statuses(id), (std::vector<std::string>{"started", "done"}));
+
+  const auto marks = robot.ttsModule->markRecords(id);
+  ASSERT_EQ(marks.size(), 5U);
+  for (std::size_t i = 0; i < marks.size(); ++i) {
+    EXPECT_EQ(marks[i].number, static_cast<int>(i) + 1);
+    EXPECT_NEAR(static_cast<double>(marks[i].playbackUs), static_cast<double>(marks[i].audioUs),
+                kToleranceUs)
+        << "bookmark " << marks[i].number;
+    if (i > 0) {
+      EXPECT_GT(marks[i].audioUs, marks[i - 1].audioUs) << "bookmark " << marks[i].number;
+    }
+  }
+  // The pause is in the audio between bookmarks 3 and 4.
+  EXPECT_GE(marks[3].audioUs - marks[2].audioUs, 300'000);
+  // The timeline shows each bookmark with its audio time and lateness.
+  const auto entries = robot.timeline->entries("ZUTextToSpeech", "bookmark");
+  ASSERT_EQ(entries.size(), 5U);
+  EXPECT_EQ(entries[1].arguments.asList().at(1).to<int>(), 2);
+}
+
+TEST(TextToSpeechEspeak, BlockingBookmarkHoldsTheSpeechUntilItsCallbackReturns) {
+  Robot robot(espeak());
+  robot.mokuto->holdBlockingBookmarks();
+  const int id = robot.tts.post_say("One \\mrk=1\\ two \\mrkpause=2\\ three \\mrk=3\\ four.");
+  ASSERT_TRUE(robot.mokuto->waitForBlockingBookmarks(1, kBound));
+  EXPECT_EQ(robot.mokuto->blockingBookmarks(), std::vector<int>{2});
+  EXPECT_TRUE(robot.tts.isRunning(id));
+  // While the callback is held, the next bookmark does not come.
+  EXPECT_FALSE(robot.mokuto->waitForEvents(
+      [](const std::vector<ReceivedEvent>& events) { return Robot::hasBookmark(events, 3); },
+      1500ms));
+  const auto released = std::chrono::steady_clock::now();
+  robot.mokuto->releaseBlockingBookmarks();
+  EXPECT_FALSE(robot.tts.wait(id, 0));
+  ASSERT_TRUE(robot.waitForStatus(id, "done"));
+
+  EXPECT_EQ(robot.bookmarks(), (std::vector<int>{1, 3}));
+  EXPECT_GT(robot.mokuto->events(kBookmark).at(1).time, released);
+  const auto marks = robot.ttsModule->markRecords(id);
+  ASSERT_EQ(marks.size(), 3U);
+  EXPECT_TRUE(marks[1].blocking);
+  EXPECT_GE(marks[1].heldUs, 1'500'000);
+  // The playback clock stood still during the hold: bookmark 3 is still on time.
+  EXPECT_NEAR(static_cast<double>(marks[2].playbackUs), static_cast<double>(marks[2].audioUs),
+              kToleranceUs);
+}
+
+TEST(TextToSpeechEspeak, StopEndsTheTextWithStopped) {
+  Robot robot(espeak());
+  std::string text = "This text \\mrk=1\\ goes on";
+  for (int i = 0; i < 20; ++i)
+    text += " and on";
+  text += " \\mrk=2\\ to the end.";
+  const int id = robot.tts.post_say(text);
+  ASSERT_TRUE(robot.waitForBookmark(1));
+  robot.tts.stop(id);
+  EXPECT_FALSE(robot.tts.wait(id, 10'000));
+  ASSERT_TRUE(robot.waitForStatus(id, "stopped"));
+  EXPECT_EQ(robot.statuses(id), (std::vector<std::string>{"started", "stopped"}));
+  EXPECT_EQ(robot.bookmarks(), std::vector<int>{1});
+  EXPECT_FALSE(robot.tts.isRunning(id));
+}
+
+TEST(TextToSpeechEspeak, StopDuringAHeldBlockingBookmarkDoesNotWaitForTheCallback) {
+  Robot robot(espeak());
+  robot.mokuto->holdBlockingBookmarks();
+  const int id = robot.tts.post_say("Run \\mrkpause=1\\ then \\mrk=2\\ talk.");
+  ASSERT_TRUE(robot.mokuto->waitForBlockingBookmarks(1, kBound));
+  robot.tts.stop(id);
+  EXPECT_FALSE(robot.tts.wait(id, 10'000));
+  EXPECT_TRUE(robot.waitForStatus(id, "stopped"));
+  robot.mokuto->releaseBlockingBookmarks();
+  EXPECT_EQ(robot.bookmarks(), std::vector<int>{});
+}
+
+TEST(TextToSpeechEspeak, RecordingHoldsTheAudioAndTheSilenceOfBlockingBookmarks) {
+  Robot robot(espeak());
+  robot.mokuto->holdBlockingBookmarks();
+  const int id = robot.tts.post_say("Hello \\mrkpause=1\\ world.");
+  ASSERT_TRUE(robot.mokuto->waitForBlockingBookmarks(1, kBound));
+  robot.mokuto->releaseBlockingBookmarks();
+  EXPECT_FALSE(robot.tts.wait(id, 0));
+  const auto marks = robot.ttsModule->markRecords(id);
+  ASSERT_EQ(marks.size(), 1U);
+  const auto done = robot.timeline->entries("ZUTextToSpeech", "done");
+  ASSERT_EQ(done.size(), 1U);
+  const auto playedUs = done[0].result.asMap().at(0).second.to<std::int64_t>();
+
+  const auto path = std::filesystem::temp_directory_path() /
+                    ("texttospeech_test_" + std::to_string(::getpid()) + ".wav");
+  robot.ttsModule->saveRecording(path.string());
+  SF_INFO info{};
+  SNDFILE* file = sf_open(path.c_str(), SFM_READ, &info);
+  ASSERT_NE(file, nullptr);
+  std::vector<short> samples(static_cast<std::size_t>(info.frames));
+  sf_read_short(file, samples.data(), info.frames);
+  sf_close(file);
+  std::filesystem::remove(path);
+
+  EXPECT_EQ(info.channels, 1);
+  EXPECT_EQ(info.samplerate, robot.ttsModule->sampleRate());
+  const double expected = static_cast<double>(playedUs + marks[0].heldUs) * info.samplerate / 1e6;
+  EXPECT_NEAR(static_cast<double>(info.frames), expected, info.samplerate * 0.01);
+  EXPECT_TRUE(std::any_of(samples.begin(), samples.end(), [](short s) { return s != 0; }));
+
+  EXPECT_THROW(robot.ttsModule->saveRecording("/nonexistent/dir/out.wav"), ZU::ZUError);
+}
+
+// ---- both backends -------------------------------------------------------------------
+
+struct BackendCase {
+  std::string name;
+  ZUTextToSpeechOptions options;
+};
+
+class TextToSpeechBackends : public ::testing::TestWithParam<BackendCase> {};
+
+TEST_P(TextToSpeechBackends, NoneOf200BookmarksIsLost) {
+  ko::log::ScopedCapture cap(ko::log::Warning);
+  Robot robot(GetParam().options);
+  std::string text;
+  std::vector<int> expected;
+  std::vector<int> blocking;
+  for (int n = 1; n <= 200; ++n) {
+    text += "word " + std::to_string(n);
+    text += n % 7 == 0 ? ". " : n % 5 == 0 ? ", " : " ";
+    if (n % 11 == 0)
+      text += "\\pau=10\\ ";
+    if (n % 13 == 0) {
+      text += "\\mrkpause=" + std::to_string(n) + "\\ ";
+      blocking.push_back(n);
+    } else {
+      text += "\\mrk=" + std::to_string(n) + "\\ ";
+      expected.push_back(n);
+    }
+  }
+  const int id = robot.speak(text);
+  EXPECT_EQ(robot.bookmarks(), expected);
+  EXPECT_EQ(robot.mokuto->blockingBookmarks(), blocking);
+  const auto marks = robot.ttsModule->markRecords(id);
+  ASSERT_EQ(marks.size(), 200U);
+  for (std::size_t i = 1; i < marks.size(); ++i)
+    EXPECT_GE(marks[i].audioUs, marks[i - 1].audioUs);
+  EXPECT_FALSE(cap->containsPart("robotsim.texttospeech", ko::log::Warning, "not reported"));
+}
+
+TEST_P(TextToSpeechBackends, TextsPlayOneAfterTheOther) {
+  Robot robot(GetParam().options);
+  const int first = robot.tts.post_say("first \\mrk=1\\ text");
+  const int second = robot.tts.post_say("second \\mrk=2\\ text");
+  ASSERT_TRUE(robot.waitForStatus(second, "done"));
+  std::vector<std::string> order;
+  for (const auto& e : robot.mokuto->events(kStatus))
+    order.push_back(std::to_string(e.value[0].asInt() == first ? 1 : 2) + e.value[1].asString());
+  EXPECT_EQ(order, (std::vector<std::string>{"1started", "1done", "2started", "2done"}));
+  EXPECT_EQ(robot.bookmarks(), (std::vector<int>{1, 2}));
+}
+
+TEST_P(TextToSpeechBackends, WithoutNotificationsNoEventIsRaisedButBlockingCallsAreMade) {
+  Robot robot(GetParam().options);
+  robot.tts.call<void>("disableNotifications");
+  robot.tts.say("quiet \\mrk=1\\ text \\mrkpause=2\\ here");
+  EXPECT_EQ(robot.mokuto->blockingBookmarks(), std::vector<int>{2});
+  EXPECT_THROW(robot.memoryModule->getData(kStatus), ZU::ZUError);
+  EXPECT_THROW(robot.memoryModule->getData(kBookmark), ZU::ZUError);
+}
+
+INSTANTIATE_TEST_SUITE_P(Backends, TextToSpeechBackends,
+                         ::testing::Values(BackendCase{"Timing", timing()},
+                                           BackendCase{"Espeak", espeak(kSpeechAsFastAsPossible)}),
+                         [](const auto& param) { return param.param.name; });
+
+// ---- the timing backend --------------------------------------------------------------
+
+TEST(TextToSpeechTiming, AStopBeforeTheTextBeginsEndsItWithoutStarting) {
+  Robot robot(timing(1.0));
+  const int running = robot.tts.post_say(std::string(200, 'a') + " \\mrk=1\\ end");
+  const int queued = robot.tts.post_say("never \\mrk=2\\ heard");
+  robot.tts.stop(queued);
+  EXPECT_FALSE(robot.tts.wait(queued, 10'000));
+  ASSERT_TRUE(robot.waitForStatus(queued, "stopped"));
+  EXPECT_EQ(robot.statuses(queued), std::vector<std::string>{"stopped"});
+  robot.tts.stop(running);
+  ASSERT_TRUE(robot.waitForStatus(running, "stopped"));
+  EXPECT_EQ(robot.bookmarks(), std::vector<int>{});
+}
+
+TEST(TextToSpeechTiming, ADirectSayReturnsAtTheEndWithAnIdOfItsOwn) {
+  Robot robot(timing());
+  robot.tts.say("direct \\mrk=4\\ call");
+  const auto started = robot.timeline->entries("ZUTextToSpeech", "started");
+  ASSERT_EQ(started.size(), 1U);
+  const int id = started[0].arguments.asList().at(0).to<int>();
+  EXPECT_GE(id, 1 << 30);
+  EXPECT_EQ(robot.timeline->entries("ZUTextToSpeech", "done").size(), 1U);
+  EXPECT_TRUE(robot.waitForStatus(id, "done"));
+}
+
+TEST(TextToSpeechTiming, ParametersAreKeptWithinTheirRanges) {
+  Robot robot(timing());
+  struct Case {
+    const char* name;
+    float set;
+    float read;
+  };
+  for (const Case c :
+       {Case{"speed", 150.0F, 150.0F}, Case{"speed", 1000.0F, 400.0F}, Case{"speed", 10.0F, 50.0F},
+        Case{"pitchShift", 1.5F, 1.5F}, Case{"pitchShift", 0.0F, 0.0F},
+        Case{"pitchShift", 9.0F, 4.0F}, Case{"volume", 0.5F, 0.5F}, Case{"volume", 3.0F, 1.0F},
+        Case{"inputMode", 2.0F, 2.0F}, Case{"inputMode", 3.0F, 3.0F}}) {
+    robot.tts.setParameter(c.name, c.set);
+    EXPECT_EQ(robot.tts.call<float>("getParameter", std::string(c.name)), c.read) << c.name;
+  }
+  ko::log::ScopedCapture cap;
+  robot.tts.setParameter("doubleVoice", 1.0F);
+  EXPECT_TRUE(
+      cap->contains("robotsim.texttospeech", ko::log::Warning, "Unknown parameter: doubleVoice"));
+  EXPECT_THROW(robot.tts.call<float>("getParameter", std::string("doubleVoice")), ZU::ZUError);
+}
+
+TEST(TextToSpeechTiming, SpeedChangesTheTimingOfTheBookmarks) {
+  Robot robot(timing());
+  const int normal = robot.speak("twelve chars \\mrk=1\\");
+  robot.tts.setParameter("speed", 200.0F);
+  const int fast = robot.speak("twelve chars \\mrk=1\\");
+  const auto a = robot.ttsModule->markRecords(normal);
+  const auto b = robot.ttsModule->markRecords(fast);
+  ASSERT_EQ(a.size(), 1U);
+  ASSERT_EQ(b.size(), 1U);
+  EXPECT_NEAR(static_cast<double>(b[0].audioUs) * 2, static_cast<double>(a[0].audioUs), 100);
+}
+
+TEST(TextToSpeechLanguages, EspeakSpeaksTheServicesLanguages) {
+  Robot robot(espeak(kSpeechAsFastAsPossible));
+  const auto languages = robot.tts.call<std::vector<std::string>>("getAvailableLanguages");
+  for (const char* language : {"English", "French", "Japanese"})
+    EXPECT_NE(std::find(languages.begin(), languages.end(), language), languages.end());
+  EXPECT_EQ(robot.tts.getLanguage(), "English");
+  robot.tts.call<void>("setLanguage", std::string("French"));
+  EXPECT_EQ(robot.tts.getLanguage(), "French");
+  robot.speak("Bonjour \\mrk=1\\ tout le monde.");
+  EXPECT_EQ(robot.bookmarks(), std::vector<int>{1});
+  try {
+    robot.tts.call<void>("setLanguage", std::string("Klingon"));
+    ADD_FAILURE() << "Klingon accepted";
+  } catch (const ZU::ZUError& e) {
+    EXPECT_NE(std::string(e.what()).find("Unknown language: Klingon"), std::string::npos);
+  }
+  EXPECT_EQ(robot.tts.getLanguage(), "French");
+}
+
+}  // namespace
+}  // namespace robotsim
