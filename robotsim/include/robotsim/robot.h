@@ -1,0 +1,54 @@
+#pragma once
+// The whole simulated robot: a session with a broker, the shared timeline, and every
+// service the speech-animation service drives ("ZUMemory", "ZUTextToSpeech",
+// "ZUBehaviorManager", "ZUMotion", "ZUAudioPlayer", "ZURobotPosture", "ZURobotModel",
+// "ZUAutonomousMoves"), registered under those names.
+//
+// Built and destroyed by one thread; the services themselves serve any thread. On
+// destruction every service exits (stopping what it plays) in the reverse order of its
+// start.
+
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "robotsim/timeline.h"
+#include "robotsim/zutexttospeech.h"
+#include "zu/zubroker.h"
+#include "zu/zumodule.h"
+
+namespace robotsim {
+
+struct RobotOptions {
+  // The speech engine; its timeline is the robot's.
+  ZUTextToSpeechOptions speech;
+  // Library folders; empty for the data folders "zefoko/behaviors" and "zefoko/sounds".
+  std::string behaviorsRoot;
+  std::string soundsRoot;
+  int robotType = 1;
+};
+
+class Robot {
+ public:
+  // Starts every service on `broker`, or on a broker of a new session when it is null.
+  // Raises ZUError when a service cannot start (a name already registered, no speech
+  // engine); the services started before it exit again.
+  explicit Robot(RobotOptions options = {}, std::shared_ptr<ZU::ZUBroker> broker = nullptr);
+  ~Robot();
+  Robot(const Robot&) = delete;
+  Robot& operator=(const Robot&) = delete;
+
+  const std::shared_ptr<ZU::ZUBroker>& broker() const noexcept { return fBroker; }
+  const std::shared_ptr<Timeline>& timeline() const noexcept { return fTimeline; }
+  const std::shared_ptr<ZUTextToSpeech>& speech() const noexcept { return fSpeech; }
+
+ private:
+  void xShutdown() noexcept;
+
+  std::shared_ptr<ZU::ZUBroker> fBroker;
+  std::shared_ptr<Timeline> fTimeline;
+  std::shared_ptr<ZUTextToSpeech> fSpeech;
+  std::vector<std::shared_ptr<ZU::ZUModuleCore>> fServices;  // in start order
+};
+
+}  // namespace robotsim

@@ -1,0 +1,51 @@
+#include <gtest/gtest.h>
+
+#include "robotsim/robot.h"
+#include "zu/zuerror.h"
+#include "zu/zuserviceproxies.h"
+
+namespace {
+
+robotsim::RobotOptions timingRobot() {
+  robotsim::RobotOptions options;
+  options.speech.backend = robotsim::ZUTextToSpeechOptions::Backend::Timing;
+  options.speech.playbackRate = robotsim::kSpeechAsFastAsPossible;
+  return options;
+}
+
+TEST(Robot, EveryServiceAnswersByItsName) {
+  robotsim::Robot robot(timingRobot());
+  const auto& broker = robot.broker();
+  EXPECT_EQ(ZU::ZURobotPostureProxy(broker).getPostureFamily(), "Standing");
+  EXPECT_NE(ZU::ZURobotModelProxy(broker)._getRobotType(), 0);
+  EXPECT_EQ(ZU::ZUTextToSpeechProxy(broker).getLanguage(), "English");
+  EXPECT_FALSE(ZU::ZUBehaviorManagerProxy(broker).getInstalledBehaviors().empty());
+  EXPECT_TRUE(ZU::ZUMotionProxy(broker).areResourcesAvailable({"Head"}));
+  EXPECT_NO_THROW(ZU::ZUAudioPlayerProxy(broker).loadSoundSet("bells"));
+  EXPECT_NO_THROW(ZU::ZUAutonomousMovesProxy(broker)._moveSides());
+  EXPECT_NO_THROW(ZU::ZUMemoryProxy(broker).declareEvent("Robot/Test", ""));
+}
+
+TEST(Robot, ServicesAreWithdrawnWhenTheRobotGoes) {
+  auto session = std::make_shared<ko::Session>();
+  auto broker = std::make_shared<ZU::ZUBroker>(session);
+  {
+    robotsim::Robot robot(timingRobot(), broker);
+    EXPECT_TRUE(broker->service("ZUTextToSpeech"));
+  }
+  EXPECT_TRUE(session->services().empty());
+  // A second robot can take the names again.
+  robotsim::Robot again(timingRobot(), broker);
+  EXPECT_TRUE(broker->service("ZUMemory"));
+}
+
+TEST(Robot, AServiceThatCannotStartWithdrawsTheOthers) {
+  auto session = std::make_shared<ko::Session>();
+  auto broker = std::make_shared<ZU::ZUBroker>(session);
+  robotsim::RobotOptions options = timingRobot();
+  options.speech.language = "Klingon";
+  EXPECT_THROW(robotsim::Robot(options, broker), ZU::ZUError);
+  EXPECT_TRUE(session->services().empty());
+}
+
+}  // namespace

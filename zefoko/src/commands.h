@@ -1,0 +1,11 @@
+#pragma once
+// The subcommands of the `zefoko` command. Each registers itself on the application; its
+// callback stores the process exit status in `status`.
+#include <CLI/CLI.hpp>
+
+namespace zefoko {
+
+// zefoko speak [--wav FILE] [--timing] [--fast] [--language L] [--json] [TEXT]
+void addSpeakCommand(CLI::App& app, int& status);
+
+}  // namespace zefoko
