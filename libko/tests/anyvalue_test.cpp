@@ -1,5 +1,8 @@
 #include <gtest/gtest.h>
 
+#include <cstdint>
+#include <limits>
+
 #include "ko/anyvalue.hpp"
 
 namespace {
@@ -67,6 +70,22 @@ TEST(AnyValue, FailedConversionsNameBothSignatures) {
   EXPECT_THROW((void)AnyValue(1e300).to<int>(), ko::ConversionError);
   EXPECT_THROW((void)AnyValue(AnyValue::List{1, "a"}).to<std::vector<int>>(), ko::ConversionError);
   EXPECT_THROW((void)AnyValue().asString(), ko::ConversionError);
+}
+
+TEST(AnyValue, NumbersAtTheEdgesOfSixtyFourBits) {
+  // Doubles from 2^63 up have no int64 form: refused, not converted.
+  EXPECT_THROW((void)AnyValue(9.25e18).to<std::int64_t>(), ko::ConversionError);
+  EXPECT_THROW((void)AnyValue(9223372036854775808.0).to<std::int64_t>(), ko::ConversionError);
+  EXPECT_THROW((void)AnyValue(-9.25e18).to<std::int64_t>(), ko::ConversionError);
+  EXPECT_EQ(AnyValue(-9223372036854775808.0).to<std::int64_t>(),
+            std::numeric_limits<std::int64_t>::min());
+  EXPECT_EQ(AnyValue(9.25e18).to<std::uint64_t>(), 9250000000000000000ULL);
+  EXPECT_THROW((void)AnyValue(1.9e19).to<std::uint64_t>(), ko::ConversionError);
+
+  const std::uint64_t big = std::numeric_limits<std::uint64_t>::max();
+  EXPECT_EQ(AnyValue(big).to<std::uint64_t>(), big);
+  EXPECT_THROW((void)AnyValue(big).to<std::int64_t>(), ko::ConversionError);
+  EXPECT_THROW((void)AnyValue(big).to<std::uint32_t>(), ko::ConversionError);
 }
 
 TEST(AnyValue, CopiesAreDeepAndCompareByContent) {

@@ -325,15 +325,26 @@ struct ValueReader<bool> {
 template <std::integral T>
 requires(!std::same_as<T, bool>) struct ValueReader<T> {
   static T read(const AnyValue& v) {
+    // 2^63: the first double outside the range of std::int64_t.
+    constexpr double kTwoPow63 = 9223372036854775808.0;
+    constexpr bool kUnsigned64 = std::is_unsigned_v<T> && sizeof(T) == 8;
     std::int64_t n = 0;
     if (v.kind() == Kind::Int) {
       const auto& i = v.asInt();
-      if (!i.isSigned && i.size == 8 && i.value < 0)
+      if (!i.isSigned && i.size == 8 && i.value < 0) {
+        // An unsigned 64-bit value of 2^63 or more fits only a 64-bit unsigned type.
+        if constexpr (kUnsigned64)
+          return static_cast<T>(static_cast<std::uint64_t>(i.value));
         throwConversion(v, signatureOf<T>());
+      }
       n = i.value;
     } else if (v.kind() == Kind::Float) {
       const double d = v.asFloat().value;
-      if (!(d > -9.3e18 && d < 9.3e18))
+      if constexpr (kUnsigned64) {
+        if (d >= kTwoPow63 && d < 2 * kTwoPow63)
+          return static_cast<T>(d);
+      }
+      if (!(d >= -kTwoPow63 && d < kTwoPow63))
         throwConversion(v, signatureOf<T>());
       n = static_cast<std::int64_t>(d);
     } else {
