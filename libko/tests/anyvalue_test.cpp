@@ -88,6 +88,32 @@ TEST(AnyValue, NumbersAtTheEdgesOfSixtyFourBits) {
   EXPECT_THROW((void)AnyValue(big).to<std::uint32_t>(), ko::ConversionError);
 }
 
+TEST(AnyValue, MovedFromValueIsVoidAndUsable) {
+  for (AnyValue source : {AnyValue::map({{"k", 1}}), AnyValue::tuple({1}), AnyValue::dynamic(1),
+                          AnyValue::varArgs({1}), AnyValue::pointerTo(1)}) {
+    AnyValue moved(std::move(source));
+    EXPECT_TRUE(source.isVoid()) << moved.toString();  // NOLINT(bugprone-use-after-move)
+    const AnyValue copy = source;
+    EXPECT_EQ(copy.toString(), "void");
+    AnyValue assigned;
+    assigned = std::move(moved);
+    EXPECT_TRUE(moved.isVoid());  // NOLINT(bugprone-use-after-move)
+    EXPECT_FALSE(assigned.isVoid());
+  }
+}
+
+TEST(AnyValue, AssigningAnOwnElementIsSafe) {
+  AnyValue a = AnyValue::list({AnyValue::list({1, 2}), "x"});
+  a = a.asList()[0];
+  EXPECT_EQ(a.toString(), "[1, 2]");
+  AnyValue l = AnyValue::list({AnyValue::list({AnyValue::map({{"j", 3}})}), 4});
+  l = std::move(l.asList()[0]);
+  EXPECT_EQ(l.toString(), "[{\"j\": 3}]");
+  AnyValue d = AnyValue::dynamic(AnyValue::list({5}));
+  d = d.asDynamic();
+  EXPECT_EQ(d.toString(), "[5]");
+}
+
 TEST(AnyValue, CopiesAreDeepAndCompareByContent) {
   AnyValue a = AnyValue::list({1, AnyValue::map({{"k", AnyValue::list({"v"})}})});
   AnyValue b = a;

@@ -114,6 +114,26 @@ class AnyValue {
 
   // A void value.
   AnyValue() = default;
+  // A moved-from value is void. Assigning a value that lives inside the target (one of
+  // its own elements) is safe.
+  AnyValue(const AnyValue&) = default;
+  AnyValue(AnyValue&& other) noexcept : data_(std::move(other.data_)) {
+    other.data_.emplace<std::monostate>();
+  }
+  AnyValue& operator=(const AnyValue& other) {
+    if (this != &other)
+      *this = AnyValue(other);
+    return *this;
+  }
+  AnyValue& operator=(AnyValue&& other) noexcept {
+    if (this != &other) {
+      Storage taken(std::move(other.data_));
+      other.data_.emplace<std::monostate>();
+      data_ = std::move(taken);
+    }
+    return *this;
+  }
+  ~AnyValue() = default;
   // A value with no type at all.
   static AnyValue none();
   static AnyValue makeVoid() { return AnyValue(); }
