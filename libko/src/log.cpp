@@ -267,10 +267,26 @@ std::string qualifiedFunctionName(std::string_view pretty) {
       }
     }
   }
+  // An operator's name holds symbols and blanks of its own ("operator<<",
+  // "operator const std::string&"): look for the start before its keyword.
+  std::size_t scanFrom = end;
+  for (std::size_t at = pretty.rfind("operator", end); at != std::string_view::npos;
+       at = at == 0 ? std::string_view::npos : pretty.rfind("operator", at - 1)) {
+    const auto identifierChar = [](char c) {
+      return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '_';
+    };
+    const std::size_t after = at + 8;
+    const bool keyword = (at == 0 || pretty[at - 1] == ' ' || pretty[at - 1] == ':') &&
+                         after < end && !identifierChar(pretty[after]);
+    if (keyword) {
+      scanFrom = at;
+      break;
+    }
+  }
   // The start: the last blank outside template arguments before the name.
   std::size_t begin = 0;
   int depth = 0;
-  for (std::size_t i = end; i-- > 0;) {
+  for (std::size_t i = scanFrom; i-- > 0;) {
     const char c = pretty[i];
     if (c == '>' || c == ')')
       ++depth;

@@ -92,7 +92,17 @@ INSTANTIATE_TEST_SUITE_P(
         NameCase{"ZU::ZUMokuto::ZUMokuto(std::shared_ptr<ZU::ZUBroker>)", "ZU::ZUMokuto::ZUMokuto"},
         NameCase{"ZU::A::run()::<lambda()>", "ZU::A::run"},
         NameCase{"T ZU::B::get() [with T = int]", "ZU::B::get"},
-        NameCase{"const std::string& ZU::ZUValue::str() const", "ZU::ZUValue::str"}));
+        NameCase{"const std::string& ZU::ZUValue::str() const", "ZU::ZUValue::str"},
+        NameCase{"std::ostream& ZU::operator<<(std::ostream&, const ZU::MokutoConfig&)",
+                 "ZU::operator<<"},
+        NameCase{"bool ZU::A::operator<(const ZU::A&) const", "ZU::A::operator<"},
+        NameCase{"std::vector<int> ZU::A::operator>>(int)", "ZU::A::operator>>"},
+        NameCase{"ZU::B* ZU::A::operator->()", "ZU::A::operator->"},
+        NameCase{"void ZU::A::operator()(int)", "ZU::A::operator()"},
+        NameCase{"ZU::ZUValue::operator const TZUValueString&() const",
+                 "ZU::ZUValue::operator const TZUValueString&"},
+        NameCase{"int ZU::Cooperator::operatorCount()", "ZU::Cooperator::operatorCount"},
+        NameCase{"void ZU::A::operator()()::<lambda()>", "ZU::A::operator()"}));
 
 TEST(Log, ConcurrentWritersAndLevelChanges) {
   ko::log::ScopedCapture cap(ko::log::Info);
