@@ -285,6 +285,23 @@ TEST(ZUValueMutableTest, InvalidValueTakesTheAccessorsType) {
   EXPECT_EQ(p.toString(), "[false]");
 }
 
+TEST(ZUValueMutableTest, NewContentReservesItsRoom) {
+  ZUValue s;
+  EXPECT_GE(s.stringRef().capacity(), 64u);
+  ZUValue assigned(3);
+  assigned = "x";
+  EXPECT_GE(assigned.stringRef().capacity(), 64u);
+  ZUValue bin;
+  EXPECT_GE(bin.binaryRef().capacity(), 1024u);
+  ZUValue a;
+  a.arrayPush(1);
+  // Elements keep their addresses while the array grows within its reserve.
+  const ZUValue* first = &a[0];
+  for (int i = 1; i < 32; ++i)
+    a.arrayPush(i);
+  EXPECT_EQ(&a[0], first);
+}
+
 TEST(ZUValueMutableTest, IntIsTurnedIntoBoolOrFloatInPlace) {
   ZUValue b(5);
   b.boolRef() = b.boolRef();
