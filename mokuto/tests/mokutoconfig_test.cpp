@@ -3,6 +3,8 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <cstdint>
+#include <limits>
 #include <map>
 #include <set>
 #include <sstream>
@@ -77,6 +79,35 @@ TEST(MokutoConfigTest, ResetKeepsOnlyTheFirstPackageAndFourEmptyMaps) {
   c.animationsPackages.clear();
   c.reset();
   EXPECT_EQ(c.animationsPackages, std::vector<std::string>{""});
+}
+
+// ---- names of the enumerations ----
+
+TEST(EnumNamesTest, LookupsMatchTheFirstThreeNamesExactly) {
+  const std::map<std::string, ZU::BodyLanguageMode> modes{
+      {"disabled", 0}, {"random", 1},  {"contextual", 2},   {"Random", 3}, {"endOfEnum", 3},
+      {"", 3},         {"random ", 3}, {"contextual_0", 3}, {"RANDOM", 3}};
+  for (const auto& [name, mode] : modes)
+    EXPECT_EQ(ZU::bodyLanguageModeFromStr(name), mode) << name;
+  const std::map<std::string, ZU::PostureFamily> families{
+      {"Standing", 0}, {"Sitting", 1},  {"SittingOnChair", 2},
+      {"Unknown", 3},  {"standing", 3}, {"Stand", 3},
+      {"Sit", 3},      {"", 3}};
+  for (const auto& [name, family] : families)
+    EXPECT_EQ(ZU::postureFamilyFromStr(name), family) << name;
+}
+
+TEST(EnumNamesTest, NamesOfValuesOutsideTheTableAreTheLastName) {
+  EXPECT_STREQ(ZU::bodyLanguageModeToStr(ZU::BODY_LANGUAGE_MODE_RANDOM), "random");
+  EXPECT_STREQ(ZU::postureFamilyToStr(ZU::SittingOnChair), "SittingOnChair");
+  for (std::int32_t out : {3, 4, -1, std::numeric_limits<std::int32_t>::min(),
+                           std::numeric_limits<std::int32_t>::max()}) {
+    EXPECT_STREQ(ZU::bodyLanguageModeToStr(out), "endOfEnum") << out;
+    EXPECT_STREQ(ZU::postureFamilyToStr(out == 3 ? -1 : out), "Unknown") << out;
+  }
+  MokutoConfig c;
+  c.bodyLanguageMode = 7;
+  EXPECT_THAT(printed(c), ::testing::StartsWith("config: bodyLanguageMode: endOfEnum\n"));
 }
 
 // ---- fromZUValue ----
