@@ -339,6 +339,27 @@ TEST(MokutoConfigAnimationsTest, AnimationsOfUnknownPostureAreLoggedAndNotStored
                             "SitOnPod"));
 }
 
+TEST(MokutoConfigAnimationsTest, NonStringsAndUnknownPosturesDoNotEndTheWalk) {
+  ko::log::ScopedCapture cap;
+  MokutoConfig c;
+  c.updateTagsToAnimations(json(R"([["wave", [null, "animations/Crouch/W", "animations/Stand/W"]],
+                                    ["bow", [["animations/Sit/x"], "animations/SitOnPod/B"]]])"));
+  EXPECT_EQ(c.tagsToAnimations[ZU::Standing], (Anims{{"wave", {"animations/Stand/W"}}}));
+  EXPECT_EQ(c.tagsToAnimations[ZU::SittingOnChair], (Anims{{"bow", {"animations/SitOnPod/B"}}}));
+  EXPECT_TRUE(c.tagsToAnimations[ZU::Sitting].empty());
+  EXPECT_TRUE(c.tagsToAnimations[ZU::Unknown].empty());
+  const auto records = cap->records();
+  ASSERT_EQ(records.size(), 3u);
+  EXPECT_EQ(records[0].message, "The animation: \"\" is not formatted as a string");
+  EXPECT_EQ(records[1].function, "ZU::MokutoConfig::xPostureFamilyFormAnimPath");
+  EXPECT_EQ(records[2].message,
+            "The animation: \"[\"animations/Sit/x\"]\" is not formatted as a string");
+  for (const auto& r : records) {
+    EXPECT_EQ(r.level, Error);
+    EXPECT_EQ(r.category, "MokutoConfig");
+  }
+}
+
 // ---- xPostureFamilyFormAnimPath ----
 
 struct PostureCase {
