@@ -186,9 +186,18 @@ INSTANTIATE_TEST_SUITE_P(
 TEST(MokutoConfigFromZUValueTest, GoesOnAfterARejectedPair) {
   ko::log::ScopedCapture cap;
   MokutoConfig c;
-  c.fromZUValue(json(R"([["msPauseBeforeSpeech", -5], ["msPauseBeforeSpeech", 20]])"));
+  c.fromZUValue(json(R"([["msPauseBeforeSpeech", -5], ["bodyLanguageMode", "Random"],
+      ["volume", 1], [5], ["msPauseBeforeSpeech", 20], ["bodyLanguageMode", "random"],
+      ["armsBreathingAllowed", 1], ["armsBreathingAllowed", false]])"));
   EXPECT_EQ(c.msPauseBeforeSpeech, 20);
+  EXPECT_EQ(c.bodyLanguageMode, ZU::BODY_LANGUAGE_MODE_RANDOM);
+  EXPECT_FALSE(c.armsBreathingAllowed);
+  EXPECT_EQ(cap->count(), 4u);
   EXPECT_TRUE(cap->contains("MokutoConfig", Error, "pause time can't be negative."));
+  EXPECT_TRUE(cap->containsPart("MokutoConfig", Error, "Invalid body language mode: \"Random\""));
+  EXPECT_TRUE(cap->contains("MokutoConfig", Error, "uknown key \"volume\" with the value: 1"));
+  EXPECT_TRUE(cap->contains("MokutoConfig", Error,
+                            "uknown key \"armsBreathingAllowed\" with the value: 1"));
 }
 
 TEST(MokutoConfigFromZUValueTest, MalformedValuesAndElementsAreSkippedSilently) {
