@@ -4,6 +4,7 @@
 #include <charconv>
 #include <exception>
 #include <mutex>
+#include <shared_mutex>
 
 #include <boost/asio/post.hpp>
 #include <boost/asio/steady_timer.hpp>
@@ -92,12 +93,18 @@ bool EventLoop::isInThisLoop() const noexcept {
 void EventLoop::post(std::function<void()> job) {
   if (!job)
     return;
-  if (impl_->stopped.load())
-    return;  // dropping the job breaks its promise
-  boost::asio::post(impl_->io, [impl = impl_.get(), job = std::move(job)]() mutable {
-    if (!impl->stopped.load())
-      runJob(*impl, job);
-  });
+  {
+    std::shared_lock lock(impl_->postMutex);
+    if (!impl_->stopped.load()) {
+      boost::asio::post(impl_->io, [impl = impl_.get(), job = std::move(job)]() mutable {
+        if (!impl->stopped.load())
+          runJob(*impl, job);
+      });
+      return;
+    }
+  }
+  // A stopped loop drops the job, outside the lock: that breaks its promise, whose
+  // continuations may post again.
 }
 
 void EventLoop::postDelayed(std::function<void()> job, std::chrono::steady_clock::duration delay) {
@@ -130,6 +137,7 @@ void EventLoop::postDelayed(std::function<void()> job, std::chrono::steady_clock
 void EventLoop::stop() {
   std::unordered_map<std::uint64_t, std::function<void()>> listeners;
   {
+    std::unique_lock postLock(impl_->postMutex);
     std::lock_guard lock(impl_->mutex);
     if (impl_->stopped.exchange(true))
       return;

@@ -7,6 +7,7 @@
 #include <memory>
 #include <mutex>
 #include <optional>
+#include <shared_mutex>
 #include <string>
 #include <thread>
 #include <unordered_map>
@@ -37,6 +38,9 @@ struct EventLoop::Impl : std::enable_shared_from_this<EventLoop::Impl> {
   std::vector<std::thread> threads;
   std::atomic<bool> stopped{false};
 
+  // Shared by the posts, exclusive for the stop: a job is queued before the stop (and the
+  // draining threads drop it) or not at all, never after the threads have left.
+  std::shared_mutex postMutex;
   std::mutex mutex;  // listeners, stop
   std::unordered_map<std::uint64_t, std::function<void()>> stopListeners;
   std::uint64_t nextToken = 1;

@@ -6,6 +6,8 @@
 #include <atomic>
 #include <cstdlib>
 #include <stdexcept>
+#include <thread>
+#include <vector>
 
 #include "ko/log.hpp"
 #include "ko_test_helpers.hpp"
@@ -83,6 +85,36 @@ TEST(EventLoop, StopDropsQueuedAndLaterJobs) {
   EXPECT_EQ(queued.error(10000), "Promise broken");
   EXPECT_EQ(delayed.error(10000), "Promise broken");
   EXPECT_EQ(loop->async([] { return 3; }).error(0), "Promise broken");
+}
+
+// A job posted while another thread stops the loop either runs or is dropped; either way
+// its future finishes while the loop is still there.
+TEST(EventLoop, EveryJobPostedDuringAStopFinishes) {
+  constexpr int kRounds = 200;
+  constexpr std::size_t kPosters = 2;
+  constexpr int kJobs = 400;
+  for (int round = 0; round < kRounds; ++round) {
+    auto loop = std::make_shared<ko::EventLoop>("racing", 1);
+    std::vector<std::vector<ko::Future<int>>> futures(kPosters);
+    ko::test::Counter posted;
+    std::vector<std::thread> posters;
+    for (std::size_t p = 0; p < kPosters; ++p) {
+      posters.emplace_back([&, p] {
+        for (int i = 0; i < kJobs; ++i) {
+          futures[p].push_back(loop->async([i] { return i; }));
+          posted.increment();
+        }
+      });
+    }
+    // Stop while both threads are still posting.
+    EXPECT_TRUE(posted.waitFor(kJobs / 4));
+    loop->stop();
+    for (auto& t : posters)
+      t.join();
+    for (const auto& list : futures)
+      for (const auto& f : list)
+        ASSERT_NE(f.wait(10000), FutureState::Timeout) << "round " << round;
+  }
 }
 
 TEST(EventLoop, DestructionCancelsDelayedJobs) {
