@@ -1,6 +1,7 @@
 #include "zu/zumodulecore.h"
 
 #include <chrono>
+#include <exception>
 #include <limits>
 #include <utility>
 
@@ -318,8 +319,15 @@ void ZUModuleCore::xRunTask(const std::shared_ptr<ZUPCallTask>& task, unsigned m
   std::string error;
   {
     CurrentTaskScope scope(task);
-    const ko::Future<ko::AnyValue> result = metaCall(methodId, args, ko::MetaCallType::Direct);
-    error = result.error();
+    // An override of metaCall may throw: the task ends all the same.
+    try {
+      const ko::Future<ko::AnyValue> result = metaCall(methodId, args, ko::MetaCallType::Direct);
+      error = result.error();
+    } catch (const std::exception& e) {
+      error = e.what();
+    } catch (...) {
+      error = "Unknown exception";
+    }
     xRemoveTask(task->id());
   }
   if (error.empty()) {

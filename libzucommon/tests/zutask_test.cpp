@@ -5,6 +5,7 @@
 #include <memory>
 #include <ostream>
 #include <set>
+#include <stdexcept>
 #include <string>
 #include <thread>
 #include <vector>
@@ -140,6 +141,29 @@ TEST_F(TaskTest, ACallWithArgumentsThatDoNotConvertEndsItsTask) {
   EXPECT_FALSE(greeter_->wait(id, 0));
   EXPECT_FALSE(greeter_->isRunning(id));
   EXPECT_TRUE(cap->containsPart("zucommon.zumodulecore", ko::log::Warning, "Cannot convert"));
+}
+
+// A module whose own call by id throws for one method, as an override of it may.
+class Refusing : public Greeter {
+ public:
+  using Greeter::Greeter;
+  ko::Future<AnyValue> metaCall(unsigned methodId, const std::vector<AnyValue>& args,
+                                ko::MetaCallType callType) override {
+    const ko::MetaMethod* method = metaObject().method(methodId);
+    if (method && method->name == "add")
+      throw std::runtime_error("call refused");
+    return Greeter::metaCall(methodId, args, callType);
+  }
+};
+
+TEST(TaskEnd, ACallByIdThatThrowsStillEndsItsTask) {
+  zutest::Process process;
+  const auto refusing = ZU::ZUModule::createModule<Refusing>(process.broker, "Refusing");
+  ko::log::ScopedCapture cap;
+  const int id = refusing->pCall(callList({"add", 1, 2}));
+  EXPECT_FALSE(refusing->wait(id, zutest::kBoundMs));
+  EXPECT_FALSE(refusing->isRunning(id));
+  EXPECT_TRUE(cap->containsPart("zucommon.zumodulecore", ko::log::Warning, "call refused"));
 }
 
 TEST_F(TaskTest, PostsFromManyThreadsGetDistinctIdsAndAllEnd) {
