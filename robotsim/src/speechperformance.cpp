@@ -16,10 +16,15 @@ bool SpeechPerformance::isCancelled() const {
 }
 
 void SpeechPerformance::appendAudio(const std::int16_t* samples, std::size_t count) {
-  if (!fKeepAudio || count == 0)
+  if (count == 0)
     return;
-  std::lock_guard lock(fMutex);
-  fAudio.insert(fAudio.end(), samples, samples + count);
+  {
+    std::lock_guard lock(fMutex);
+    fProduced += count;
+    if (fKeepAudio)
+      fAudio.insert(fAudio.end(), samples, samples + count);
+  }
+  fChanged.notify_all();
 }
 
 void SpeechPerformance::xPlaceMarksUpTo(std::size_t end, std::uint64_t sample) {
@@ -51,6 +56,7 @@ void SpeechPerformance::finish(std::uint64_t totalSamples) {
       totalSamples = std::max(totalSamples, fMarks.back());
     xPlaceMarksUpTo(fMarkCount, totalSamples);
     fTotal = totalSamples;
+    fProduced = std::max(fProduced, totalSamples);
     fFinished = true;
   }
   fChanged.notify_all();
@@ -86,6 +92,19 @@ std::optional<std::uint64_t> SpeechPerformance::waitForMark(std::size_t index) {
   if (fCancelled || index >= fMarks.size())
     return std::nullopt;
   return fMarks[index];
+}
+
+std::optional<std::uint64_t> SpeechPerformance::waitForAudio(std::uint64_t samples) {
+  std::unique_lock lock(fMutex);
+  fChanged.wait(lock, [&] { return fCancelled || fFinished || fProduced >= samples; });
+  if (fCancelled)
+    return std::nullopt;
+  return fProduced;
+}
+
+std::uint64_t SpeechPerformance::producedSamples() const {
+  std::lock_guard lock(fMutex);
+  return fProduced;
 }
 
 std::optional<std::uint64_t> SpeechPerformance::waitForEnd() {

@@ -41,6 +41,11 @@ class SpeechPerformance {
   // The position of mark `index` once known; nothing when the text is cancelled or its
   // synthesis failed first.
   std::optional<std::uint64_t> waitForMark(std::size_t index);
+  // Waits until `samples` of audio are synthesised (or synthesis ended); answers how many
+  // are, nothing when the text was cancelled first.
+  std::optional<std::uint64_t> waitForAudio(std::uint64_t samples);
+  // How much audio is synthesised so far (all of it once synthesis is done).
+  std::uint64_t producedSamples() const;
   // The length of the text once synthesis is done; nothing as above.
   std::optional<std::uint64_t> waitForEnd();
   // Waits until `deadline`; false when the text was cancelled first.
@@ -68,6 +73,7 @@ class SpeechPerformance {
   bool fFinished = false;
   std::string fError;
   std::uint64_t fTotal = 0;
+  std::uint64_t fProduced = 0;
   std::vector<std::uint64_t> fMarks;  // positions of the marks known so far, in order
   std::vector<std::size_t> fPlaced;
   std::vector<std::int16_t> fAudio;

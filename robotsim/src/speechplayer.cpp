@@ -1,14 +1,32 @@
 #include "speechplayer.h"
 
+#include <pthread.h>
+#include <sched.h>
+
 #include <algorithm>
 #include <cmath>
+#include <cstring>
 #include <utility>
+
+#include "ko/log.hpp"
 
 namespace robotsim {
 
 namespace {
 
 using SteadyClock = std::chrono::steady_clock;
+
+// The player is an audio thread: it asks for a real-time priority, so that a busy machine
+// delays its bookmarks as little as possible. Without the right to it, it plays as it is.
+void raisePlayerPriority() {
+  sched_param param{};
+  param.sched_priority = sched_get_priority_min(SCHED_FIFO);
+  const int error = pthread_setschedparam(pthread_self(), SCHED_FIFO, &param);
+  if (error != 0) {
+    KO_LOG_VERBOSE("robotsim.texttospeech")
+        << "The speech player runs without real-time priority: " << std::strerror(error);
+  }
+}
 
 std::int64_t microseconds(SteadyClock::duration d) {
   return std::chrono::duration_cast<std::chrono::microseconds>(d).count();
@@ -21,6 +39,7 @@ SpeechPlayer::SpeechPlayer(SpeechPlayerListener& listener, double playbackRate,
     : fListener(listener),
       fRate(std::isfinite(playbackRate) && playbackRate > 0 ? playbackRate : 0.0),
       fRecording(std::move(recording)),
+      fNotifier([this] { xRunNotifier(); }),
       fThread([this] { xRun(); }) {}
 
 SpeechPlayer::~SpeechPlayer() {
@@ -31,6 +50,36 @@ SpeechPlayer::~SpeechPlayer() {
   stopAll();
   fQueued.notify_all();
   fThread.join();
+  {
+    std::lock_guard lock(fNotifyMutex);
+    fNotifyQuit = true;
+  }
+  fNotifyQueued.notify_all();
+  fNotifier.join();
+}
+
+void SpeechPlayer::xNotify(std::function<void()> job) {
+  {
+    std::lock_guard lock(fNotifyMutex);
+    fNotifications.push_back(std::move(job));
+  }
+  fNotifyQueued.notify_one();
+}
+
+void SpeechPlayer::xRunNotifier() {
+  raisePlayerPriority();
+  for (;;) {
+    std::function<void()> job;
+    {
+      std::unique_lock lock(fNotifyMutex);
+      fNotifyQueued.wait(lock, [this] { return fNotifyQuit || !fNotifications.empty(); });
+      if (fNotifications.empty())
+        return;
+      job = std::move(fNotifications.front());
+      fNotifications.pop_front();
+    }
+    job();
+  }
 }
 
 void SpeechPlayer::enqueue(std::shared_ptr<SpeechUtterance> utterance) {
@@ -43,7 +92,7 @@ void SpeechPlayer::enqueue(std::shared_ptr<SpeechUtterance> utterance) {
   }
   if (utterance) {
     utterance->performance->cancel();
-    xEnd(*utterance, true, 0, {});
+    xEnd(utterance, true, 0, {});
     return;
   }
   fQueued.notify_one();
@@ -65,7 +114,7 @@ bool SpeechPlayer::stop(int id) {
     fQueue.erase(it);
   }
   queued->performance->cancel();
-  xEnd(*queued, true, 0, {});
+  xEnd(queued, true, 0, {});
   return true;
 }
 
@@ -79,11 +128,12 @@ void SpeechPlayer::stopAll() {
   }
   for (const auto& u : queued) {
     u->performance->cancel();
-    xEnd(*u, true, 0, {});
+    xEnd(u, true, 0, {});
   }
 }
 
 void SpeechPlayer::xRun() {
+  raisePlayerPriority();
   for (;;) {
     std::shared_ptr<SpeechUtterance> utterance;
     {
@@ -96,15 +146,16 @@ void SpeechPlayer::xRun() {
       fCurrent = utterance;
     }
     if (utterance->performance->isCancelled())
-      xEnd(*utterance, true, 0, {});
+      xEnd(utterance, true, 0, {});
     else
-      xPlay(*utterance);
+      xPlay(utterance);
     std::lock_guard lock(fMutex);
     fCurrent.reset();
   }
 }
 
-void SpeechPlayer::xPlay(SpeechUtterance& utterance) {
+void SpeechPlayer::xPlay(const std::shared_ptr<SpeechUtterance>& shared) {
+  SpeechUtterance& utterance = *shared;
   SpeechPerformance& performance = *utterance.performance;
   const std::int64_t hz = performance.sampleRate();
   const bool realTime = fRate > 0;
@@ -126,7 +177,13 @@ void SpeechPlayer::xPlay(SpeechUtterance& utterance) {
   if (fRecording && realTime && fLastEnd != SteadyClock::time_point{})
     fRecording->appendSilence(samplesOf(clockUs(fLastEnd)));
 
-  fListener.onStarted(utterance);
+  // Like a sound card, playback begins once some audio is there, and its clock stands
+  // still whenever synthesis falls behind it.
+  if (!performance.waitForAudio(static_cast<std::uint64_t>(hz) / 10)) {
+    xEnd(shared, true, 0, {});
+    return;
+  }
+  xNotify([this, shared] { fListener.onStarted(*shared); });
   SteadyClock::time_point origin = SteadyClock::now();
   std::vector<std::pair<std::uint64_t, std::uint64_t>> holds;
   bool stopped = false;
@@ -134,7 +191,15 @@ void SpeechPlayer::xPlay(SpeechUtterance& utterance) {
 
   for (std::size_t i = 0; i < utterance.script.marks.size(); ++i) {
     const SpeechMark& mark = utterance.script.marks[i];
+    const std::int64_t audioBefore = audioUs(performance.producedSamples());
+    const std::int64_t clockBefore = clockUs(origin);
     const auto position = performance.waitForMark(i);
+    if (realTime) {
+      const std::int64_t stall = clockUs(origin) - std::max(audioBefore, clockBefore);
+      if (stall > 0 && clockUs(origin) > audioBefore)
+        origin += std::chrono::microseconds(
+            static_cast<std::int64_t>(static_cast<double>(stall) / fRate));
+    }
     if (!position) {
       stopped = performance.isCancelled();
       if (!stopped)
@@ -156,10 +221,12 @@ void SpeechPlayer::xPlay(SpeechUtterance& utterance) {
     if (mark.blocking) {
       const std::uint64_t hold = performance.beginHold();
       const auto holdStart = SteadyClock::now();
-      fListener.onBlockingBookmark(utterance, mark.number)
-          .then([synthesis = utterance.performance, hold](const ko::Future<void>&) {
-            synthesis->releaseHold(hold);
-          });
+      xNotify([this, shared, hold, number = mark.number] {
+        fListener.onBlockingBookmark(*shared, number)
+            .then([synthesis = shared->performance, hold](const ko::Future<void>&) {
+              synthesis->releaseHold(hold);
+            });
+      });
       released = performance.waitForRelease(hold);
       const auto held = SteadyClock::now() - holdStart;
       record.heldUs = microseconds(held);
@@ -167,10 +234,10 @@ void SpeechPlayer::xPlay(SpeechUtterance& utterance) {
         origin += held;
       holds.emplace_back(*position, samplesOf(record.heldUs));
     } else {
-      fListener.onBookmark(utterance, mark.number);
+      xNotify([this, shared, number = mark.number] { fListener.onBookmark(*shared, number); });
     }
     utterance.marks.push_back(record);
-    fListener.onMarkDone(utterance, record);
+    xNotify([this, shared, record] { fListener.onMarkDone(*shared, record); });
     if (!released) {
       stopped = true;
       break;
@@ -195,17 +262,19 @@ void SpeechPlayer::xPlay(SpeechUtterance& utterance) {
 
   if (fRecording)
     fRecording->appendText(performance.audio(), samplesOf(playedUs), holds);
-  xEnd(utterance, stopped, playedUs, error);
+  xEnd(shared, stopped, playedUs, error);
   fLastEnd = SteadyClock::now();
 }
 
-void SpeechPlayer::xEnd(SpeechUtterance& utterance, bool stopped, std::int64_t playedUs,
-                        const std::string& error) {
-  fListener.onEnded(utterance, stopped, playedUs, error);
-  if (error.empty())
-    utterance.ended.trySetValue(stopped);
-  else
-    utterance.ended.trySetError(error);
+void SpeechPlayer::xEnd(const std::shared_ptr<SpeechUtterance>& utterance, bool stopped,
+                        std::int64_t playedUs, const std::string& error) {
+  xNotify([this, utterance, stopped, playedUs, error] {
+    fListener.onEnded(*utterance, stopped, playedUs, error);
+    if (error.empty())
+      utterance->ended.trySetValue(stopped);
+    else
+      utterance->ended.trySetError(error);
+  });
 }
 
 }  // namespace robotsim

@@ -3,14 +3,16 @@
 // with a real-time playback clock, and reaches each bookmark at its audio time.
 //
 // One thread of its own plays; it sleeps until each mark's deadline on the steady clock,
-// then tells its listener. At a blocking mark it asks the listener for the hold and stops
-// its clock until the hold is released. Any thread may queue a text or stop one; a text
-// stopped while it waits in the queue ends in the stopping thread.
+// then hands the news to a second thread, the notifier, which tells the listener in
+// order, so that the time of the next mark never waits for a listener. At a blocking mark
+// the player stops its clock until the notifier's hold is released. Both threads ask for
+// a real-time priority. Any thread may queue a text or stop one.
 
 #include <chrono>
 #include <condition_variable>
 #include <cstdint>
 #include <deque>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <string>
@@ -43,8 +45,7 @@ struct SpeechUtterance {
   std::vector<SpeechMarkRecord> marks;
 };
 
-// What the player tells, from its thread (onEnded also from a thread that stops a text
-// that waits in the queue).
+// What the player tells, in order, from its notifier thread.
 class SpeechPlayerListener {
  public:
   virtual ~SpeechPlayerListener() = default;
@@ -79,8 +80,10 @@ class SpeechPlayer {
 
  private:
   void xRun();
-  void xPlay(SpeechUtterance& utterance);
-  void xEnd(SpeechUtterance& utterance, bool stopped, std::int64_t playedUs,
+  void xRunNotifier();
+  void xNotify(std::function<void()> job);
+  void xPlay(const std::shared_ptr<SpeechUtterance>& utterance);
+  void xEnd(const std::shared_ptr<SpeechUtterance>& utterance, bool stopped, std::int64_t playedUs,
             const std::string& error);
 
   SpeechPlayerListener& fListener;
@@ -94,6 +97,12 @@ class SpeechPlayer {
   bool fQuit = false;
   // The player thread's only: when the last text ended, for the silence between texts.
   std::chrono::steady_clock::time_point fLastEnd{};
+
+  std::mutex fNotifyMutex;
+  std::condition_variable fNotifyQueued;
+  std::deque<std::function<void()>> fNotifications;
+  bool fNotifyQuit = false;
+  std::thread fNotifier;
   std::thread fThread;
 };
 

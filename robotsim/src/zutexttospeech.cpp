@@ -111,7 +111,8 @@ ZUTextToSpeech::ZUTextToSpeech(const std::shared_ptr<ZU::ZUBroker>& broker, cons
   fSettings.language = fOptions.language;
   fSettings.notifications = fOptions.notifications;
 
-  setEventLoop(std::make_shared<ko::EventLoop>(name, 4));
+  // One thread: posted texts are spoken in the order they were posted.
+  setEventLoop(std::make_shared<ko::EventLoop>(name, 1));
   fHoldLoop = std::make_shared<ko::EventLoop>(name + ".mrkpause", 2);
   fRecording = std::make_shared<SpeechRecording>(fSynthesizer->sampleRate());
   fListener = std::make_unique<Listener>(*this);

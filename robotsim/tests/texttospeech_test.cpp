@@ -349,12 +349,14 @@ TEST(TextToSpeechTiming, AStopBeforeTheTextBeginsEndsItWithoutStarting) {
   Robot robot(timing(1.0));
   const int running = robot.tts.post_say(std::string(200, 'a') + " \\mrk=1\\ end");
   const int queued = robot.tts.post_say("never \\mrk=2\\ heard");
+  ASSERT_TRUE(robot.waitForStatus(running, "started"));
   robot.tts.stop(queued);
+  robot.tts.stop(running);
+  EXPECT_FALSE(robot.tts.wait(running, 10'000));
   EXPECT_FALSE(robot.tts.wait(queued, 10'000));
   ASSERT_TRUE(robot.waitForStatus(queued, "stopped"));
+  EXPECT_EQ(robot.statuses(running), (std::vector<std::string>{"started", "stopped"}));
   EXPECT_EQ(robot.statuses(queued), std::vector<std::string>{"stopped"});
-  robot.tts.stop(running);
-  ASSERT_TRUE(robot.waitForStatus(running, "stopped"));
   EXPECT_EQ(robot.bookmarks(), std::vector<int>{});
 }
 

@@ -6,11 +6,12 @@
 // through ZUMemory, holds the speech at each "mrkpause" bookmark while the blocking
 // bookmark handler's "_mrkpauseCallback" runs, and keeps a recording of what it played.
 //
-// Threads: calls arrive on ko threads; posted says run on the module's own event loop and
-// wait there until their text ends; texts are played one at a time by the player thread,
-// which raises the events and makes the blocking calls (each on a thread of its own loop,
-// so that stopping a text never waits for the handler); espeak-ng runs on the one thread
-// of the process that owns it. The settings and the table of texts in progress are
+// Threads: calls arrive on ko threads; posted says run one at a time, in the order they
+// were posted, on the module's own one-thread event loop and wait there until their text
+// ends (a posted call that has not begun yet is stopped by its task's stop flag); texts are played
+// one at a time by the player thread, which raises the events and makes the blocking calls (each on
+// a thread of its own loop, so that stopping a text never waits for the handler); espeak-ng runs on
+// the one thread of the process that owns it. The settings and the table of texts in progress are
 // guarded by one mutex.
 
 #include <cstdint>
