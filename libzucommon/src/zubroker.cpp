@@ -49,7 +49,8 @@ void ZUBroker::registerModule(const std::shared_ptr<ZUModuleCore>& module) {
   if (!module)
     ZU_THROW_ERROR("ZUBroker", "registerModule", "Can't register module ''no module given");
   const std::string& name = module->getName();
-  std::lock_guard lock(fMutex);
+  // The session keeps names unique and announces the new service to its subscribers, who
+  // may use this broker: no lock of ours is held meanwhile.
   unsigned serviceId = 0;
   try {
     serviceId = fSession->registerService(name, ko::GenericObject::makeWeak(module, name));
@@ -60,34 +61,39 @@ void ZUBroker::registerModule(const std::shared_ptr<ZUModuleCore>& module) {
     ZU_THROW_ERROR("ZUBroker", "registerModule",
                    "Can't register module '" + name + "'" + std::string(e.what()));
   }
-  fModules[name] = Registration{module, serviceId};
+  {
+    std::lock_guard lock(fMutex);
+    fModules[name] = Registration{module, serviceId};
+  }
   module->setParentBroker(weak_from_this());
 }
 
 bool ZUBroker::unregisterModule(const std::string& name) {
-  std::shared_ptr<ZUModuleCore> released;  // may be the last hold: dropped unlocked
-  bool done = false;
+  std::optional<Registration> registration;
   {
     std::lock_guard lock(fMutex);
-    done = xUnregisterModule(name, released);
+    const auto it = fModules.find(name);
+    if (it != fModules.end()) {
+      registration = std::move(it->second);
+      fModules.erase(it);
+    }
   }
+  // Unlocked: the session announces the withdrawal to its subscribers, and the broker's
+  // hold on the module, perhaps the last, goes at the end.
+  const bool done = xUnregisterModule(name, registration);
   if (!done) {
     KO_LOG_ERROR(kCategory) << "ZUBroker::unregisterModule can't unregister module: " << name;
   }
   return done;
 }
 
-bool ZUBroker::xUnregisterModule(const std::string& name, std::shared_ptr<ZUModuleCore>& released) {
+bool ZUBroker::xUnregisterModule(const std::string& name,
+                                 const std::optional<Registration>& registration) {
   try {
-    const auto it = fModules.find(name);
-    if (it == fModules.end()) {
+    if (registration)
+      fSession->unregisterService(registration->serviceId);
+    else
       fSession->unregisterService(name);
-      return true;
-    }
-    const unsigned serviceId = it->second.serviceId;
-    released = std::move(it->second.module);
-    fModules.erase(it);
-    fSession->unregisterService(serviceId);
     return true;
   } catch (const std::exception& e) {
     KO_LOG_ERROR(kCategory) << "Cannot unregister module " << name << " : " << e.what();

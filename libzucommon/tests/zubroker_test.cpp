@@ -3,12 +3,14 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <atomic>
 #include <climits>
 #include <cstdlib>
 #include <mutex>
 #include <optional>
 #include <ostream>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "ko/future.hpp"
@@ -88,6 +90,33 @@ TEST(BrokerTest, UnregisteringReleasesTheModule) {
   ASSERT_FALSE(watch.expired());  // the broker holds it while it is registered
   EXPECT_TRUE(process.broker->unregisterModule("Greeter"));
   EXPECT_TRUE(watch.expired());
+  EXPECT_TRUE(process.session->services().empty());
+}
+
+// The session announces registrations to its subscribers; one that asks the broker (here
+// from another thread) is answered while the announcement runs.
+TEST(BrokerTest, TheSessionsSubscribersMayUseTheBroker) {
+  zutest::Process process;
+  std::vector<std::thread> askers;  // joined once the broker has returned
+  std::atomic<int> answers{0};
+  const auto askBroker = [&](const std::string& name) {
+    auto answered = std::make_shared<zutest::Gate>();
+    askers.emplace_back([&process, answered, name] {
+      (void)process.broker->getModuleByName(name);
+      answered->open();
+    });
+    if (answered->wait())
+      ++answers;
+  };
+  process.session->serviceRegistered.connect(
+      [&](unsigned, const std::string& name) { askBroker(name); });
+  process.session->serviceUnregistered.connect(
+      [&](unsigned, const std::string& name) { askBroker(name); });
+  ZU::ZUModule::createModule<Greeter>(process.broker, "Greeter");
+  EXPECT_TRUE(process.broker->unregisterModule("Greeter"));
+  for (auto& t : askers)
+    t.join();
+  EXPECT_EQ(answers, 2);
   EXPECT_TRUE(process.session->services().empty());
 }
 

@@ -5,6 +5,7 @@
 #include <map>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -19,8 +20,9 @@ class ZUBrokerManager;
 // The registration of a process's modules with a ko session, and the lookup of services.
 // A registered module is kept alive by the broker until it is unregistered; the session
 // holds a weak handle on it, so the proxies of other services never keep it alive. All
-// functions are thread-safe; registration and unregistration are serialised by the
-// broker's lock, lookups take no lock of the broker.
+// functions are thread-safe, from any thread: the session keeps the names unique, and the
+// broker's lock guards only its table of modules, never held while the session runs its
+// subscribers (who may use the broker); lookups take no lock of the broker.
 class ZUBroker : public std::enable_shared_from_this<ZUBroker> {
  public:
   // `manager`: the broker manager that the broker carries; by default the process's.
@@ -61,8 +63,9 @@ class ZUBroker : public std::enable_shared_from_this<ZUBroker> {
     std::shared_ptr<ZUModuleCore> module;
     unsigned serviceId = 0;
   };
-  // With fMutex held; answers the released module (destroyed by the caller, unlocked).
-  bool xUnregisterModule(const std::string& name, std::shared_ptr<ZUModuleCore>& released);
+  // Withdraws the service, without the broker's lock: the one of `registration` when the
+  // broker registered it, otherwise the session's service of that name.
+  bool xUnregisterModule(const std::string& name, const std::optional<Registration>& registration);
 
   const std::string fName;
   const std::shared_ptr<ko::Session> fSession;
