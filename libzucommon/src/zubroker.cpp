@@ -184,14 +184,20 @@ void ZUBrokerManager::addBroker(const std::shared_ptr<ZUBroker>& broker) {
   if (!broker)
     return;
   std::lock_guard lock(fMutex);
-  if (std::find(fBrokers.begin(), fBrokers.end(), broker) == fBrokers.end())
-    fBrokers.push_back(broker);
+  xDropExpired();
+  for (const auto& b : fBrokers)
+    if (b.lock() == broker)
+      return;
+  fBrokers.push_back(broker);
 }
 
 void ZUBrokerManager::removeBroker(const std::shared_ptr<ZUBroker>& broker) {
   std::lock_guard lock(fMutex);
-  const auto it = std::find(fBrokers.begin(), fBrokers.end(), broker);
-  if (it == fBrokers.end()) {
+  xDropExpired();
+  const auto it =
+      std::find_if(fBrokers.begin(), fBrokers.end(),
+                   [&](const std::weak_ptr<ZUBroker>& b) { return b.lock() == broker; });
+  if (!broker || it == fBrokers.end()) {
     KO_LOG_WARNING("ZUBroker.manager")
         << "Broker " << (broker ? broker->getName() : std::string("(null)")) << " is not managed";
     return;
@@ -201,20 +207,33 @@ void ZUBrokerManager::removeBroker(const std::shared_ptr<ZUBroker>& broker) {
 
 std::shared_ptr<ZUBroker> ZUBrokerManager::getBroker() const {
   std::lock_guard lock(fMutex);
-  return fBrokers.empty() ? nullptr : fBrokers.front();
+  for (const auto& b : fBrokers)
+    if (auto broker = b.lock())
+      return broker;
+  return nullptr;
 }
 
 std::shared_ptr<ZUBroker> ZUBrokerManager::getBrokerByName(const std::string& name) const {
   std::lock_guard lock(fMutex);
   for (const auto& b : fBrokers)
-    if (b->getName() == name)
-      return b;
+    if (auto broker = b.lock(); broker && broker->getName() == name)
+      return broker;
   return nullptr;
 }
 
 std::vector<std::shared_ptr<ZUBroker>> ZUBrokerManager::getBrokers() const {
   std::lock_guard lock(fMutex);
-  return fBrokers;
+  std::vector<std::shared_ptr<ZUBroker>> out;
+  for (const auto& b : fBrokers)
+    if (auto broker = b.lock())
+      out.push_back(std::move(broker));
+  return out;
+}
+
+void ZUBrokerManager::xDropExpired() {
+  fBrokers.erase(std::remove_if(fBrokers.begin(), fBrokers.end(),
+                                [](const std::weak_ptr<ZUBroker>& b) { return b.expired(); }),
+                 fBrokers.end());
 }
 
 }  // namespace ZU

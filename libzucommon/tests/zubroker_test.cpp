@@ -222,4 +222,16 @@ TEST(BrokerManagerTest, KeepsEachBrokerOnce) {
   EXPECT_TRUE(cap->contains("ZUBroker.manager", ko::log::Warning, "Broker first is not managed"));
 }
 
+// A broker carries its manager: the manager must not keep its brokers alive in turn.
+TEST(BrokerManagerTest, ABrokerThatIsGoneLeavesTheSet) {
+  auto manager = std::make_shared<ZU::ZUBrokerManager>();
+  auto broker = std::make_shared<ZU::ZUBroker>(std::make_shared<ko::Session>(), "gone", manager);
+  std::weak_ptr<ZU::ZUBroker> watch = broker;
+  manager->addBroker(broker);
+  broker.reset();
+  EXPECT_TRUE(watch.expired());
+  EXPECT_EQ(manager->getBroker(), nullptr);
+  EXPECT_TRUE(manager->getBrokers().empty());
+}
+
 }  // namespace

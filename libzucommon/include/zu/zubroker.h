@@ -95,8 +95,12 @@ class ZUBrokerManager {
   std::vector<std::shared_ptr<ZUBroker>> getBrokers() const;
 
  private:
+  // With fMutex held.
+  void xDropExpired();
+
   mutable std::mutex fMutex;
-  std::vector<std::shared_ptr<ZUBroker>> fBrokers;
+  // Weak: a broker carries its manager, and a broker that is gone leaves the set.
+  std::vector<std::weak_ptr<ZUBroker>> fBrokers;
 };
 
 }  // namespace ZU
