@@ -121,7 +121,7 @@ class Registry {
       if (parseSpec(env, rules))
         rules_ = std::move(rules);
       else
-        std::fprintf(stderr, "ZEFOKO_LOG: ignoring malformed level specification \"%s\"\n", env);
+        std::fprintf(stderr, "ZEFOKO_LOG: ignoring malformed level rules \"%s\"\n", env);
     }
   }
 
