@@ -328,14 +328,17 @@ void ZUModuleCore::xRunTask(const std::shared_ptr<ZUPCallTask>& task, unsigned m
     } catch (...) {
       error = "Unknown exception";
     }
+    // Logged before the task leaves the table, so that whoever sees it gone sees the line.
+    if (!error.empty()) {
+      KO_LOG_WARNING(kCategory) << fName << " :Task " << task->id() << " (" << task->methodName()
+                                << ") failed: " << error;
+    }
     xRemoveTask(task->id());
   }
   if (error.empty()) {
     task->fPromise.trySetValue();
     return;
   }
-  KO_LOG_WARNING(kCategory) << fName << " :Task " << task->id() << " (" << task->methodName()
-                            << ") failed: " << error;
   task->fPromise.trySetError(error);
 }
 
