@@ -68,14 +68,18 @@ void ZUProxy::xThrowConversionError(std::string_view method,
                  "Return argument conversion error: " + std::string(e.what()));
 }
 
-ko::AnyValue ZUProxy::xCall(std::string_view method, const std::vector<ko::AnyValue>& args,
-                            const char* goneText) const {
-  if (!fObject)
-    xThrowGone(method, goneText);
-  // Held for the whole call: the service cannot go away under it.
-  const std::shared_ptr<ko::DynamicObject> object = fObject->dynamicObject();
+std::shared_ptr<ko::DynamicObject> ZUProxy::xLiveObject(std::string_view method,
+                                                        const char* goneText) const {
+  std::shared_ptr<ko::DynamicObject> object = fObject ? fObject->dynamicObject() : nullptr;
   if (!object)
     xThrowGone(method, goneText);
+  return object;
+}
+
+ko::AnyValue ZUProxy::xCall(std::string_view method, const std::vector<ko::AnyValue>& args,
+                            const char* goneText) const {
+  // Held for the whole call: the service cannot go away under it.
+  const std::shared_ptr<ko::DynamicObject> object = xLiveObject(method, goneText);
 
   // A name with one method of the right arity is the common case; overloads and every
   // failure go through ko's resolution.
@@ -102,11 +106,7 @@ ko::AnyValue ZUProxy::xCall(std::string_view method, const std::vector<ko::AnyVa
 
 int ZUProxy::xPCall(std::string_view method, const std::vector<ko::AnyValue>& args,
                     const char* goneText) const {
-  if (!fObject)
-    xThrowGone(method, goneText);
-  const std::shared_ptr<ko::DynamicObject> object = fObject->dynamicObject();
-  if (!object)
-    xThrowGone(method, goneText);
+  const std::shared_ptr<ko::DynamicObject> object = xLiveObject(method, goneText);
 
   unsigned id = 0;
   try {

@@ -119,6 +119,10 @@ class ZUProxy {
   [[noreturn]] void xThrowConversionError(std::string_view method,
                                           const ko::ResultConversionError& e) const;
   [[noreturn]] void xThrowGone(std::string_view method, const char* goneText) const;
+  // The service's object, held by the caller for the call; raises the "gone" error when
+  // the proxy has none or the service is gone.
+  std::shared_ptr<ko::DynamicObject> xLiveObject(std::string_view method,
+                                                 const char* goneText) const;
 
   ko::AnyObject fObject;
   std::string fServiceName;
