@@ -7,6 +7,8 @@
 #include <cstdint>
 #include <cstring>
 #include <limits>
+#include <memory>
+#include <new>
 #include <stdexcept>
 #include <string_view>
 #include <utility>
@@ -324,6 +326,102 @@ class ParenMatcher {
   std::array<std::vector<std::uint32_t>, 2> down_;
 };
 
+// Makes the records of one text and their condition variables a block at a time,
+// instead of two allocations per record. A record is handed out through an aliasing
+// pointer that keeps its block alive, so a block is freed with the last of its records
+// (the records of a job live and die together). The record made last stays pending
+// until it is kept: the parse drops it when the instruction turns out not to be one
+// (its parentheses never close), and the next record takes its place.
+//
+// Used by one parse, in the parse's thread; the kept records may be released in any.
+class RecordStore {
+ public:
+  // `expected`: how many records the text may hold, which sizes the first block.
+  explicit RecordStore(std::size_t expected)
+      : nextCapacity_(std::clamp<std::size_t>(expected, kMinFirstCapacity, kMaxFirstCapacity)) {}
+
+  RecordStore(const RecordStore&) = delete;
+  RecordStore& operator=(const RecordStore&) = delete;
+
+  ~RecordStore() { drop(); }
+
+  template <class Record>
+  Record& make(MKTaskActionType type) {
+    drop();
+    if (!block_ || block_->count == block_->capacity) {
+      grow();
+    }
+    const std::size_t k = block_->count;
+    auto* record = ::new (static_cast<void*>(block_->slots[k].bytes))
+        Record(type, std::shared_ptr<std::condition_variable>(conditions_, conditions_.get() + k));
+    block_->slots[k].record = record;
+    block_->count = k + 1;
+    pending_ = true;
+    return *record;
+  }
+
+  // The pending record, shared from now on.
+  std::shared_ptr<MKTaskAction> keep() {
+    pending_ = false;
+    return {block_, block_->slots[block_->count - 1].record};
+  }
+
+  // Destroys the pending record, if any; its place goes to the next one.
+  void drop() noexcept {
+    if (pending_) {
+      pending_ = false;
+      --block_->count;
+      block_->slots[block_->count].record->~MKTaskAction();
+    }
+  }
+
+ private:
+  static constexpr std::size_t kMinFirstCapacity = 4;
+  static constexpr std::size_t kMaxFirstCapacity = 32;
+  static constexpr std::size_t kMaxCapacity = 256;
+  static constexpr std::size_t kSlotSize =
+      std::max({sizeof(MKTaskAction), sizeof(MKAnimationAction), sizeof(MKSoundAction),
+                sizeof(MKCallAction), sizeof(MKModeAction), sizeof(MKAffectationAction)});
+  static constexpr std::size_t kSlotAlign =
+      std::max({alignof(MKTaskAction), alignof(MKAnimationAction), alignof(MKSoundAction),
+                alignof(MKCallAction), alignof(MKModeAction), alignof(MKAffectationAction)});
+
+  struct Slot {
+    alignas(kSlotAlign) std::byte bytes[kSlotSize];
+    MKTaskAction* record;
+  };
+
+  struct Block {
+    explicit Block(std::size_t slotCount)
+        : slots(std::make_unique_for_overwrite<Slot[]>(slotCount)), capacity(slotCount) {}
+    Block(const Block&) = delete;
+    Block& operator=(const Block&) = delete;
+    ~Block() {
+      for (std::size_t k = count; k-- > 0;) {
+        slots[k].record->~MKTaskAction();
+      }
+    }
+
+    std::unique_ptr<Slot[]> slots;
+    std::size_t capacity;
+    std::size_t count = 0;
+  };
+
+  void grow() {
+    const std::size_t capacity = nextCapacity_;
+    block_ = std::make_shared<Block>(capacity);
+    // (The standard library at hand cannot make_shared an array of a type that has no
+    // copy constructor.)
+    conditions_ = std::shared_ptr<std::condition_variable[]>(new std::condition_variable[capacity]);
+    nextCapacity_ = std::min(2 * capacity, kMaxCapacity);
+  }
+
+  std::size_t nextCapacity_;
+  std::shared_ptr<Block> block_;
+  std::shared_ptr<std::condition_variable[]> conditions_;
+  bool pending_ = false;
+};
+
 }  // namespace
 
 struct ZUMokutoParser::ParseState {
@@ -338,13 +436,17 @@ struct ZUMokutoParser::ParseState {
         affectationScan(callerText, kSpace, '='),
         dotScan(callerText, kDot),
         methodEndScan(callerText, kMethodEnd),
-        nonSpaceScan(callerText, kNonSpace) {}
+        nonSpaceScan(callerText, kNonSpace),
+        records(expectedActions(callerText.size())) {}
+
+  // How many actions a text of `size` bytes may hold at a typical density.
+  static std::size_t expectedActions(std::size_t size) { return size / 48 + 1; }
 
   // Adds an action to the job; the first one makes room for as many as the rest of the
   // text may hold at a typical density, so that the lists rarely grow one by one.
   void addAction(std::shared_ptr<MKTaskAction> action, std::size_t at) {
     if (job.actions.empty()) {
-      const std::size_t expected = std::min<std::size_t>((text.size() - at) / 48 + 1, 1024);
+      const std::size_t expected = std::min<std::size_t>(expectedActions(text.size() - at), 1024);
       job.actions.reserve(expected);
       job.usedBookmarks.reserve(job.usedBookmarks.size() + expected);
     }
@@ -370,6 +472,7 @@ struct ZUMokutoParser::ParseState {
   ForwardScan dotScan;
   ForwardScan methodEndScan;
   ForwardScan nonSpaceScan;
+  RecordStore records;
 };
 
 struct ZUMokutoParser::Cursor {
@@ -382,7 +485,6 @@ struct ZUMokutoParser::Cursor {
   std::size_t argEnd = 0;
   std::string_view name;
   std::string_view content;
-  std::shared_ptr<MKTaskAction> action;
 };
 
 namespace {
@@ -532,43 +634,34 @@ bool ZUMokutoParser::xReadInstruction(ParseState& state, std::size_t& pos) const
   pos = k;
 
   const MKTaskActionType type = MKTaskActionType_fromStr(cursor.name);
+  RecordStore& records = state.records;
   bool consumed = false;
   if (type >= AUTO_START_TAG && type <= STOP_TAG) {
-    auto action = std::make_shared<MKAnimationAction>(type);
-    MKAnimationAction& record = *action;
-    cursor.action = std::move(action);
-    consumed = xActionContent(cursor, pos, record);
+    consumed = xActionContent(cursor, pos, records.make<MKAnimationAction>(type));
   } else if (type == MODE) {
-    auto action = std::make_shared<MKModeAction>(type);
-    MKModeAction& record = *action;
-    cursor.action = std::move(action);
-    consumed = xActionContent(cursor, pos, record);
+    consumed = xActionContent(cursor, pos, records.make<MKModeAction>(type));
   } else if (type >= START_SOUND && type <= RUN_SOUND) {
-    auto action = std::make_shared<MKSoundAction>(type);
-    MKSoundAction& record = *action;
-    cursor.action = std::move(action);
-    consumed = xActionContent(cursor, pos, record);
+    consumed = xActionContent(cursor, pos, records.make<MKSoundAction>(type));
   } else if (type == CALL || type == PCALL) {
-    auto action = std::make_shared<MKCallAction>(type);
-    MKCallAction& record = *action;
-    cursor.action = std::move(action);
-    consumed = xActionContent(cursor, pos, record);
+    consumed = xActionContent(cursor, pos, records.make<MKCallAction>(type));
   } else {
-    cursor.action = std::make_shared<MKTaskAction>(type);
-    consumed = xActionContent(cursor, pos, *cursor.action);
+    consumed = xActionContent(cursor, pos, records.make<MKTaskAction>(type));
   }
   if (!consumed) {
+    records.drop();
     return false;
   }
 
   state.copyUpTo(cursor.start);
   state.copiedUpTo = pos + 1;
-  if (cursor.action->type == INPUT_MODE2) {
+  if (type == INPUT_MODE2) {
+    records.drop();
     state.job.config.inputMode2 = true;
     return true;
   }
-  MKTaskAction& added = *cursor.action;
-  state.addAction(std::move(cursor.action), cursor.start);
+  std::shared_ptr<MKTaskAction> action = records.keep();
+  MKTaskAction& added = *action;
+  state.addAction(std::move(action), cursor.start);
   added.appendBookmark(state.speech);
   return true;
 }
@@ -581,16 +674,15 @@ bool ZUMokutoParser::xReadAffectation(ParseState& state, std::size_t& pos) const
   if (lastEqual == npos || lastEqual == dollar + 1 || lastEqual + 1 >= end) {
     return false;
   }
-  auto action = std::make_shared<MKAffectationAction>(AFFECTATION);
-  action->name.assign(t.substr(dollar + 1, lastEqual - dollar - 1));
-  action->value.assign(t.substr(lastEqual + 1, end - lastEqual - 1));
-  action->text.assign(t.substr(dollar, end - dollar));
+  MKAffectationAction& record = state.records.make<MKAffectationAction>(AFFECTATION);
+  record.name.assign(t.substr(dollar + 1, lastEqual - dollar - 1));
+  record.value.assign(t.substr(lastEqual + 1, end - lastEqual - 1));
+  record.text.assign(t.substr(dollar, end - dollar));
 
   state.copyUpTo(dollar);
   state.copiedUpTo = end;
-  MKTaskAction& added = *action;
-  state.addAction(std::move(action), dollar);
-  added.appendBookmark(state.speech);
+  state.addAction(state.records.keep(), dollar);
+  record.appendBookmark(state.speech);
   state.afterBackslash = true;
   pos = end;
   return true;

@@ -1,7 +1,9 @@
 #include <gtest/gtest.h>
 
+#include <condition_variable>
 #include <memory>
 #include <random>
+#include <set>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -376,6 +378,34 @@ TEST(ParsedJob, ReplacesTheSpeechTextOfTheJob) {
   ZUMokutoParser().parse(job, job->text, false);
   EXPECT_EQ(job->text, "the caller's text");
   EXPECT_THROW(ZUMokutoParser().parse(nullptr, "x", false), std::invalid_argument);
+}
+
+// Records are made a block at a time: each must still have a condition variable of its
+// own, and live on with its fields after the job and the other actions are gone. The
+// records of "^inputMode2()" and of the unclosed call at the end are made and dropped.
+TEST(ParsedJob, ActionsOwnTheirConditionsAndOutliveTheJob) {
+  std::string text;
+  for (int k = 0; k < 600; ++k) {
+    const std::string n = std::to_string(k);
+    text += "^start(a" + n + ") ^inputMode2() $v" + n + "=x ^runSound(s/n" + n + ", 5) ";
+  }
+  text += "^call(M.m(\"";
+  auto job = parse(text);
+  ASSERT_EQ(job->actions.size(), 1800u);
+  std::set<const std::condition_variable*> conditions;
+  for (const auto& action : job->actions) {
+    ASSERT_NE(action->condition, nullptr);
+    conditions.insert(action->condition.get());
+  }
+  EXPECT_EQ(conditions.size(), job->actions.size());
+
+  const std::shared_ptr<MKTaskAction> affectation = job->actions[1234];
+  const std::shared_ptr<MKTaskAction> sound = job->actions[1799];
+  job.reset();
+  EXPECT_EQ(affectation->text, "$v411=x");
+  EXPECT_EQ(affectation->id, 1235u);
+  EXPECT_EQ(dynamic_cast<const MKSoundAction&>(*sound).soundName, "n599");
+  sound->condition->notify_all();
 }
 
 struct LogCase {

@@ -13,6 +13,7 @@
 #include <memory>
 #include <string>
 #include <string_view>
+#include <utility>
 
 #include "zu/enums.h"
 
@@ -79,7 +80,12 @@ MKTaskActionType MKTaskActionType_fromStr(std::string_view name);
 
 class MKTaskAction {
  public:
+  // With a fresh condition variable of its own.
   explicit MKTaskAction(MKTaskActionType actionType);
+  // With a condition variable that the caller made for this record alone (the parser
+  // makes those of a text a block at a time).
+  MKTaskAction(MKTaskActionType actionType, std::shared_ptr<std::condition_variable> ownCondition)
+      : type(actionType), condition(std::move(ownCondition)) {}
   MKTaskAction(const MKTaskAction&) = default;
   MKTaskAction& operator=(const MKTaskAction&) = default;
   MKTaskAction(MKTaskAction&&) = default;
@@ -102,6 +108,9 @@ class MKTaskAction {
 class MKAnimationAction : public MKTaskAction {
  public:
   explicit MKAnimationAction(MKTaskActionType actionType) : MKTaskAction(actionType) {}
+  MKAnimationAction(MKTaskActionType actionType,
+                    std::shared_ptr<std::condition_variable> ownCondition)
+      : MKTaskAction(actionType, std::move(ownCondition)) {}
 
   std::string animation;
   std::string tag;
@@ -110,6 +119,8 @@ class MKAnimationAction : public MKTaskAction {
 class MKSoundAction : public MKTaskAction {
  public:
   explicit MKSoundAction(MKTaskActionType actionType) : MKTaskAction(actionType) {}
+  MKSoundAction(MKTaskActionType actionType, std::shared_ptr<std::condition_variable> ownCondition)
+      : MKTaskAction(actionType, std::move(ownCondition)) {}
 
   std::string soundSet;
   std::string soundName;
@@ -119,6 +130,8 @@ class MKSoundAction : public MKTaskAction {
 class MKCallAction : public MKTaskAction {
  public:
   explicit MKCallAction(MKTaskActionType actionType) : MKTaskAction(actionType) {}
+  MKCallAction(MKTaskActionType actionType, std::shared_ptr<std::condition_variable> ownCondition)
+      : MKTaskAction(actionType, std::move(ownCondition)) {}
 
   // The service to call; looked up by the loader stage, empty until then.
   std::shared_ptr<ZUProxy> proxy;
@@ -131,6 +144,8 @@ class MKCallAction : public MKTaskAction {
 class MKModeAction : public MKTaskAction {
  public:
   explicit MKModeAction(MKTaskActionType actionType) : MKTaskAction(actionType) {}
+  MKModeAction(MKTaskActionType actionType, std::shared_ptr<std::condition_variable> ownCondition)
+      : MKTaskAction(actionType, std::move(ownCondition)) {}
 
   BodyLanguageMode mode = BODY_LANGUAGE_MODE_END_OF_ENUM;
 };
@@ -138,6 +153,9 @@ class MKModeAction : public MKTaskAction {
 class MKAffectationAction : public MKTaskAction {
  public:
   explicit MKAffectationAction(MKTaskActionType actionType) : MKTaskAction(actionType) {}
+  MKAffectationAction(MKTaskActionType actionType,
+                      std::shared_ptr<std::condition_variable> ownCondition)
+      : MKTaskAction(actionType, std::move(ownCondition)) {}
 
   std::string name;
   std::string value;
