@@ -1,9 +1,14 @@
 #include "ko/os.hpp"
 
+#if defined(__GLIBC__)
+#include <malloc.h>
+#endif
 #include <sys/syscall.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
+#include <climits>
 #include <cstdlib>
 
 namespace ko::os {
@@ -21,6 +26,19 @@ std::string getenv(const std::string& name) {
 
 int gettid() {
   return static_cast<int>(::syscall(SYS_gettid));
+}
+
+bool keepFreedMemory(std::size_t retainedBytes) {
+#if defined(__GLIBC__)
+  // The allocator refuses mmap thresholds above 32 MB.
+  const std::size_t limit = std::size_t{INT_MAX};
+  const auto retained = static_cast<int>(std::min(retainedBytes, limit));
+  const auto direct = static_cast<int>(std::min(retainedBytes / 4, std::size_t{32} << 20));
+  return ::mallopt(M_TRIM_THRESHOLD, retained) == 1 && ::mallopt(M_MMAP_THRESHOLD, direct) == 1;
+#else
+  (void)retainedBytes;
+  return false;
+#endif
 }
 
 }  // namespace ko::os
