@@ -30,9 +30,8 @@ int gettid() {
 
 bool keepFreedMemory(std::size_t retainedBytes) {
 #if defined(__GLIBC__)
-  // The allocator refuses mmap thresholds above 32 MB.
-  const std::size_t limit = std::size_t{INT_MAX};
-  const auto retained = static_cast<int>(std::min(retainedBytes, limit));
+  const auto retained = static_cast<int>(std::min(retainedBytes, std::size_t{INT_MAX}));
+  // Blocks above this size get a mapping of their own; the allocator refuses more than 32 MB.
   const auto direct = static_cast<int>(std::min(retainedBytes / 4, std::size_t{32} << 20));
   return ::mallopt(M_TRIM_THRESHOLD, retained) == 1 && ::mallopt(M_MMAP_THRESHOLD, direct) == 1;
 #else
