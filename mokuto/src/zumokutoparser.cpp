@@ -140,6 +140,31 @@ class ForwardScan {
   std::size_t lastMark_ = npos;
 };
 
+// The count of a walk to a closing parenthesis, fed the bytes that no backslash hides
+// (backslashes are the walk's own business).
+struct WalkCount {
+  // True when `c` is the closing parenthesis. Forced inline: left to itself the compiler
+  // keeps the count in memory, and the walk slows by a tenth.
+  [[gnu::always_inline]] bool closes(unsigned char c) {
+    if (quoted) {
+      quoted = c != '"';
+    } else if (c == ')') {
+      if (depth == 0) {
+        return true;
+      }
+      --depth;
+    } else if (c == '(') {
+      ++depth;
+    } else if (c == '"') {
+      quoted = true;
+    }
+    return false;
+  }
+
+  std::size_t depth = 0;
+  bool quoted = false;
+};
+
 // Finds the parenthesis that closes a walk started at a position: outside double
 // quotes "(" opens and ")" closes, inside them only a double quote counts, and a
 // backslash hides the byte after it.
@@ -187,8 +212,7 @@ class ParenMatcher {
   // The walk itself; stops early, with budget 0 and npos, when the budget runs out.
   std::size_t walk(std::size_t p, std::size_t& budget) const {
     const std::size_t size = text_.size();
-    std::size_t depth = 0;
-    bool quoted = false;
+    WalkCount count;
     for (std::size_t x = p; x < size; ++x) {
       std::size_t stop = x;
       while (stop < size && !kWalkStops[byteAt(text_, stop)]) {
@@ -207,17 +231,8 @@ class ParenMatcher {
       const unsigned char c = byteAt(text_, x);
       if (c == '\\') {
         ++x;
-      } else if (quoted) {
-        quoted = c != '"';
-      } else if (c == ')') {
-        if (depth == 0) {
-          return x;
-        }
-        --depth;
-      } else if (c == '(') {
-        ++depth;
-      } else if (c == '"') {
-        quoted = true;
+      } else if (count.closes(c)) {
+        return x;
       }
     }
     return npos;
@@ -276,8 +291,7 @@ class ParenMatcher {
 
   std::size_t lookUp(std::size_t p) const {
     const std::size_t size = text_.size();
-    std::size_t depth = 0;
-    bool quoted = false;
+    WalkCount count;
     bool skip = false;
     std::size_t x = p;
     // Walk by hand while this walk and the reference walk skip different bytes (the
@@ -288,17 +302,8 @@ class ParenMatcher {
         skip = false;
       } else if (c == '\\') {
         skip = true;
-      } else if (quoted) {
-        quoted = c != '"';
-      } else if (c == ')') {
-        if (depth == 0) {
-          return x;
-        }
-        --depth;
-      } else if (c == '(') {
-        ++depth;
-      } else if (c == '"') {
-        quoted = true;
+      } else if (count.closes(c)) {
+        return x;
       }
       ++x;
     }
@@ -306,9 +311,9 @@ class ParenMatcher {
       return npos;
     }
     const bool referenceQuoted = (flags_[x] & kQuoted) != 0;
-    const std::size_t side = (referenceQuoted != quoted) ? 1 : 0;
+    const std::size_t side = (referenceQuoted != count.quoted) ? 1 : 0;
     std::size_t k = x;
-    for (std::size_t drop = 0; drop <= depth; ++drop) {
+    for (std::size_t drop = 0; drop <= count.depth; ++drop) {
       const std::uint32_t next = down_[side][k];
       if (next == kNone) {
         return npos;
