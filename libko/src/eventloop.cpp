@@ -12,15 +12,26 @@
 #include "eventloop_impl.hpp"
 #include "ko/log.hpp"
 #include "ko/os.hpp"
+#include "ko/reaper.hpp"
 
 namespace ko {
+
+namespace detail {
+void startReaper();
+}  // namespace detail
 
 namespace {
 
 thread_local const EventLoop::Impl* tlCurrentLoop = nullptr;
+// The loop whose job this thread runs now.
+thread_local const EventLoop::Impl* tlJobLoop = nullptr;
 
-// Runs one job; an exception is logged and dropped so that the pool's thread survives.
-void runJob(const EventLoop::Impl& impl, std::function<void()>& job) {
+// Runs one job unless the loop was stopped first; an exception is logged and dropped so
+// that the pool's thread survives.
+void runJob(EventLoop::Impl& impl, std::function<void()>& job) {
+  const EventLoop::Impl::JobScope scope(impl);
+  if (!scope.entered())
+    return;
   try {
     job();
   } catch (const std::exception& e) {
@@ -40,6 +51,24 @@ struct DelayedJob {
 };
 
 }  // namespace
+
+// The count is raised before the stop flag is read, and the stop sets the flag before it
+// reads the count: either the stop waits for the job or the job sees the stop.
+EventLoop::Impl::JobScope::JobScope(Impl& impl) noexcept
+    : impl_(impl), previous_(tlJobLoop), entered_(false) {
+  impl_.running.fetch_add(1);
+  entered_ = !impl_.stopped.load();
+  tlJobLoop = &impl_;
+}
+
+EventLoop::Impl::JobScope::~JobScope() {
+  tlJobLoop = previous_;
+  impl_.running.fetch_sub(1);
+  if (impl_.stopped.load()) {
+    std::lock_guard lock(impl_.mutex);
+    impl_.idle.notify_all();
+  }
+}
 
 std::uint64_t EventLoop::Impl::addStopListener(std::function<void()> listener) {
   {
@@ -63,10 +92,12 @@ EventLoop::EventLoop(std::string name, std::size_t threadCount)
     : impl_(std::make_shared<Impl>(std::move(name))) {
   if (threadCount == 0)
     threadCount = std::max(2u, std::thread::hardware_concurrency());
+  detail::startReaper();
   impl_->work.emplace(impl_->io.get_executor());
   impl_->threads.reserve(threadCount);
   for (std::size_t i = 0; i < threadCount; ++i) {
     impl_->threads.emplace_back([impl = impl_] {
+      const FrameworkThreadScope framework;
       tlCurrentLoop = impl.get();
       impl->io.run();
       tlCurrentLoop = nullptr;
@@ -96,10 +127,8 @@ void EventLoop::post(std::function<void()> job) {
   {
     std::shared_lock lock(impl_->postMutex);
     if (!impl_->stopped.load()) {
-      boost::asio::post(impl_->io, [impl = impl_.get(), job = std::move(job)]() mutable {
-        if (!impl->stopped.load())
-          runJob(*impl, job);
-      });
+      boost::asio::post(
+          impl_->io, [impl = impl_.get(), job = std::move(job)]() mutable { runJob(*impl, job); });
       return;
     }
   }
@@ -129,27 +158,50 @@ void EventLoop::postDelayed(std::function<void()> job, std::chrono::steady_clock
   delayed->timer.async_wait(
       [impl = impl_, delayed, job = std::move(job)](const boost::system::error_code& ec) mutable {
         impl->removeStopListener(delayed->token);
-        if (!ec && !impl->stopped.load())
+        if (!ec)
           runJob(*impl, job);
       });
 }
 
 void EventLoop::stop() {
+  // Kept here: a concurrent owner may destroy this EventLoop while the threads are joined.
+  const std::shared_ptr<Impl> impl = impl_;
   std::unordered_map<std::uint64_t, std::function<void()>> listeners;
+  bool first = false;
   {
-    std::unique_lock postLock(impl_->postMutex);
-    std::lock_guard lock(impl_->mutex);
-    if (impl_->stopped.exchange(true))
-      return;
-    listeners.swap(impl_->stopListeners);
+    std::unique_lock postLock(impl->postMutex);
+    std::lock_guard lock(impl->mutex);
+    first = !impl->stopped.exchange(true);
+    if (first)
+      listeners.swap(impl->stopListeners);
   }
-  for (auto& [token, listener] : listeners)
-    listener();
-  // The threads drain what is queued (skipping the jobs) and leave when no work is left.
-  impl_->work.reset();
-  const auto self = std::this_thread::get_id();
-  for (auto& t : impl_->threads) {
-    if (t.get_id() == self || isInThisLoop())
+  if (first) {
+    for (auto& [token, listener] : listeners)
+      listener();
+    // The threads drain what is queued (skipping the jobs) and leave when no work is left.
+    impl->work.reset();
+  }
+  // Every stop, the first or a concurrent one, returns only once no job runs, but for the
+  // caller's own; jobs that stop the loop from inside do not wait for each other.
+  const bool fromJob = tlJobLoop == impl.get();
+  {
+    std::unique_lock lock(impl->mutex);
+    if (fromJob) {
+      ++impl->stoppingJobs;
+      impl->idle.notify_all();
+    }
+    impl->idle.wait(lock,
+                    [&] { return impl->running.load() <= (fromJob ? impl->stoppingJobs : 0); });
+    if (fromJob)
+      --impl->stoppingJobs;
+  }
+  if (!first)
+    return;
+  // From one of the loop's threads, the pool cannot be joined: Asio keeps every thread in
+  // the loop while a handler still runs. They leave once the caller's job has returned.
+  const bool inLoop = tlCurrentLoop == impl.get();
+  for (auto& t : impl->threads) {
+    if (inLoop)
       t.detach();
     else if (t.joinable())
       t.join();

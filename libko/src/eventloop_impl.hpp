@@ -2,6 +2,7 @@
 // The inside of an EventLoop, shared with the framework's own timers (periodic tasks).
 
 #include <atomic>
+#include <condition_variable>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -26,6 +27,23 @@ namespace ko {
 struct EventLoop::Impl : std::enable_shared_from_this<EventLoop::Impl> {
   using WorkGuard = boost::asio::executor_work_guard<boost::asio::io_context::executor_type>;
 
+  // Counts one job of the loop (a posted or delayed job, a periodic task's run) for the
+  // stop, which waits until no job runs. A job that begins after the stop is not run:
+  // `entered()` is false.
+  class JobScope {
+   public:
+    explicit JobScope(Impl& impl) noexcept;
+    ~JobScope();
+    JobScope(const JobScope&) = delete;
+    JobScope& operator=(const JobScope&) = delete;
+    bool entered() const noexcept { return entered_; }
+
+   private:
+    Impl& impl_;
+    const Impl* previous_;
+    bool entered_;
+  };
+
   explicit Impl(std::string loopName) : name(std::move(loopName)) {}
 
   // Answers a token for removeStopListener; a listener added after the stop runs at once.
@@ -44,6 +62,11 @@ struct EventLoop::Impl : std::enable_shared_from_this<EventLoop::Impl> {
   std::mutex mutex;  // listeners, stop
   std::unordered_map<std::uint64_t, std::function<void()>> stopListeners;
   std::uint64_t nextToken = 1;
+
+  // The jobs running now; once the loop is stopped, each end notifies `idle` (with `mutex`).
+  std::atomic<int> running{0};
+  std::condition_variable idle;
+  int stoppingJobs = 0;  // under `mutex`: jobs waiting in stop()
 };
 
 }  // namespace ko

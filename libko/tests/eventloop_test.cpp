@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "ko/log.hpp"
+#include "ko/reaper.hpp"
 #include "ko_test_helpers.hpp"
 
 namespace {
@@ -115,6 +116,111 @@ TEST(EventLoop, EveryJobPostedDuringAStopFinishes) {
       for (const auto& f : list)
         ASSERT_NE(f.wait(10000), FutureState::Timeout) << "round " << round;
   }
+}
+
+// Every stop returns only once no job runs but the caller's own: a second, concurrent stop
+// from outside as much as a stop from a job of the loop.
+TEST(EventLoopStop, NoStopReturnsWhileAnotherJobRuns) {
+  constexpr int kRounds = 200;
+  for (int round = 0; round < kRounds; ++round) {
+    auto loop = std::make_shared<ko::EventLoop>("stop-waits", 3);
+    std::atomic<bool> longJobEnded{false};
+    std::atomic<int> earlyReturns{0};
+    Gate longJobStarted;
+    loop->post([&] {
+      longJobStarted.open();
+      for (int i = 0; i < 200; ++i)
+        std::this_thread::yield();
+      longJobEnded = true;
+    });
+    ASSERT_TRUE(longJobStarted.wait());
+    // One stop from a job of the loop, two from outside, all at once.
+    auto fromJob = loop->async([&] {
+      loop->stop();
+      if (!longJobEnded)
+        ++earlyReturns;
+    });
+    std::vector<std::thread> outside;
+    for (int i = 0; i < 2; ++i) {
+      outside.emplace_back([&] {
+        loop->stop();
+        if (!longJobEnded)
+          ++earlyReturns;
+      });
+    }
+    for (auto& t : outside)
+      t.join();
+    ASSERT_NE(fromJob.wait(10000), FutureState::Timeout);
+    ASSERT_EQ(earlyReturns.load(), 0) << "round " << round;
+  }
+}
+
+TEST(EventLoopStop, JobsStoppingTheirLoopTogetherDoNotWaitForEachOther) {
+  for (int round = 0; round < 50; ++round) {
+    auto loop = std::make_shared<ko::EventLoop>("stop-together", 2);
+    ko::test::Counter inside;
+    auto stopper = [&] {
+      inside.increment();
+      inside.waitFor(2);
+      loop->stop();
+    };
+    auto a = loop->async(stopper);
+    auto b = loop->async(stopper);
+    ASSERT_EQ(a.wait(10000), FutureState::FinishedWithValue);
+    ASSERT_EQ(b.wait(10000), FutureState::FinishedWithValue);
+  }
+}
+
+// The owner of a loop may let go of it from one of the loop's own jobs: the other
+// threads are joined, the caller's leaves when its job returns.
+TEST(EventLoopStop, LastOwnerMayLetGoFromAJob) {
+  auto loop = std::make_shared<ko::EventLoop>("self-owned", 2);
+  Gate otherStarted, ownerJobStarted, released;
+  std::atomic<bool> otherEnded{false};
+  loop->post([&] {
+    otherStarted.open();
+    ownerJobStarted.wait();
+    for (int i = 0; i < 200; ++i)
+      std::this_thread::yield();
+    otherEnded = true;
+  });
+  ASSERT_TRUE(otherStarted.wait());
+  std::atomic<bool> endedBeforeRelease{false};
+  loop->post([&, held = loop]() mutable {
+    ownerJobStarted.open();
+    loop.reset();
+    held.reset();  // the last owner: ~EventLoop in its own job
+    endedBeforeRelease = otherEnded.load();
+    released.open();
+  });
+  ASSERT_TRUE(released.wait());
+  EXPECT_TRUE(endedBeforeRelease);
+}
+
+// An object made with ko::makeShared never dies on a framework thread: dropped in a loop
+// job, it is destroyed on the reaper; dropped elsewhere, at once.
+TEST(Reaper, ObjectsDroppedInAJobDieOnTheReaper) {
+  struct Probe {
+    explicit Probe(std::atomic<int>& where) : where_(where) {}
+    ~Probe() { where_ = ko::isFrameworkThread() ? 1 : 2; }
+    std::atomic<int>& where_;
+  };
+  std::atomic<int> where{0};
+  ko::EventLoop loop("reaping", 1);
+  auto probe = ko::makeShared<Probe>(where);
+  EXPECT_FALSE(ko::isFrameworkThread());
+  EXPECT_TRUE(loop.async([held = std::move(probe)]() mutable {
+                    const bool framework = ko::isFrameworkThread();
+                    held.reset();
+                    return framework;
+                  })
+                  .value(10000));
+  ko::waitForReaper();
+  EXPECT_EQ(where.load(), 2);
+
+  where = 0;
+  ko::makeShared<Probe>(where).reset();
+  EXPECT_EQ(where.load(), 2);
 }
 
 TEST(EventLoop, DestructionCancelsDelayedJobs) {

@@ -1,12 +1,18 @@
 #pragma once
 // A pool of threads that runs jobs: posted functions, asynchronous calls with a future of
 // their result, and delayed jobs. Built on a Boost.Asio io_context kept alive by a work
-// guard and run by every thread of the pool.
+// guard and run by every thread of the pool. Its threads are framework threads (see
+// reaper.hpp): an object made with ko::makeShared that dies in one of its jobs is
+// destroyed on the reaper instead.
 //
-// All member functions are thread-safe. Destruction stops the loop and joins its threads
-// (a job that is still queued is dropped: its future finishes with "Promise broken"); when
-// the last owner lets go of the loop from one of its own threads, that thread is detached
-// instead of joined.
+// All member functions are thread-safe, from any thread, the loop's own included.
+// stop() (and the destructor, which calls it) returns only once no job of the loop runs
+// any more, except, when called from inside a job of this loop, the caller's own job (and
+// those of other jobs that are stopping the loop from inside at the same time). A job
+// still queued is dropped: its future finishes with "Promise broken". A stop from outside
+// joins the threads; a stop from one of the loop's threads lets them leave once the
+// caller's job returns, so a loop may be stopped, or its owner destroyed, in one of its
+// own jobs. A job must not stop its loop while another job waits for it.
 
 #include <chrono>
 #include <cstddef>
@@ -61,8 +67,8 @@ class EventLoop {
     return result;
   }
 
-  // Stops the loop: queued jobs are dropped, running ones finish, the threads are joined.
-  // Later posts are dropped. Idempotent.
+  // Stops the loop: queued and later jobs are dropped, running ones are waited for (see
+  // above). Idempotent; concurrent calls all wait.
   void stop();
 
   // Internal: the loop's io_context, for the framework's own timers.
