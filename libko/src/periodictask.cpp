@@ -34,6 +34,9 @@ struct PeriodicTask::Impl : std::enable_shared_from_this<PeriodicTask::Impl> {
   std::condition_variable cv;
   boost::asio::steady_timer timer;
   State state = State::Stopped;
+  // The pending stop was asked for from outside the callback (another thread, or the
+  // owner's destruction): a restart from inside the callback does not cancel it.
+  bool outsideStop = false;
   std::uint64_t generation = 0;  // bumped on each start and stop; stale handlers do nothing
   std::thread::id callbackThread;
   std::function<void()> callback;
@@ -48,13 +51,15 @@ void PeriodicTask::Impl::schedule(std::chrono::microseconds delay) {
 }
 
 void PeriodicTask::Impl::fire(std::uint64_t gen, const boost::system::error_code& ec) {
+  // Counted as a job of the loop, so that stopping the loop waits for the callback.
+  const EventLoop::Impl::JobScope job(loop->impl());
   std::function<void()> cb;
   std::string taskName;
   {
     std::lock_guard lock(mutex);
     if (gen != generation || state != State::Scheduled)
       return;
-    if (ec) {  // the loop was stopped under the task
+    if (ec || !job.entered()) {  // the loop was stopped under the task
       state = State::Stopped;
       cv.notify_all();
       return;
@@ -76,11 +81,19 @@ void PeriodicTask::Impl::fire(std::uint64_t gen, const boost::system::error_code
   std::lock_guard lock(mutex);
   callbackThread = {};
   if (state == State::Running && !loop->impl().stopped.load()) {
-    state = State::Scheduled;
-    schedule(std::chrono::microseconds(period.load()));
+    try {
+      state = State::Scheduled;
+      schedule(std::chrono::microseconds(period.load()));
+    } catch (const std::exception& e) {
+      KO_LOG_ERROR("ko.periodictask")
+          << "Periodic task '" << taskName << "' cannot be scheduled again: " << e.what();
+      state = State::Stopped;
+    }
   } else {
     state = State::Stopped;
   }
+  if (state == State::Stopped)
+    outsideStop = false;
   cv.notify_all();
 }
 
@@ -144,7 +157,9 @@ void PeriodicTask::start(bool immediate) {
     throw Error("Periodic task '" + impl_->name + "' has no callback");
   if (impl_->state == Impl::State::Stopping) {
     if (impl_->inCallback()) {
-      impl_->state = Impl::State::Running;  // the callback cancels its own stop
+      // The callback may take back a stop of its own, never one asked from outside.
+      if (!impl_->outsideStop)
+        impl_->state = Impl::State::Running;
       return;
     }
     impl_->cv.wait(lock, [this] { return impl_->state != Impl::State::Stopping; });
@@ -155,7 +170,12 @@ void PeriodicTask::start(bool immediate) {
     throw Error("Periodic task '" + impl_->name + "': its event loop is stopped");
   ++impl_->generation;
   impl_->state = Impl::State::Scheduled;
-  impl_->schedule(std::chrono::microseconds(immediate ? 0 : impl_->period.load()));
+  try {
+    impl_->schedule(std::chrono::microseconds(immediate ? 0 : impl_->period.load()));
+  } catch (...) {
+    impl_->state = Impl::State::Stopped;
+    throw;
+  }
 }
 
 void PeriodicTask::stop() {
@@ -174,6 +194,7 @@ void PeriodicTask::stop() {
       impl_->state = Impl::State::Stopping;
       if (impl_->inCallback())
         return;
+      impl_->outsideStop = true;
       impl_->cv.wait(lock, [this] { return impl_->state != Impl::State::Stopping; });
       return;
   }
@@ -186,8 +207,10 @@ void PeriodicTask::asyncStop() {
     impl_->timer.cancel();
     impl_->state = Impl::State::Stopped;
     impl_->cv.notify_all();
-  } else if (impl_->state == Impl::State::Running) {
+  } else if (impl_->state == Impl::State::Running || impl_->state == Impl::State::Stopping) {
     impl_->state = Impl::State::Stopping;
+    if (!impl_->inCallback())
+      impl_->outsideStop = true;
   }
 }
 

@@ -161,6 +161,27 @@ TEST_F(PeriodicTaskTest, RestartFromTheCallbackCancelsItsOwnStop) {
   task.stop();
 }
 
+// A stop from outside wins over a restart that the running callback makes meanwhile: once
+// stop() returns, the task is stopped for good.
+TEST_F(PeriodicTaskTest, StopFromOutsideWinsOverARestartFromTheCallback) {
+  ko::PeriodicTask task(loop_);
+  Gate running;
+  Counter calls;
+  task.setCallback([&] {
+    calls.increment();
+    running.open();
+    // Wait until the other thread's stop is pending, then try to go on.
+    EXPECT_TRUE(eventually([&] { return task.isStopping(); }));
+    task.start();
+  });
+  task.setUsPeriod(0);
+  task.start();
+  ASSERT_TRUE(running.wait());
+  task.stop();
+  EXPECT_FALSE(task.isRunning());
+  EXPECT_EQ(calls.value(), 1);
+}
+
 TEST_F(PeriodicTaskTest, ThrowingCallbackIsLoggedAndTheTaskGoesOn) {
   ko::log::ScopedCapture cap;
   ko::PeriodicTask task(loop_);

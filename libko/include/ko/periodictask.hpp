@@ -5,7 +5,13 @@
 // when a run ends, so a callback may change the period for the wait that follows it. Two
 // runs of one task never overlap. Control calls (start, stop, setUsPeriod, ...) may come
 // from any thread, the callback's own thread included; the callback runs on a thread of
-// the task's event loop.
+// the task's event loop, as one of the loop's jobs (stopping the loop waits for it, and a
+// stopped loop stops the task).
+//
+// Stops win: once stop() or the destructor has returned (called from outside the
+// callback), the callback is not running and will not run again until the next start()
+// from outside; a start() that the callback makes meanwhile is ignored. Only a stop that
+// the callback asked for itself may be taken back by a start() from the same callback.
 //
 // A class deriving from PeriodicTask whose callback touches its own members must call
 // stop() in its destructor, before those members go away.
@@ -40,13 +46,14 @@ class PeriodicTask {
 
   // Starts the task: the first run comes at once when `immediate`, otherwise after one
   // period. Does nothing when the task already runs; when it is stopping, waits for the
-  // stop to end first (or, from inside the callback, cancels the stop). Raises ko::Error
-  // when no callback was set.
+  // stop to end first, or, from inside the callback, takes back the callback's own stop
+  // and leaves one asked from outside alone. Raises ko::Error when no callback was set or
+  // the loop is stopped.
   void start(bool immediate = true);
   // Stops the task and waits for a running callback to end; called from inside the
   // callback it only asks for the stop, which happens when the callback returns.
   void stop();
-  // Asks for the stop without waiting.
+  // Asks for the stop without waiting; from outside the callback, it wins as stop() does.
   void asyncStop();
 
   // From start() until the stop has completed.
