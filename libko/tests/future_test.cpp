@@ -3,6 +3,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <chrono>
 #include <stdexcept>
 #include <thread>
 #include <vector>
@@ -67,6 +68,29 @@ TEST(Future, TimeoutLeavesTheFutureRunning) {
       ko::FutureError);
   promise.setValue(7);
   EXPECT_EQ(future.value(0), 7);
+}
+
+// A duration is waited to the clock's resolution: neither rounded down to no wait nor,
+// when long, overflowed into a short one.
+TEST(Future, DurationsShorterThanAMillisecondOrVeryLongAreWaitedInFull) {
+  Promise<int> promise;
+  const auto future = promise.future();
+  for (const auto wait : {std::chrono::microseconds(300), std::chrono::microseconds(999)}) {
+    const auto start = std::chrono::steady_clock::now();
+    EXPECT_EQ(future.wait(wait), FutureState::Timeout);
+    EXPECT_GE(std::chrono::steady_clock::now() - start, wait);
+  }
+  EXPECT_EQ(future.wait(std::chrono::nanoseconds(-5)), FutureState::Timeout);
+
+  // 2^32 + 1 ms once became 1 ms; hours::max() overflowed.
+  std::thread setter([&] {
+    std::this_thread::sleep_for(std::chrono::milliseconds(50));
+    promise.setValue(3);
+  });
+  EXPECT_EQ(future.wait(std::chrono::milliseconds((1LL << 32) + 1)),
+            FutureState::FinishedWithValue);
+  setter.join();
+  EXPECT_EQ(future.wait(std::chrono::hours::max()), FutureState::FinishedWithValue);
 }
 
 TEST(Future, SecondResultIsRefused) {

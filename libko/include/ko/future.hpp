@@ -49,6 +49,9 @@ class Promise;
 
 namespace detail {
 
+// A timed wait longer than this is a wait without limit (the deadline would overflow).
+inline constexpr double kLongestTimedWaitSeconds = 100.0 * 365 * 24 * 3600;
+
 template <class T>
 using StoredType = std::conditional_t<std::is_void_v<T>, std::monostate, T>;
 
@@ -65,11 +68,20 @@ class FutureSharedState {
   // Waits at most `msecs` (negative: no limit); answers the state, Timeout when the
   // state is still Running after the wait.
   FutureState wait(int msecs) const {
+    if (msecs < 0)
+      return waitUntil(std::nullopt);
+    return waitFor(std::chrono::milliseconds(msecs));
+  }
+  FutureState waitFor(std::chrono::steady_clock::duration timeout) const {
+    return waitUntil(std::chrono::steady_clock::now() + timeout);
+  }
+  // std::nullopt: no limit.
+  FutureState waitUntil(std::optional<std::chrono::steady_clock::time_point> deadline) const {
     std::unique_lock lock(mutex_);
     auto done = [this] { return state_ != FutureState::Running; };
-    if (msecs < 0) {
+    if (!deadline) {
       cv_.wait(lock, done);
-    } else if (!cv_.wait_for(lock, std::chrono::milliseconds(msecs), done)) {
+    } else if (!cv_.wait_until(lock, *deadline, done)) {
       return FutureState::Timeout;
     }
     return state_;
@@ -167,10 +179,19 @@ class Future {
       return FutureState::None;
     return state_->wait(msecs);
   }
+  // Waits at most `timeout`, to the clock's resolution: a zero or negative one does not
+  // wait, one beyond a century waits without limit.
   template <class Rep, class Period>
   FutureState wait(std::chrono::duration<Rep, Period> timeout) const {
-    return wait(
-        static_cast<int>(std::chrono::duration_cast<std::chrono::milliseconds>(timeout).count()));
+    if (ready_)
+      return FutureState::FinishedWithValue;
+    if (!state_)
+      return FutureState::None;
+    if (timeout <= timeout.zero())
+      return state_->waitFor(std::chrono::steady_clock::duration::zero());
+    if (std::chrono::duration<double>(timeout).count() >= detail::kLongestTimedWaitSeconds)
+      return state_->waitUntil(std::nullopt);
+    return state_->waitFor(std::chrono::ceil<std::chrono::steady_clock::duration>(timeout));
   }
 
   // The value, after waiting at most `msecs`; throws FutureError with the error text on
