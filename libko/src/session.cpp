@@ -21,6 +21,7 @@ unsigned Session::registerService(const std::string& name, AnyObject object) {
   if (!object)
     throw Error("Service '" + name + "' has no object");
   unsigned id = 0;
+  std::uint64_t serial = 0;
   {
     std::unique_lock lock(mutex_);
     if (byName_.count(name))
@@ -28,15 +29,17 @@ unsigned Session::registerService(const std::string& name, AnyObject object) {
     id = nextId_++;
     byName_.emplace(name, Entry{id, std::move(object)});
     byId_.emplace(id, name);
+    serial = xQueueAnnouncement(true, id, name);
   }
   KO_LOG_VERBOSE("ko.session") << "Registered service '" << name << "' as #" << id;
-  serviceRegistered(id, name);
+  xAnnounce(serial);
   return id;
 }
 
 void Session::unregisterService(unsigned id) {
   std::string name;
   AnyObject object;  // released outside the lock
+  std::uint64_t serial = 0;
   {
     std::unique_lock lock(mutex_);
     const auto it = byId_.find(id);
@@ -47,9 +50,46 @@ void Session::unregisterService(unsigned id) {
     object = std::move(entry->second.object);
     byName_.erase(entry);
     byId_.erase(it);
+    serial = xQueueAnnouncement(false, id, name);
   }
   KO_LOG_VERBOSE("ko.session") << "Unregistered service '" << name << "' (#" << id << ")";
-  serviceUnregistered(id, name);
+  xAnnounce(serial);
+}
+
+std::uint64_t Session::xQueueAnnouncement(bool registered, unsigned id, const std::string& name) {
+  std::lock_guard lock(announceMutex_);
+  const std::uint64_t serial = nextSerial_++;
+  announcements_.push_back(Announcement{serial, registered, id, name});
+  return serial;
+}
+
+void Session::xAnnounce(std::uint64_t serial) {
+  std::unique_lock lock(announceMutex_);
+  if (announcing_) {
+    // A subscriber's own change is announced after it returns, by the same thread.
+    if (announcer_ == std::this_thread::get_id())
+      return;
+    announced_.wait(lock, [&] { return announcedSerial_ >= serial || !announcing_; });
+    if (announcedSerial_ >= serial)
+      return;
+  }
+  announcing_ = true;
+  announcer_ = std::this_thread::get_id();
+  while (!announcements_.empty()) {
+    const Announcement next = std::move(announcements_.front());
+    announcements_.pop_front();
+    lock.unlock();
+    if (next.registered)
+      serviceRegistered(next.id, next.name);
+    else
+      serviceUnregistered(next.id, next.name);
+    lock.lock();
+    announcedSerial_ = next.serial;
+    announced_.notify_all();
+  }
+  announcing_ = false;
+  announcer_ = {};
+  announced_.notify_all();
 }
 
 void Session::unregisterService(const std::string& name) {

@@ -4,7 +4,10 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <mutex>
 #include <thread>
+#include <utility>
+#include <vector>
 
 #include "ko/dynamicobject.hpp"
 #include "ko/genericobject.hpp"
@@ -78,6 +81,62 @@ TEST_F(SessionTest, UnregisterByIdOrNameAndSignals) {
   EXPECT_TRUE(session_.service("A").hasError());
   EXPECT_THAT(events, ElementsAre("+A" + std::to_string(a), "+B" + std::to_string(b),
                                   "-A" + std::to_string(a), "-B" + std::to_string(b)));
+}
+
+// The announcements follow the order of the changes, even when a registration and the
+// withdrawal that follows it are made by two threads at once; and a subscriber may
+// register a service of its own (announced after it returns, without a deadlock).
+TEST_F(SessionTest, AnnouncementsComeInTheOrderOfTheChanges) {
+  std::mutex mutex;
+  std::vector<std::pair<bool, unsigned>> seen;  // registered?, id
+  session_.serviceRegistered.connect([&](unsigned id, const std::string& name) {
+    {
+      std::lock_guard lock(mutex);
+      seen.emplace_back(true, id);
+    }
+    if (name == "first")
+      session_.registerService("nested", makeService("n"));
+  });
+  session_.serviceUnregistered.connect([&](unsigned id, const std::string&) {
+    std::lock_guard lock(mutex);
+    seen.emplace_back(false, id);
+  });
+  session_.registerService("first", makeService("f"));
+  ASSERT_EQ(session_.services().size(), 2u);
+
+  constexpr int kRounds = 2000;
+  std::thread withdrawer([&] {
+    for (int i = 0; i < kRounds; ++i) {
+      while (true) {
+        try {
+          session_.unregisterService("svc");
+          break;
+        } catch (const ko::Error&) {
+          std::this_thread::yield();
+        }
+      }
+    }
+  });
+  for (int i = 0; i < kRounds; ++i) {
+    while (true) {
+      try {
+        session_.registerService("svc", makeService("s"));
+        break;
+      } catch (const ko::Error&) {
+        std::this_thread::yield();
+      }
+    }
+  }
+  withdrawer.join();
+  // Of "svc", registrations and withdrawals alternate, each withdrawal of the id just
+  // registered.
+  std::lock_guard lock(mutex);
+  ASSERT_EQ(seen.size(), 2u + 2u * kRounds);
+  for (std::size_t i = 2; i + 1 < seen.size(); i += 2) {
+    ASSERT_TRUE(seen[i].first) << i;
+    ASSERT_FALSE(seen[i + 1].first) << i;
+    ASSERT_EQ(seen[i].second, seen[i + 1].second) << i;
+  }
 }
 
 TEST_F(SessionTest, LookupHookCanHangFailOrPassThrough) {

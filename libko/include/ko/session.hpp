@@ -3,14 +3,25 @@
 //
 // Services are registered under unique names and found by name, in the "local" scope
 // (this process) or in any scope (""); only the local scope exists for now. All functions
-// are thread-safe; the signals are triggered outside the session's lock, in the thread
-// that registered or unregistered the service.
+// are thread-safe.
+//
+// The signals announce the registrations and withdrawals one at a time, in the order they
+// were made, outside the session's lock (a subscriber may use the session). Each is
+// triggered in the thread that made the change or, when another thread is announcing at
+// that moment, in that thread; registerService and unregisterService return once their
+// announcement has been made, except when called from a subscriber (then it follows when
+// the subscriber returns).
 
+#include <condition_variable>
+#include <cstdint>
+#include <deque>
 #include <functional>
 #include <map>
+#include <mutex>
 #include <optional>
 #include <shared_mutex>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "ko/anyvalue.hpp"
@@ -55,11 +66,30 @@ class Session {
     unsigned id;
     AnyObject object;
   };
+  struct Announcement {
+    std::uint64_t serial;
+    bool registered;
+    unsigned id;
+    std::string name;
+  };
+  // With mutex_ held: queues the announcement of a change; answers its serial.
+  std::uint64_t xQueueAnnouncement(bool registered, unsigned id, const std::string& name);
+  // Makes the queued announcements up to `serial`, or waits until another thread has.
+  void xAnnounce(std::uint64_t serial);
+
   mutable std::shared_mutex mutex_;
   std::map<std::string, Entry, std::less<>> byName_;
   std::map<unsigned, std::string> byId_;
   unsigned nextId_ = 1;
   LookupHook hook_;
+
+  std::mutex announceMutex_;  // after mutex_
+  std::condition_variable announced_;
+  std::deque<Announcement> announcements_;
+  std::uint64_t nextSerial_ = 1;
+  std::uint64_t announcedSerial_ = 0;
+  bool announcing_ = false;
+  std::thread::id announcer_;
 };
 
 }  // namespace ko
