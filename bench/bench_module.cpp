@@ -34,7 +34,7 @@ class Adder : public ZU::ZUModule {
 
 struct Process {
   std::shared_ptr<ko::Session> session = std::make_shared<ko::Session>();
-  std::shared_ptr<ZU::ZUBroker> broker = std::make_shared<ZU::ZUBroker>(session);
+  std::shared_ptr<ZU::ZUBroker> broker = ZU::ZUBroker::create(session);
   std::shared_ptr<Adder> adder = ZU::ZUModule::createModule<Adder>(broker, "ZUMotion");
 };
 

@@ -58,7 +58,7 @@ double percentile(std::vector<double> values, double p) {
 
 void BM_BookmarkLateness(benchmark::State& state) {
   const int marks = static_cast<int>(state.range(0));
-  auto broker = std::make_shared<ZU::ZUBroker>(std::make_shared<ko::Session>());
+  auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
   auto memory = ZU::ZUModule::createModule<robotsim::ZUMemory>(broker, "ZUMemory");
   robotsim::ZUTextToSpeechOptions options;
   options.notifications = true;

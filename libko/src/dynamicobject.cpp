@@ -212,6 +212,11 @@ void DynamicObject::setEventLoop(std::shared_ptr<EventLoop> loop) {
   loop_ = std::move(loop);
 }
 
+std::shared_ptr<EventLoop> DynamicObject::ownEventLoop() const {
+  std::lock_guard lock(mutex_);
+  return loop_;
+}
+
 std::shared_ptr<EventLoop> DynamicObject::eventLoop() const {
   {
     std::lock_guard lock(mutex_);

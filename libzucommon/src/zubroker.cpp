@@ -9,6 +9,7 @@
 #include "ko/genericobject.hpp"
 #include "ko/log.hpp"
 #include "ko/os.hpp"
+#include "ko/reaper.hpp"
 #include "zu/zuerror.h"
 #include "zu/zumodulecore.h"
 
@@ -34,7 +35,12 @@ std::string failureText(const ko::Future<ko::AnyObject>& lookup) {
 
 }  // namespace
 
-ZUBroker::ZUBroker(std::shared_ptr<ko::Session> session, std::string name,
+std::shared_ptr<ZUBroker> ZUBroker::create(std::shared_ptr<ko::Session> session, std::string name,
+                                           std::shared_ptr<ZUBrokerManager> manager) {
+  return ko::makeShared<ZUBroker>(Key{}, std::move(session), std::move(name), std::move(manager));
+}
+
+ZUBroker::ZUBroker(Key, std::shared_ptr<ko::Session> session, std::string name,
                    std::shared_ptr<ZUBrokerManager> manager)
     : fName(std::move(name)),
       fSession(std::move(session)),
@@ -49,21 +55,48 @@ void ZUBroker::registerModule(const std::shared_ptr<ZUModuleCore>& module) {
   if (!module)
     ZU_THROW_ERROR("ZUBroker", "registerModule", "Can't register module ''no module given");
   const std::string& name = module->getName();
+  // The entry is made first, without a service: an unregister that comes meanwhile takes
+  // it away, and the registration then withdraws the service it made.
+  std::uint64_t serial = 0;
+  {
+    std::unique_lock lock(fMutex);
+    xWaitForWithdrawal(lock, name);
+    if (fModules.count(name))
+      ZU_THROW_ERROR("ZUBroker", "registerModule", "module '" + name + "'already exists");
+    serial = fNextSerial++;
+    fModules[name] = Registration{module, 0, serial};
+  }
+  auto withdrawEntry = [&] {
+    std::lock_guard lock(fMutex);
+    const auto it = fModules.find(name);
+    if (it != fModules.end() && it->second.serial == serial)
+      fModules.erase(it);
+  };
   // The session keeps names unique and announces the new service to its subscribers, who
   // may use this broker: no lock of ours is held meanwhile.
   unsigned serviceId = 0;
   try {
     serviceId = fSession->registerService(name, ko::GenericObject::makeWeak(module, name));
   } catch (const ko::Error& e) {
+    withdrawEntry();
     const std::vector<std::string> names = fSession->services();
     if (std::find(names.begin(), names.end(), name) != names.end())
       ZU_THROW_ERROR("ZUBroker", "registerModule", "module '" + name + "'already exists");
     ZU_THROW_ERROR("ZUBroker", "registerModule",
                    "Can't register module '" + name + "'" + std::string(e.what()));
   }
+  bool withdrawn = false;
   {
     std::lock_guard lock(fMutex);
-    fModules[name] = Registration{module, serviceId};
+    const auto it = fModules.find(name);
+    if (it != fModules.end() && it->second.serial == serial)
+      it->second.serviceId = serviceId;
+    else
+      withdrawn = true;
+  }
+  if (withdrawn) {
+    xUnregisterModule(name, Registration{nullptr, serviceId, serial});
+    return;
   }
   module->setParentBroker(weak_from_this());
 }
@@ -71,20 +104,42 @@ void ZUBroker::registerModule(const std::shared_ptr<ZUModuleCore>& module) {
 bool ZUBroker::unregisterModule(const std::string& name) {
   std::optional<Registration> registration;
   {
-    std::lock_guard lock(fMutex);
+    std::unique_lock lock(fMutex);
     const auto it = fModules.find(name);
     if (it != fModules.end()) {
       registration = std::move(it->second);
       fModules.erase(it);
+    } else {
+      // Not a module of ours: the session's service of that name is withdrawn, and no
+      // registration of ours under that name begins meanwhile (it would be the one withdrawn).
+      xWaitForWithdrawal(lock, name);
+      fWithdrawing.emplace(name, std::this_thread::get_id());
     }
   }
+  // A registration still being made withdraws its own service.
+  if (registration && registration->serviceId == 0)
+    return true;
   // Unlocked: the session announces the withdrawal to its subscribers, and the broker's
   // hold on the module, perhaps the last, goes at the end.
   const bool done = xUnregisterModule(name, registration);
+  if (!registration) {
+    {
+      std::lock_guard lock(fMutex);
+      fWithdrawing.erase(name);
+    }
+    fWithdrawn.notify_all();
+  }
   if (!done) {
     KO_LOG_ERROR(kCategory) << "ZUBroker::unregisterModule can't unregister module: " << name;
   }
   return done;
+}
+
+void ZUBroker::xWaitForWithdrawal(std::unique_lock<std::mutex>& lock, const std::string& name) {
+  fWithdrawn.wait(lock, [&] {
+    const auto it = fWithdrawing.find(name);
+    return it == fWithdrawing.end() || it->second == std::this_thread::get_id();
+  });
 }
 
 bool ZUBroker::xUnregisterModule(const std::string& name,

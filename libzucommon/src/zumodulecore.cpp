@@ -50,6 +50,10 @@ class ZUModuleCore::TaskJob {
 
   void run(unsigned methodId, const std::vector<ko::AnyValue>& args) {
     fRan = true;
+    if (fModule->hasExited()) {
+      fModule->xDropTask(fTask);
+      return;
+    }
     fModule->xRunTask(fTask, methodId, args);
   }
 
@@ -94,7 +98,7 @@ ko::AnyValue ZUFunctorBase::call(const std::vector<ko::AnyValue>& /*args*/) {
 // ---- ZUModuleCore ------------------------------------------------------------
 
 ZUModuleCore::ZUModuleCore(const std::shared_ptr<ZUBroker>& broker, std::string name)
-    : fName(std::move(name)), fBroker(broker) {}
+    : fName(std::move(name)), fBroker(broker), fSession(broker ? broker->session() : nullptr) {}
 
 ZUModuleCore::~ZUModuleCore() = default;
 
@@ -118,8 +122,34 @@ std::string ZUModuleCore::version() {
 }
 
 void ZUModuleCore::exit() {
+  fExited.store(true, std::memory_order_release);
+  xStopTasks();
+  if (const auto loop = ownEventLoop())
+    loop->stop();
   if (auto broker = getParentBroker())
     broker->unregisterModule(fName);
+}
+
+std::string ZUModuleCore::xExitedText() const {
+  return "Module " + fName + " has exited";
+}
+
+void ZUModuleCore::xDropTask(const std::shared_ptr<ZUPCallTask>& task) {
+  xRemoveRemoteTask(task->id());
+  task->fPromise.trySetError(xExitedText());
+}
+
+void ZUModuleCore::xStopTasks(const std::string& method) {
+  std::vector<std::shared_ptr<ZUPCallTask>> tasks;
+  {
+    std::shared_lock lock(fTasksMutex);
+    for (const auto& [id, task] : fTasks) {
+      if (method.empty() || task->methodName() == method)
+        tasks.push_back(task);
+    }
+  }
+  for (const auto& task : tasks)
+    task->requestStop();
 }
 
 std::string ZUModuleCore::httpGet() {
@@ -153,8 +183,33 @@ std::shared_ptr<ZUBroker> ZUModuleCore::getParentBroker() const {
 }
 
 void ZUModuleCore::setParentBroker(const std::weak_ptr<ZUBroker>& broker) {
+  std::shared_ptr<ko::Session> session;
+  if (const auto held = broker.lock())
+    session = held->session();
   std::lock_guard lock(fStateMutex);
   fBroker = broker;
+  if (session)
+    fSession = std::move(session);
+}
+
+std::shared_ptr<ko::Session> ZUModuleCore::getSession() const {
+  std::lock_guard lock(fStateMutex);
+  return fSession;
+}
+
+ko::AnyObject ZUModuleCore::findService(const std::string& name) const {
+  const auto session = getSession();
+  if (!session)
+    return nullptr;
+  for (const char* scope : {"local", ""}) {
+    const auto found = session->service(name, scope);
+    if (found.wait(ZUBroker::deadlockTimeout()) == ko::FutureState::FinishedWithValue) {
+      ko::AnyObject object = found.value();
+      if (object && object->isValid())
+        return object;
+    }
+  }
+  return nullptr;
 }
 
 std::string ZUModuleCore::getModuleDescription() const {
@@ -269,6 +324,8 @@ int ZUModuleCore::pCallById(int methodId, const ko::AnyValue& args) {
   std::shared_ptr<ZUModuleCore> self = weak_from_this().lock();
   if (!self)
     ZU_THROW_ERROR(fName, "__pCall", "The module is not owned by a shared pointer");
+  if (hasExited())
+    ZU_THROW_ERROR(fName, "__pCall", xExitedText());
 
   auto task = std::make_shared<ZUPCallTask>(this, method->name);
   std::int32_t id = 0;

@@ -3,6 +3,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <atomic>
 #include <climits>
 #include <cstdlib>
@@ -202,11 +203,41 @@ TEST(DeadlockTimeoutTest, ALookupThatNeverAnswersGivesUpInEachScope) {
   EXPECT_EQ(ZU::ZUBroker::deadlockTimeout(), 500);
 }
 
+// A register and an unregister of one name racing each other leave the broker and the
+// session in step: the module is in both or in neither.
+TEST(BrokerTest, RegisterAndUnregisterOfOneNameRacingEndInStep) {
+  zutest::Process process;
+  ko::log::ScopedCapture cap;  // the unregisters that come first are logged
+  for (int round = 0; round < 2000; ++round) {
+    auto module = std::make_shared<Greeter>(process.broker, "Racer");
+    std::atomic<int> ready{0};
+    auto together = [&] {
+      ready.fetch_add(1);
+      while (ready.load() < 2)
+        std::this_thread::yield();
+    };
+    std::thread withdrawer([&] {
+      together();
+      process.broker->unregisterModule("Racer");
+    });
+    together();
+    process.broker->registerModule(module);
+    withdrawer.join();
+    const auto names = process.session->services();
+    const bool inSession = std::find(names.begin(), names.end(), "Racer") != names.end();
+    const bool inBroker = process.broker->getModuleByName("Racer") != nullptr;
+    ASSERT_EQ(inSession, inBroker) << "round " << round;
+    if (inBroker) {
+      ASSERT_TRUE(process.broker->unregisterModule("Racer"));
+    }
+  }
+}
+
 TEST(BrokerManagerTest, KeepsEachBrokerOnce) {
   auto manager = std::make_shared<ZU::ZUBrokerManager>();
   auto session = std::make_shared<ko::Session>();
-  auto first = std::make_shared<ZU::ZUBroker>(session, "first", manager);
-  auto second = std::make_shared<ZU::ZUBroker>(session, "second", manager);
+  auto first = ZU::ZUBroker::create(session, "first", manager);
+  auto second = ZU::ZUBroker::create(session, "second", manager);
   manager->addBroker(first);
   manager->addBroker(second);
   manager->addBroker(first);
@@ -225,7 +256,7 @@ TEST(BrokerManagerTest, KeepsEachBrokerOnce) {
 // A broker carries its manager: the manager must not keep its brokers alive in turn.
 TEST(BrokerManagerTest, ABrokerThatIsGoneLeavesTheSet) {
   auto manager = std::make_shared<ZU::ZUBrokerManager>();
-  auto broker = std::make_shared<ZU::ZUBroker>(std::make_shared<ko::Session>(), "gone", manager);
+  auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>(), "gone", manager);
   std::weak_ptr<ZU::ZUBroker> watch = broker;
   manager->addBroker(broker);
   broker.reset();

@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "ko/anyvalue.hpp"
+#include "ko/eventloop.hpp"
 #include "ko/log.hpp"
 #include "zu/zumodule.h"
 #include "zu/zuproxy.h"
@@ -164,6 +165,36 @@ TEST(TaskEnd, ACallByIdThatThrowsStillEndsItsTask) {
   EXPECT_FALSE(refusing->wait(id, zutest::kBoundMs));
   EXPECT_FALSE(refusing->isRunning(id));
   EXPECT_TRUE(cap->containsPart("zucommon.zumodulecore", ko::log::Warning, "call refused"));
+}
+
+// exit() on a module with a loop of its own: the running posted call is waited for, the
+// one still queued never runs, and later posts are refused.
+class LoopedGreeter : public Greeter {
+ public:
+  LoopedGreeter(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
+      : Greeter(broker, name) {
+    setEventLoop(std::make_shared<ko::EventLoop>(name, 1));
+  }
+};
+
+TEST(TaskEnd, ExitWaitsForTheRunningCallAndDropsTheQueuedOnes) {
+  zutest::Process process;
+  const auto greeter = ZU::ZUModule::createModule<LoopedGreeter>(process.broker, "Looped");
+  const int running = greeter->pCall(callList({"waitForRelease"}));
+  ASSERT_TRUE(greeter->started.wait());
+  const int queued = greeter->pCall(callList({"say", "late"}));
+  std::thread exiting([&] { greeter->exit(); });
+  greeter->release.open();
+  exiting.join();
+  EXPECT_FALSE(greeter->wait(running, zutest::kBoundMs));
+  EXPECT_FALSE(greeter->wait(queued, zutest::kBoundMs));
+  EXPECT_TRUE(greeter->said().empty());
+  EXPECT_TRUE(greeter->hasExited());
+  EXPECT_EQ(zutest::errorOf([&] {
+              greeter->pCall(callList({"say", "later"}));
+            }),
+            "Module Looped has exited");
+  EXPECT_EQ(process.broker->getModuleByName("Looped"), nullptr);
 }
 
 TEST_F(TaskTest, PostsFromManyThreadsGetDistinctIdsAndAllEnd) {

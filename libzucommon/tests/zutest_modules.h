@@ -46,8 +46,8 @@ class Gate {
 // A session with its broker, as a process of the robot has them.
 struct Process {
   std::shared_ptr<ko::Session> session = std::make_shared<ko::Session>();
-  std::shared_ptr<ZU::ZUBroker> broker = std::make_shared<ZU::ZUBroker>(
-      session, "TestBroker", std::make_shared<ZU::ZUBrokerManager>());
+  std::shared_ptr<ZU::ZUBroker> broker =
+      ZU::ZUBroker::create(session, "TestBroker", std::make_shared<ZU::ZUBrokerManager>());
 };
 
 // The description of the ZUError that f raises; "<no error>" when it raises none.

@@ -215,6 +215,8 @@ class DynamicObject {
   // The loop of queued calls: the process-wide one unless set.
   void setEventLoop(std::shared_ptr<EventLoop> loop);
   std::shared_ptr<EventLoop> eventLoop() const;
+  // The loop set with setEventLoop; nullptr when the object uses the process-wide one.
+  std::shared_ptr<EventLoop> ownEventLoop() const;
 
   struct Table;
 

@@ -2,11 +2,14 @@
 // ZUBroker: registers modules as ko services of a session and finds services by name.
 // ZUBrokerManager: the process's set of brokers.
 
+#include <condition_variable>
+#include <cstdint>
 #include <map>
 #include <memory>
 #include <mutex>
 #include <optional>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "ko/anyvalue.hpp"
@@ -22,12 +25,23 @@ class ZUBrokerManager;
 // holds a weak handle on it, so the proxies of other services never keep it alive. All
 // functions are thread-safe, from any thread: the session keeps the names unique, and the
 // broker's lock guards only its table of modules, never held while the session runs its
-// subscribers (who may use the broker); lookups take no lock of the broker.
+// subscribers (who may use the broker); lookups take no lock of the broker. A register
+// and an unregister of one name that race each other end as if one came after the other.
+//
+// A broker is made by create() and owned by its owner (a host, a test); modules hold it
+// weakly. Their own threads never hold it (they look services up through the session),
+// and if any other framework thread drops the last reference, the broker, with the
+// modules it releases, is destroyed on the reaper (ko/reaper.hpp).
 class ZUBroker : public std::enable_shared_from_this<ZUBroker> {
+  struct Key {};
+
  public:
   // `manager`: the broker manager that the broker carries; by default the process's.
-  explicit ZUBroker(std::shared_ptr<ko::Session> session, std::string name = "ZUBroker",
-                    std::shared_ptr<ZUBrokerManager> manager = nullptr);
+  static std::shared_ptr<ZUBroker> create(std::shared_ptr<ko::Session> session,
+                                          std::string name = "ZUBroker",
+                                          std::shared_ptr<ZUBrokerManager> manager = nullptr);
+  ZUBroker(Key, std::shared_ptr<ko::Session> session, std::string name,
+           std::shared_ptr<ZUBrokerManager> manager);
   ~ZUBroker();
   ZUBroker(const ZUBroker&) = delete;
   ZUBroker& operator=(const ZUBroker&) = delete;
@@ -61,17 +75,23 @@ class ZUBroker : public std::enable_shared_from_this<ZUBroker> {
  private:
   struct Registration {
     std::shared_ptr<ZUModuleCore> module;
-    unsigned serviceId = 0;
+    unsigned serviceId = 0;  // 0 while the registration is being made
+    std::uint64_t serial = 0;
   };
   // Withdraws the service, without the broker's lock: the one of `registration` when the
   // broker registered it, otherwise the session's service of that name.
   bool xUnregisterModule(const std::string& name, const std::optional<Registration>& registration);
+  // Waits while another thread withdraws the session's service of that name.
+  void xWaitForWithdrawal(std::unique_lock<std::mutex>& lock, const std::string& name);
 
   const std::string fName;
   const std::shared_ptr<ko::Session> fSession;
   const std::shared_ptr<ZUBrokerManager> fManager;
   mutable std::mutex fMutex;
   std::map<std::string, Registration> fModules;
+  std::uint64_t fNextSerial = 1;
+  std::map<std::string, std::thread::id> fWithdrawing;  // by name, not ours
+  std::condition_variable fWithdrawn;
 };
 
 // The brokers of the process. The manager that a module library receives with its broker

@@ -7,6 +7,7 @@
 #include <utility>
 #include <vector>
 
+#include "ko/reaper.hpp"
 #include "zu/zubroker.h"
 #include "zu/zumodulecore.h"
 #include "zu/zuvalue.h"
@@ -36,15 +37,16 @@ class ZUModule : public ZUModuleCore {
   ZUValue getMethodHelp(const std::string& methodName);
   ZUValue getModuleHelp();
 
-  // Constructs a module T(broker, name, extra...), registers it with the broker and calls
-  // its init(). A failing init unregisters the module again and passes the error on.
+  // Constructs a module T(broker, name, extra...) with ko::makeShared (so that it never dies
+  // on a framework thread), registers it with the broker and calls its init(). A failing
+  // init unregisters the module again and passes the error on.
   template <class T, class... A>
   static std::shared_ptr<T> createModule(const std::shared_ptr<ZUBroker>& broker,
                                          const std::string& name, A&&... extra) {
     static_assert(std::is_base_of_v<ZUModuleCore, T>, "a module derives from ZUModuleCore");
     if (!broker)
       ZU_THROW_ERROR(name, "createModule", "Broker is invalid");
-    auto module = std::make_shared<T>(broker, name, std::forward<A>(extra)...);
+    auto module = ko::makeShared<T>(broker, name, std::forward<A>(extra)...);
     broker->registerModule(module);
     try {
       module->init();

@@ -16,6 +16,7 @@
 
 #include "ko/dynamicobject.hpp"
 #include "ko/future.hpp"
+#include "ko/session.hpp"
 #include "zu/zuerror.h"
 #include "zu/zuvalue.h"
 #include "zu/zuvalueconverter.h"
@@ -104,9 +105,16 @@ struct ZUMethodInfo {
 //
 // Methods are bound by the module's constructor (and possibly its init) with
 // beginMethod / describeParameter / describeReturn / bindMethod, one thread at a time.
-// Calls arrive on ko threads, several at once; posted calls run on the ko event loop.
-// The task table is guarded by a reader/writer lock, the method table and the module
-// description by their own locks. A module must be owned by a std::shared_ptr.
+// Calls arrive on ko threads, several at once; posted calls run on the module's event loop
+// (its own when it set one, otherwise the process's). The task table is guarded by a
+// reader/writer lock, the method table and the module description by their own locks.
+//
+// Lifetime. A module is owned by a std::shared_ptr made by ZUModule::createModule (or
+// ko::makeShared), so that it is never destroyed on a framework thread (see ko/reaper.hpp).
+// The threads that serve a module (its event loop, its workers) are stopped and joined by
+// its exit() or by its destructor, never by themselves, and never hold the broker: they
+// find services through findService(). exit() may be called from any thread, a posted
+// call of the module's own included, and more than once.
 class ZUModuleCore : public ko::DynamicObject, public std::enable_shared_from_this<ZUModuleCore> {
  public:
   ZUModuleCore(const std::shared_ptr<ZUBroker>& broker, std::string name);
@@ -121,7 +129,12 @@ class ZUModuleCore : public ko::DynamicObject, public std::enable_shared_from_th
 
   virtual void execute();
   virtual std::string version();
-  // Unregisters the module from its broker.
+  // Ends the module's service: posted calls are refused from now on, every posted call is
+  // asked to stop and those not begun yet never run (they end with the error "Module
+  // <name> has exited"); the module's own event loop, if it has one, is stopped, which
+  // waits for the posted calls running on it (but the caller's own); then the module is
+  // unregistered from its broker. An override stops and joins the module's own workers
+  // first, then calls this.
   virtual void exit();
   virtual std::string httpGet();
   virtual void init();
@@ -137,6 +150,14 @@ class ZUModuleCore : public ko::DynamicObject, public std::enable_shared_from_th
 
   const std::string& getName() const noexcept { return fName; }
   std::shared_ptr<ZUBroker> getParentBroker() const;
+  // The session of the module's broker, held strongly (a session never keeps a module alive).
+  std::shared_ptr<ko::Session> getSession() const;
+  // The service of that name, looked up through the session in the "local" scope, then in
+  // any scope, each lookup waiting at most the broker's deadlock time-out; an empty handle
+  // when it is not found. Takes no hold on the broker: for the module's own threads.
+  ko::AnyObject findService(const std::string& name) const;
+  // Whether exit() has begun.
+  bool hasExited() const noexcept { return fExited.load(std::memory_order_acquire); }
   std::string getModuleDescription() const;
   void setModuleDescription(const std::string& description);
 
@@ -179,12 +200,17 @@ class ZUModuleCore : public ko::DynamicObject, public std::enable_shared_from_th
   // Called by the broker that registers the module.
   friend class ZUBroker;
   void setParentBroker(const std::weak_ptr<ZUBroker>& broker);
+  // Asks every posted call of `method` (every posted call when empty) to stop.
+  void xStopTasks(const std::string& method = "");
 
  private:
   class CurrentTaskScope;
   class TaskJob;
 
   [[noreturn]] void xThrowBindError(const std::string& reason) const;
+  std::string xExitedText() const;
+  // Ends a posted call that came too late to run (the module has exited).
+  void xDropTask(const std::shared_ptr<ZUPCallTask>& task);
   void xBind(ko::MethodBinding binding);
   // Removes a task at its end, from the thread that runs it.
   void xRemoveTask(std::int32_t id);
@@ -195,9 +221,11 @@ class ZUModuleCore : public ko::DynamicObject, public std::enable_shared_from_th
 
   const std::string fName;
 
-  mutable std::mutex fStateMutex;  // broker link and description
+  mutable std::mutex fStateMutex;  // broker link, session and description
   std::weak_ptr<ZUBroker> fBroker;
+  std::shared_ptr<ko::Session> fSession;
   std::string fModuleDescription;
+  std::atomic<bool> fExited{false};
 
   std::mutex fBindMutex;
   std::optional<ZUMethodInfo> fPendingMethod;
