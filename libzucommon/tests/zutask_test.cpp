@@ -13,6 +13,7 @@
 #include "ko/anyvalue.hpp"
 #include "ko/eventloop.hpp"
 #include "ko/log.hpp"
+#include "ko_test_helpers.hpp"
 #include "zu/zumodule.h"
 #include "zu/zuproxy.h"
 #include "zutest_modules.h"
@@ -184,6 +185,7 @@ TEST(TaskEnd, ExitWaitsForTheRunningCallAndDropsTheQueuedOnes) {
   ASSERT_TRUE(greeter->started.wait());
   const int queued = greeter->pCall(callList({"say", "late"}));
   std::thread exiting([&] { greeter->exit(); });
+  ASSERT_TRUE(ko::test::eventually([&] { return greeter->hasExited(); }));
   greeter->release.open();
   exiting.join();
   EXPECT_FALSE(greeter->wait(running, zutest::kBoundMs));
