@@ -10,8 +10,7 @@
 namespace robotsim {
 
 Robot::Robot(RobotOptions options, std::shared_ptr<ZU::ZUBroker> broker)
-    : fBroker(broker ? std::move(broker)
-                     : std::make_shared<ZU::ZUBroker>(std::make_shared<ko::Session>())),
+    : fBroker(broker ? std::move(broker) : ZU::ZUBroker::create(std::make_shared<ko::Session>())),
       fTimeline(std::make_shared<Timeline>()) {
   using ZU::ZUModule;
   try {

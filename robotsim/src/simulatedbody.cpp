@@ -5,6 +5,8 @@
 #include <limits>
 #include <utility>
 
+#include "ko/log.hpp"
+#include "ko/reaper.hpp"
 #include "robotsim/jointmodel.h"
 
 namespace robotsim {
@@ -89,8 +91,14 @@ void SimulatedBody::xNotifyEnded(const std::vector<int>& ids, bool interrupted) 
   }
   if (!listener)
     return;
-  for (const int id : ids)
-    listener(id, interrupted);
+  for (const int id : ids) {
+    try {
+      listener(id, interrupted);
+    } catch (const std::exception& e) {
+      KO_LOG_ERROR("robotsim.motion")
+          << "The end of move " << id << " could not be told: " << e.what();
+    }
+  }
 }
 
 int SimulatedBody::startBezierMove(const std::vector<JointTrack>& tracks, double minDuration) {
@@ -221,6 +229,7 @@ std::vector<int> SimulatedBody::xTick(Clock::time_point now) {
 }
 
 void SimulatedBody::xRun() {
+  const ko::FrameworkThreadScope framework;
   std::unique_lock lock(fMutex);
   while (!fQuit) {
     if (fMoves.empty()) {

@@ -9,6 +9,7 @@
 #include <utility>
 
 #include "ko/log.hpp"
+#include "ko/reaper.hpp"
 
 namespace robotsim {
 
@@ -43,42 +44,69 @@ SpeechPlayer::SpeechPlayer(SpeechPlayerListener& listener, double playbackRate,
       fThread([this] { xRun(); }) {}
 
 SpeechPlayer::~SpeechPlayer() {
+  shutdown();
+}
+
+void SpeechPlayer::shutdown() {
+  std::lock_guard shutdownLock(fShutdownMutex);
   {
     std::lock_guard lock(fMutex);
     fQuit = true;
   }
   stopAll();
   fQueued.notify_all();
-  fThread.join();
+  if (fThread.joinable())
+    fThread.join();
+  // The notifier tells what is left, then leaves; later news is told by whoever has it.
   {
     std::lock_guard lock(fNotifyMutex);
     fNotifyQuit = true;
   }
   fNotifyQueued.notify_all();
-  fNotifier.join();
+  if (fNotifier.joinable())
+    fNotifier.join();
 }
 
 void SpeechPlayer::xNotify(std::function<void()> job) {
   {
     std::lock_guard lock(fNotifyMutex);
-    fNotifications.push_back(std::move(job));
+    if (!fNotifierGone) {
+      fNotifications.push_back(std::move(job));
+      job = nullptr;
+    }
   }
-  fNotifyQueued.notify_one();
+  if (job)
+    xRunNotification(job);
+  else
+    fNotifyQueued.notify_one();
+}
+
+void SpeechPlayer::xRunNotification(const std::function<void()>& job) noexcept {
+  try {
+    job();
+  } catch (const std::exception& e) {
+    KO_LOG_ERROR("robotsim.texttospeech") << "A speech listener threw: " << e.what();
+  } catch (...) {
+    KO_LOG_ERROR("robotsim.texttospeech") << "A speech listener threw an unknown exception";
+  }
 }
 
 void SpeechPlayer::xRunNotifier() {
+  const ko::FrameworkThreadScope framework;
   raisePlayerPriority();
   for (;;) {
     std::function<void()> job;
     {
       std::unique_lock lock(fNotifyMutex);
       fNotifyQueued.wait(lock, [this] { return fNotifyQuit || !fNotifications.empty(); });
-      if (fNotifications.empty())
+      if (fNotifications.empty()) {
+        fNotifierGone = true;
         return;
+      }
       job = std::move(fNotifications.front());
       fNotifications.pop_front();
     }
-    job();
+    xRunNotification(job);
   }
 }
 
@@ -133,6 +161,7 @@ void SpeechPlayer::stopAll() {
 }
 
 void SpeechPlayer::xRun() {
+  const ko::FrameworkThreadScope framework;
   raisePlayerPriority();
   for (;;) {
     std::shared_ptr<SpeechUtterance> utterance;
@@ -269,7 +298,8 @@ void SpeechPlayer::xPlay(const std::shared_ptr<SpeechUtterance>& shared) {
 void SpeechPlayer::xEnd(const std::shared_ptr<SpeechUtterance>& utterance, bool stopped,
                         std::int64_t playedUs, const std::string& error) {
   xNotify([this, utterance, stopped, playedUs, error] {
-    fListener.onEnded(*utterance, stopped, playedUs, error);
+    // The text ends for its caller whatever the listener does.
+    xRunNotification([&] { fListener.onEnded(*utterance, stopped, playedUs, error); });
     if (error.empty())
       utterance->ended.trySetValue(stopped);
     else

@@ -6,7 +6,9 @@
 // then hands the news to a second thread, the notifier, which tells the listener in
 // order, so that the time of the next mark never waits for a listener. At a blocking mark
 // the player stops its clock until the notifier's hold is released. Both threads ask for
-// a real-time priority. Any thread may queue a text or stop one.
+// a real-time priority, and are framework threads (ko/reaper.hpp). A listener that throws
+// is logged; the notifier goes on. Any thread may queue a text or stop one; a text queued
+// after the shutdown ends at once, stopped, and is told in the queuing thread.
 
 #include <chrono>
 #include <condition_variable>
@@ -68,7 +70,7 @@ class SpeechPlayer {
   // `recording` may be null.
   SpeechPlayer(SpeechPlayerListener& listener, double playbackRate,
                std::shared_ptr<SpeechRecording> recording);
-  // Stops every text and joins the thread.
+  // As shutdown().
   ~SpeechPlayer();
   SpeechPlayer(const SpeechPlayer&) = delete;
   SpeechPlayer& operator=(const SpeechPlayer&) = delete;
@@ -77,11 +79,15 @@ class SpeechPlayer {
   // Stops the text `id`, playing or queued; false when there is none.
   bool stop(int id);
   void stopAll();
+  // Stops every text, tells what is left and joins both threads. Idempotent; not from a
+  // listener.
+  void shutdown();
 
  private:
   void xRun();
   void xRunNotifier();
   void xNotify(std::function<void()> job);
+  static void xRunNotification(const std::function<void()>& job) noexcept;
   void xPlay(const std::shared_ptr<SpeechUtterance>& utterance);
   void xEnd(const std::shared_ptr<SpeechUtterance>& utterance, bool stopped, std::int64_t playedUs,
             const std::string& error);
@@ -102,6 +108,8 @@ class SpeechPlayer {
   std::condition_variable fNotifyQueued;
   std::deque<std::function<void()>> fNotifications;
   bool fNotifyQuit = false;
+  bool fNotifierGone = false;
+  std::mutex fShutdownMutex;
   std::thread fNotifier;
   std::thread fThread;
 };

@@ -1,6 +1,9 @@
 #include "robotsim/timeline.h"
 
+#include <exception>
+
 #include "ko/json.hpp"
+#include "ko/log.hpp"
 
 namespace robotsim {
 
@@ -40,8 +43,17 @@ void Timeline::record(std::string service, std::string operation, ko::AnyValue a
     entries_.push_back(entry);
     listeners = listeners_;
   }
-  for (const auto& listener : listeners)
-    listener(entry);
+  for (const auto& listener : listeners) {
+    try {
+      listener(entry);
+    } catch (const std::exception& e) {
+      KO_LOG_ERROR("robotsim.timeline") << "A listener of the timeline threw on " << entry.service
+                                        << "." << entry.operation << ": " << e.what();
+    } catch (...) {
+      KO_LOG_ERROR("robotsim.timeline")
+          << "A listener of the timeline threw on " << entry.service << "." << entry.operation;
+    }
+  }
 }
 
 std::vector<TimelineEntry> Timeline::entries() const {

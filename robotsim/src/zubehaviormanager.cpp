@@ -9,6 +9,7 @@
 #include "ko/genericobject.hpp"
 #include "ko/log.hpp"
 #include "ko/path.hpp"
+#include "ko/reaper.hpp"
 #include "zu/zubroker.h"
 #include "zu/zuerror.h"
 #include "zu/zuserviceproxies.h"
@@ -64,6 +65,18 @@ ZUBehaviorManager::ZUBehaviorManager(const std::shared_ptr<ZU::ZUBroker>& broker
 }
 
 ZUBehaviorManager::~ZUBehaviorManager() {
+  xShutdown();
+  // Left by an exit from a subscriber. (A module made without ko::makeShared could even
+  // die on that thread; it cannot wait for itself.)
+  if (fDeliveryThread.joinable()) {
+    if (fDeliveryThread.get_id() == std::this_thread::get_id())
+      fDeliveryThread.detach();
+    else
+      fDeliveryThread.join();
+  }
+}
+
+void ZUBehaviorManager::xShutdown() {
   try {
     stopAllBehaviors();
   } catch (const std::exception& e) {
@@ -75,9 +88,9 @@ ZUBehaviorManager::~ZUBehaviorManager() {
     fQuit = true;
   }
   fDeliveryWake.notify_all();
-  if (fDeliveryThread.get_id() == std::this_thread::get_id())
-    fDeliveryThread.detach();
-  else
+  // From a subscriber of the signal, the thread is left to the destructor.
+  std::lock_guard lock(fJoinMutex);
+  if (fDeliveryThread.joinable() && fDeliveryThread.get_id() != std::this_thread::get_id())
     fDeliveryThread.join();
 }
 
@@ -333,10 +346,7 @@ void ZUBehaviorManager::xRaise(const std::string& key, const std::vector<std::st
   for (const auto& behavior : behaviors)
     value.arrayPush(ZU::ZUValue(behavior));
   try {
-    const auto broker = getParentBroker();
-    if (!broker)
-      ZU_THROW_ERROR(getName(), "raiseEvent", "The module has no broker");
-    ZU::ZUMemoryProxy(broker).raiseEvent(key, value);
+    ZU::ZUMemoryProxy(findService(ZU::ZUMemoryProxy::kServiceName)).raiseEvent(key, value);
   } catch (const std::exception& e) {
     KO_LOG_WARNING(kCategory) << "Cannot raise " << key << ": " << e.what();
   }
@@ -350,8 +360,7 @@ ko::AnyObject ZUBehaviorManager::xMotion(const std::string& method) {
     return fMotion;
   fMotion.reset();
   fMotionLink = ko::kInvalidSignalLink;
-  const auto broker = getParentBroker();
-  ko::AnyObject motion = broker ? broker->service(kMotionService) : nullptr;
+  ko::AnyObject motion = findService(kMotionService);
   if (!motion)
     ZU_THROW_ERROR(getName(), method, std::string(kMotionService) + " is not available");
   std::weak_ptr<ZU::ZUModuleCore> weak = weak_from_this();
@@ -389,6 +398,12 @@ std::uint64_t ZUBehaviorManager::xStart(const std::string& method, const std::st
     descriptor = it->second.descriptor;
     serial = fNextSerial++;
     fRunning[behavior] = Running{serial, 0, false};
+    // The stop of an earlier run that is not told yet would be heard after this start
+    // returns, as the stop of this run: it is recorded but not signalled.
+    for (auto& delivery : fDeliveries) {
+      if (!delivery.started && delivery.behavior == behavior)
+        delivery.superseded = true;
+    }
   }
   auto pendingStarts = [this] {
     return std::any_of(fRunning.begin(), fRunning.end(),
@@ -464,6 +479,7 @@ void ZUBehaviorManager::xFinish(std::string behavior, bool interrupted) {
 }
 
 void ZUBehaviorManager::xDeliver() {
+  const ko::FrameworkThreadScope framework;
   std::unique_lock lock(fMutex);
   for (;;) {
     fDeliveryWake.wait(lock, [this] { return fQuit || !fDeliveries.empty(); });
@@ -472,12 +488,19 @@ void ZUBehaviorManager::xDeliver() {
     const Delivery delivery = std::move(fDeliveries.front());
     fDeliveries.pop_front();
     lock.unlock();
-    if (delivery.started) {
-      xRecord("startBehavior", ko::AnyValue::list({delivery.behavior}));
-    } else {
-      xRecord("behaviorStopped", ko::AnyValue::list({delivery.behavior}),
-              delivery.interrupted ? "stopped" : "ended");
-      (*fBehaviorStopped)(delivery.behavior);
+    // The thread outlives whatever a news throws.
+    try {
+      if (delivery.started) {
+        xRecord("startBehavior", ko::AnyValue::list({delivery.behavior}));
+      } else {
+        xRecord("behaviorStopped", ko::AnyValue::list({delivery.behavior}),
+                delivery.interrupted ? "stopped" : "ended");
+        if (!delivery.superseded)
+          (*fBehaviorStopped)(delivery.behavior);
+      }
+    } catch (const std::exception& e) {
+      KO_LOG_ERROR(kCategory) << "The news of " << quoted(delivery.behavior)
+                              << " could not be told: " << e.what();
     }
     lock.lock();
   }
@@ -555,7 +578,7 @@ std::vector<std::string> ZUBehaviorManager::getRunningBehaviors() {
 }
 
 void ZUBehaviorManager::exit() {
-  stopAllBehaviors();
+  xShutdown();
   ZU::ZUModule::exit();
 }
 

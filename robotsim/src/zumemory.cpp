@@ -30,6 +30,11 @@ ZUMemory::~ZUMemory() {
   fDeliveryLoop->stop();
 }
 
+void ZUMemory::exit() {
+  fDeliveryLoop->stop();
+  ZU::ZUModule::exit();
+}
+
 void ZUMemory::xBindMethods() {
   setModuleDescription("The memory and event service of the simulated robot.");
   beginMethod("declareEvent", kModuleClass, "Declares an event.");
@@ -184,14 +189,22 @@ void ZUMemory::unsubscribeToMicroEvent(const std::string& name, const std::strin
 void ZUMemory::xUnsubscribe(const std::string& name, const std::string& module,
                             const char* method) {
   {
-    std::lock_guard lock(fMutex);
+    std::unique_lock lock(fMutex);
     const auto event = fSubscriptions.find(name);
-    if (event == fSubscriptions.end() || event->second.erase(module) == 0) {
+    if (event == fSubscriptions.end() || event->second.count(module) == 0) {
       ZU_THROW_ERROR(getName(), method,
                      "Module '" + module + "' is not subscribed to the event '" + name + "'");
     }
+    const std::uint64_t serial = event->second.at(module).serial;
+    event->second.erase(module);
     if (event->second.empty())
       fSubscriptions.erase(event);
+    // A callback of the subscription running in another thread ends first.
+    fDelivered.wait(lock, [&] {
+      const auto inbox = fInboxes.find(module);
+      return inbox == fInboxes.end() || inbox->second.delivering != serial ||
+             inbox->second.thread == std::this_thread::get_id();
+    });
   }
   if (fOptions.timeline)
     fOptions.timeline->record(getName(), method, ko::AnyValue::List{name, module});
@@ -232,14 +245,25 @@ void ZUMemory::xDrain(const std::string& module) {
       }
       delivery = std::move(inbox.queue.front());
       inbox.queue.pop_front();
+      // Decided under the lock that an unsubscribe takes: either it comes first and the
+      // delivery is dropped, or it waits for the callback to return.
+      if (!xIsCurrent(delivery))
+        continue;
+      inbox.delivering = delivery.subscription.serial;
+      inbox.thread = std::this_thread::get_id();
     }
-    if (xIsCurrent(delivery))
-      xDeliver(delivery);
+    xDeliver(delivery);
+    {
+      std::lock_guard lock(fMutex);
+      Inbox& inbox = fInboxes[module];
+      inbox.delivering = 0;
+      inbox.thread = {};
+    }
+    fDelivered.notify_all();
   }
 }
 
 bool ZUMemory::xIsCurrent(const Delivery& delivery) const {
-  std::lock_guard lock(fMutex);
   const auto event = fSubscriptions.find(delivery.event);
   if (event == fSubscriptions.end())
     return false;
@@ -249,13 +273,8 @@ bool ZUMemory::xIsCurrent(const Delivery& delivery) const {
 
 void ZUMemory::xDeliver(const Delivery& delivery) {
   const Subscription& s = delivery.subscription;
-  ko::AnyObject object;
-  if (const auto broker = getParentBroker()) {
-    const auto found = broker->session()->service(s.module, "local");
-    if (found.wait(ZU::ZUBroker::deadlockTimeout()) == ko::FutureState::FinishedWithValue)
-      object = found.value();
-  }
-  if (!object || !object->isValid()) {
+  const ko::AnyObject object = findService(s.module);
+  if (!object) {
     KO_LOG_ERROR(kCategory) << "Module " << s.module << " is gone: event " << delivery.event
                             << " not delivered";
     return;

@@ -52,7 +52,7 @@ void ZURobotPosture::setPostureFamily(const std::string& family) {
   if (fTimeline)
     fTimeline->record(getName(), "setPostureFamily", ko::AnyValue::List{family});
   try {
-    ZU::ZUMemoryProxy memory(getParentBroker());
+    ZU::ZUMemoryProxy memory(findService(ZU::ZUMemoryProxy::kServiceName));
     memory.raiseEvent("PostureFamilyChanged", ZU::ZUValue(family));
   } catch (const std::exception& e) {
     KO_LOG_ERROR("robotsim.posture") << "Cannot raise PostureFamilyChanged: " << e.what();

@@ -19,16 +19,6 @@ constexpr const char* kCategory = "robotsim.texttospeech";
 constexpr const char* kModuleClass = "ZUTextToSpeech";
 constexpr std::size_t kHistorySize = 256;
 
-// The service of that name, without the broker's error lines for a missing one.
-ko::AnyObject findService(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name) {
-  if (!broker)
-    return nullptr;
-  const auto found = broker->session()->service(name, "local");
-  if (found.wait(ZU::ZUBroker::deadlockTimeout()) != ko::FutureState::FinishedWithValue)
-    return nullptr;
-  return found.value();
-}
-
 ko::AnyValue markResult(const SpeechMarkRecord& record) {
   ko::AnyValue::Map result{{"audioUs", record.audioUs}, {"playbackUs", record.playbackUs}};
   if (record.blocking)
@@ -58,20 +48,29 @@ class ZUTextToSpeech::Listener : public SpeechPlayerListener {
 
   ko::Future<void> onBlockingBookmark(const SpeechUtterance& u, std::int32_t number) override {
     const std::string& handler = fTts.fOptions.blockingBookmarkModule;
-    ko::AnyObject object = findService(fTts.getParentBroker(), handler);
+    fTts.xRecord("hold", ko::AnyValue::List{u.id, number});
+    ko::AnyObject object = fTts.findService(handler);
     if (!object) {
       KO_LOG_WARNING(kCategory) << "No module " << handler << " to hold text " << u.id
                                 << " at bookmark " << number;
       return ko::makeFutureValue();
     }
-    return fTts.fHoldLoop->async([object = std::move(object), handler, number] {
-      try {
-        object->call<void>("_mrkpauseCallback", number);
-      } catch (const std::exception& e) {
-        KO_LOG_ERROR(kCategory) << handler << "._mrkpauseCallback(" << number
-                                << ") failed: " << e.what();
-      }
-    });
+    // A call still queued when its text is stopped is withdrawn: it would hold whatever
+    // text is spoken when it comes.
+    return fTts.fHoldLoop->async(
+        [object = std::move(object), handler, number, performance = u.performance, id = u.id] {
+          if (performance->isCancelled()) {
+            KO_LOG_VERBOSE(kCategory) << "Text " << id << " was stopped: no call of " << handler
+                                      << "._mrkpauseCallback(" << number << ")";
+            return;
+          }
+          try {
+            object->call<void>("_mrkpauseCallback", number);
+          } catch (const std::exception& e) {
+            KO_LOG_ERROR(kCategory)
+                << handler << "._mrkpauseCallback(" << number << ") failed: " << e.what();
+          }
+        });
   }
 
   void onMarkDone(const SpeechUtterance& u, const SpeechMarkRecord& record) override {
@@ -121,7 +120,12 @@ ZUTextToSpeech::ZUTextToSpeech(const std::shared_ptr<ZU::ZUBroker>& broker, cons
 }
 
 ZUTextToSpeech::~ZUTextToSpeech() {
-  fPlayer.reset();
+  xStopThreads();
+}
+
+void ZUTextToSpeech::xStopThreads() {
+  fPlayer->shutdown();
+  fHoldLoop->stop();
 }
 
 void ZUTextToSpeech::xBindMethods() {
@@ -168,6 +172,11 @@ void ZUTextToSpeech::xBindMethods() {
 
 void ZUTextToSpeech::exit() {
   stopAll();
+  // The posted says end with their stopped texts, then the player and the blocking calls
+  // stop: a say's end is told by the player.
+  if (const auto loop = ownEventLoop())
+    loop->stop();
+  xStopThreads();
   ZU::ZUModule::exit();
 }
 
@@ -182,8 +191,10 @@ void ZUTextToSpeech::xStopText(int id) {
 }
 
 void ZUTextToSpeech::stop(int id) {
-  xStopText(id);
+  // The task's flag first, then the texts: say() registers its text, then reads the flag,
+  // so one of the two sees the other.
   ZU::ZUModule::stop(id);
+  xStopText(id);
 }
 
 void ZUTextToSpeech::say(const std::string& text) {
@@ -191,10 +202,12 @@ void ZUTextToSpeech::say(const std::string& text) {
   SpeechScript script = parseSpeechText(text);
   Settings settings;
   int id = 0;
+  std::uint64_t generation = 0;
   {
     std::lock_guard lock(fMutex);
     settings = fSettings;
     id = task ? task->id() : fNextDirectId++;
+    generation = fStopAllGeneration;
   }
   for (const auto& note : script.notes) {
     KO_LOG_WARNING(kCategory) << "Text " << id << ": " << note;
@@ -206,12 +219,14 @@ void ZUTextToSpeech::say(const std::string& text) {
       markCount, fSynthesizer->sampleRate(), fOptions.recordAudio && fSynthesizer->producesAudio());
   auto utterance = std::make_shared<SpeechUtterance>(id, text, std::move(script), performance);
   const ko::Future<bool> ended = utterance->ended.future();
+  bool stoppedAll = false;
   {
     std::lock_guard lock(fMutex);
     fTexts[id] = utterance;
+    stoppedAll = fStopAllGeneration != generation;
   }
   // A stop that came before the text was known.
-  if (task && task->isStopRequested())
+  if (stoppedAll || (task && task->isStopRequested()))
     performance->cancel();
 
   SpeechVoiceSettings voice;
@@ -240,9 +255,13 @@ void ZUTextToSpeech::say(const std::string& text) {
 }
 
 void ZUTextToSpeech::stopAll() {
+  // Posted says that have not begun end as soon as they do; those that have begun but are
+  // not registered yet see the new generation.
+  xStopTasks("say");
   std::vector<std::shared_ptr<SpeechUtterance>> pending;
   {
     std::lock_guard lock(fMutex);
+    ++fStopAllGeneration;
     for (const auto& [id, u] : fTexts)
       pending.push_back(u);
   }
@@ -355,7 +374,7 @@ void ZUTextToSpeech::xRaise(const std::string& key, const ZU::ZUValue& value) {
   {
     std::lock_guard lock(fMutex);
     if (!fMemory || !fMemory->isValid())
-      fMemory = findService(getParentBroker(), fOptions.memoryModule);
+      fMemory = findService(fOptions.memoryModule);
     memory = fMemory;
   }
   if (!memory) {

@@ -91,7 +91,7 @@ class AudioPlayerService : public testing::Test {
     writeWav(folder_.path() / "tones" / "beep.wav", 8000, 1, 1600);   // 0.2 s
     writeWav(folder_.path() / "tones" / "Long.WAV", 8000, 1, 80000);  // 10 s
     session_ = std::make_shared<ko::Session>();
-    broker_ = std::make_shared<ZU::ZUBroker>(session_);
+    broker_ = ZU::ZUBroker::create(session_);
     timeline_ = std::make_shared<Timeline>();
     waiter_ = std::make_unique<TimelineWaiter>(*timeline_);
     player_ = ZU::ZUModule::createModule<ZUAudioPlayer>(broker_, "ZUAudioPlayer", timeline_,
@@ -208,7 +208,7 @@ TEST_F(AudioPlayerService, BadPlaysAreErrors) {
 
 TEST(StarterSounds, BellsAreShortRealSounds) {
   auto session = std::make_shared<ko::Session>();
-  auto broker = std::make_shared<ZU::ZUBroker>(session);
+  auto broker = ZU::ZUBroker::create(session);
   auto timeline = std::make_shared<Timeline>();
   auto player = ZU::ZUModule::createModule<ZUAudioPlayer>(broker, "ZUAudioPlayer", timeline);
   ZU::ZUAudioPlayerProxy proxy(broker);

@@ -3,6 +3,7 @@
 // events, malformed descriptors, and the starter library shipped in share/.
 
 #include <algorithm>
+#include <atomic>
 #include <chrono>
 #include <condition_variable>
 #include <filesystem>
@@ -11,6 +12,7 @@
 #include <mutex>
 #include <set>
 #include <sstream>
+#include <stdexcept>
 #include <string>
 #include <vector>
 
@@ -19,6 +21,7 @@
 
 #include "ko/log.hpp"
 #include "ko/session.hpp"
+#include "ko_test_helpers.hpp"
 #include "robotsim/behaviorlibrary.h"
 #include "robotsim/jointmodel.h"
 #include "robotsim/timeline.h"
@@ -103,7 +106,7 @@ class Robot {
  public:
   explicit Robot(const fs::path& root)
       : session(std::make_shared<ko::Session>()),
-        broker(std::make_shared<ZU::ZUBroker>(session)),
+        broker(ZU::ZUBroker::create(session)),
         timeline(std::make_shared<Timeline>()),
         waiter(*timeline),
         memory(ZU::ZUModule::createModule<FakeMemory>(broker, "ZUMemory")),
@@ -246,6 +249,50 @@ TEST_F(BehaviorManagerService, StopAllEndsEveryBehaviour) {
   EXPECT_TRUE(robot_->recorder->waitFor(kLongHead));
   EXPECT_TRUE(robot_->recorder->waitFor(kLongArm));
   EXPECT_TRUE(robot_->motionProxy.areResourcesAvailable({"Body"}));
+}
+
+// A run's stop that is not told yet when the behaviour starts again is not heard after
+// that start: the subscribers hear one stop, the later run's.
+TEST_F(BehaviorManagerService, AnUntoldStopIsNotHeardAfterTheNextStart) {
+  ko::test::Gate holding, release;
+  std::atomic<bool> first{true};
+  robot_->proxy.getObject()->connect("behaviorStopped", [&](const std::string&) {
+    if (first.exchange(false)) {
+      holding.open();
+      release.wait();
+    }
+  });
+  robot_->proxy.startBehavior(kLongArm);
+  robot_->proxy.stopBehavior(kLongArm);  // its news holds the delivery thread
+  ASSERT_TRUE(holding.wait());
+  robot_->proxy.startBehavior(kLongHead);
+  robot_->proxy.stopBehavior(kLongHead);   // a stop not told yet...
+  robot_->proxy.startBehavior(kLongHead);  // ...when the behaviour starts again
+  release.open();
+  robot_->proxy.stopBehavior(kLongHead);
+  // Everything told before this second news of kLongArm has been told.
+  robot_->proxy.startBehavior(kLongArm);
+  robot_->proxy.stopBehavior(kLongArm);
+  ASSERT_TRUE(robot_->recorder->waitFor(kLongArm, 2));
+  EXPECT_THAT(robot_->recorder->stopped(), ElementsAre(kLongArm, kLongHead, kLongArm));
+  // The timeline keeps both ends.
+  EXPECT_EQ(robot_->timeline->entries("ZUBehaviorManager", "behaviorStopped").size(), 4u);
+}
+
+// A listener of the timeline that throws ends neither the delivery thread nor the news.
+TEST_F(BehaviorManagerService, AThrowingTimelineListenerIsLoggedAndTheNewsGoOn) {
+  ko::log::ScopedCapture cap;
+  robot_->timeline->addListener([](const TimelineEntry& entry) {
+    if (entry.operation == "behaviorStopped")
+      throw std::runtime_error("viewer gone");
+  });
+  robot_->proxy.startBehavior(kLongHead);
+  robot_->proxy.stopBehavior(kLongHead);
+  robot_->proxy.startBehavior(kLongArm);
+  robot_->proxy.stopBehavior(kLongArm);
+  ASSERT_TRUE(robot_->recorder->waitFor(kLongHead));
+  ASSERT_TRUE(robot_->recorder->waitFor(kLongArm));
+  EXPECT_TRUE(cap->containsPart("robotsim.timeline", ko::log::Error, "viewer gone"));
 }
 
 TEST_F(BehaviorManagerService, StartErrors) {
@@ -416,7 +463,7 @@ std::size_t descriptorFiles(const fs::path& root) {
 TEST(StarterLibrary, EveryBehaviourIsValid) {
   ko::log::ScopedCapture capture(ko::log::Warning);
   auto session = std::make_shared<ko::Session>();
-  auto broker = std::make_shared<ZU::ZUBroker>(session);
+  auto broker = ZU::ZUBroker::create(session);
   auto manager = ZU::ZUModule::createModule<ZUBehaviorManager>(broker, "ZUBehaviorManager");
   ZU::ZUBehaviorManagerProxy proxy(broker);
 

@@ -2,8 +2,10 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <atomic>
 #include <chrono>
 #include <condition_variable>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <string>
@@ -11,7 +13,9 @@
 #include <vector>
 
 #include "ko/log.hpp"
+#include "ko/reaper.hpp"
 #include "ko/session.hpp"
+#include "ko_test_helpers.hpp"
 #include "robotsim/zumemory.h"
 #include "support/recording_module.h"
 #include "zu/zubroker.h"
@@ -29,7 +33,7 @@ constexpr auto kBound = 10s;
 class MemoryTest : public ::testing::Test {
  protected:
   MemoryTest()
-      : broker(std::make_shared<ZU::ZUBroker>(std::make_shared<ko::Session>())),
+      : broker(ZU::ZUBroker::create(std::make_shared<ko::Session>())),
         timeline(std::make_shared<Timeline>()),
         memoryModule(
             ZU::ZUModule::createModule<ZUMemory>(broker, "ZUMemory", ZUMemoryOptions{timeline, 4})),
@@ -230,6 +234,98 @@ TEST_F(MemoryTest, BadSubscriptionsAndKeysAreRefused) {
   EXPECT_THROW(memory.subscribeToEvent("e", "First", ""), ZU::ZUError);
   EXPECT_THROW(memory.raiseEvent("", ZU::ZUValue(1)), ZU::ZUError);
   EXPECT_THROW(memory.declareEvent("", "First"), ZU::ZUError);
+}
+
+// ---- lifetimes --------------------------------------------------------------------
+
+// A subscriber for the lifetime tests: its callback runs a hook that the test gives.
+class HookedModule : public ZU::ZUModule {
+ public:
+  using Hook = std::function<void(const HookedModule& self, const std::string& key)>;
+  HookedModule(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name, Hook hook)
+      : ZU::ZUModule(broker, name), fHook(std::move(hook)) {
+    beginMethod("onEvent", "HookedModule", "Runs the test's hook.");
+    describeParameter("memoryKey", "The event.");
+    describeParameter("value", "Its value.");
+    describeParameter("message", "The subscription's message.");
+    bindMethod(&HookedModule::onEvent);
+  }
+  void onEvent(const std::string& key, const ZU::ZUValue&, const std::string&) {
+    fHook(*this, key);
+  }
+
+ private:
+  const Hook fHook;
+};
+
+// A callback that holds the memory service, as one that calls back into it does, may
+// outlive every owner of the service: the service then dies off its delivery threads, once
+// the callback has returned.
+TEST(MemoryLifetime, ACallbackHoldingTheServiceMayOutliveItsOwners) {
+  ko::test::Gate entered, ownersGone, released;
+  std::weak_ptr<ZUMemory> watch;
+  {
+    auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
+    auto memoryModule = ZU::ZUModule::createModule<ZUMemory>(broker, "ZUMemory");
+    watch = memoryModule;
+    auto holder = ZU::ZUModule::createModule<HookedModule>(
+        broker, "Holder", [&](const HookedModule& self, const std::string&) {
+          const ko::AnyObject found = self.findService("ZUMemory");
+          std::shared_ptr<ko::DynamicObject> held = found ? found->dynamicObject() : nullptr;
+          entered.open();
+          ownersGone.wait();
+          held.reset();  // the last reference, in a delivery thread
+          released.open();
+        });
+    ZU::ZUMemoryProxy memory(broker);
+    memory.subscribeToEvent("e", "Holder", "onEvent");
+    memory.raiseEvent("e", ZU::ZUValue(1));
+    ASSERT_TRUE(entered.wait());
+  }
+  ownersGone.open();
+  ASSERT_TRUE(released.wait());
+  ko::waitForReaper();
+  EXPECT_TRUE(watch.expired());
+}
+
+// Once unsubscribeToEvent returns, no callback of that subscription runs or begins.
+TEST(MemoryLifetime, NoCallbackRunsOnceTheUnsubscribeHasReturned) {
+  auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
+  auto memoryModule = ZU::ZUModule::createModule<ZUMemory>(broker, "ZUMemory");
+  std::atomic<bool> unsubscribed{false};
+  std::atomic<int> late{0};
+  ko::test::Counter ticks;
+  auto subscriber = ZU::ZUModule::createModule<HookedModule>(
+      broker, "Late", [&](const HookedModule&, const std::string& key) {
+        const bool tick = key == "tick";
+        if (tick && unsubscribed)
+          ++late;
+        for (int i = 0; i < 20; ++i)
+          std::this_thread::yield();
+        if (tick && unsubscribed)
+          ++late;
+        ticks.increment();
+      });
+  ZU::ZUMemoryProxy memory(broker);
+  for (int round = 0; round < 100; ++round) {
+    unsubscribed = false;
+    memory.subscribeToEvent("tick", "Late", "onEvent");
+    const int before = ticks.value();
+    std::thread raiser([&] {
+      for (int i = 0; i < 40; ++i)
+        memory.raiseEvent("tick", ZU::ZUValue(i));
+    });
+    ASSERT_TRUE(ticks.waitFor(before + 1));
+    memory.unsubscribeToEvent("tick", "Late");
+    unsubscribed = true;
+    raiser.join();
+    // Whatever was queued for "Late" before this comes first.
+    memory.subscribeToEvent("flush", "Late", "onEvent");
+    memory.raiseEvent("flush", ZU::ZUValue(round));
+    ASSERT_TRUE(ticks.waitFor(ticks.value() + 1));
+    memory.unsubscribeToEvent("flush", "Late");
+    ASSERT_EQ(late.load(), 0) << "round " << round;
+  }
 }
 
 TEST_F(MemoryTest, RaisesAreOnTheTimeline) {

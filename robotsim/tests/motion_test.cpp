@@ -188,7 +188,7 @@ class MotionService : public testing::Test {
  protected:
   void SetUp() override {
     session_ = std::make_shared<ko::Session>();
-    broker_ = std::make_shared<ZU::ZUBroker>(session_);
+    broker_ = ZU::ZUBroker::create(session_);
     timeline_ = std::make_shared<Timeline>();
     waiter_ = std::make_unique<simtest::TimelineWaiter>(*timeline_);
     motion_ = ZU::ZUModule::createModule<ZUMotion>(broker_, "ZUMotion", timeline_);

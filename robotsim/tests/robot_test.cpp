@@ -28,7 +28,7 @@ TEST(Robot, EveryServiceAnswersByItsName) {
 
 TEST(Robot, ServicesAreWithdrawnWhenTheRobotGoes) {
   auto session = std::make_shared<ko::Session>();
-  auto broker = std::make_shared<ZU::ZUBroker>(session);
+  auto broker = ZU::ZUBroker::create(session);
   {
     robotsim::Robot robot(timingRobot(), broker);
     EXPECT_TRUE(broker->service("ZUTextToSpeech"));
@@ -41,7 +41,7 @@ TEST(Robot, ServicesAreWithdrawnWhenTheRobotGoes) {
 
 TEST(Robot, AServiceThatCannotStartWithdrawsTheOthers) {
   auto session = std::make_shared<ko::Session>();
-  auto broker = std::make_shared<ZU::ZUBroker>(session);
+  auto broker = ZU::ZUBroker::create(session);
   robotsim::RobotOptions options = timingRobot();
   options.speech.language = "Klingon";
   EXPECT_THROW(robotsim::Robot(options, broker), ZU::ZUError);

@@ -14,7 +14,7 @@ using namespace std::chrono_literals;
 class RobotState : public ::testing::Test {
  protected:
   void SetUp() override {
-    broker = std::make_shared<ZU::ZUBroker>(std::make_shared<ko::Session>());
+    broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
     timeline = std::make_shared<robotsim::Timeline>();
     ZU::ZUModule::createModule<robotsim::ZUMemory>(broker, "ZUMemory");
     ZU::ZUModule::createModule<robotsim::ZURobotPosture>(broker, "ZURobotPosture", timeline);

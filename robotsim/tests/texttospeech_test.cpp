@@ -8,7 +8,9 @@
 #include <cstdlib>
 #include <filesystem>
 #include <memory>
+#include <stdexcept>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "ko/log.hpp"
@@ -17,6 +19,7 @@
 #include "robotsim/zumemory.h"
 #include "robotsim/zutexttospeech.h"
 #include "support/recording_module.h"
+#include "support/timeline_waiter.h"
 #include "zu/zubroker.h"
 #include "zu/zuserviceproxies.h"
 
@@ -51,7 +54,7 @@ ZUTextToSpeechOptions timing(double rate = kSpeechAsFastAsPossible) {
 class Robot {
  public:
   explicit Robot(ZUTextToSpeechOptions options)
-      : broker(std::make_shared<ZU::ZUBroker>(std::make_shared<ko::Session>())),
+      : broker(ZU::ZUBroker::create(std::make_shared<ko::Session>())),
         timeline(std::make_shared<Timeline>()),
         memoryModule(
             ZU::ZUModule::createModule<ZUMemory>(broker, "ZUMemory", ZUMemoryOptions{timeline, 4})),
@@ -358,6 +361,96 @@ TEST(TextToSpeechTiming, AStopBeforeTheTextBeginsEndsItWithoutStarting) {
   EXPECT_EQ(robot.statuses(running), (std::vector<std::string>{"started", "stopped"}));
   EXPECT_EQ(robot.statuses(queued), std::vector<std::string>{"stopped"});
   EXPECT_EQ(robot.bookmarks(), std::vector<int>{});
+}
+
+// ---- stops racing the speech ----------------------------------------------------------
+
+// A log sink that holds the thread that writes "Task <id> asked to stop" until the say of
+// that task has begun to play: the stop then lands while the say registers its text.
+class StopLineHolder : public ko::log::Sink {
+ public:
+  StopLineHolder(int id, simtest::TimelineWaiter& waiter)
+      : fLine(":Task " + std::to_string(id) + " asked to stop"), fWaiter(waiter) {}
+  void consume(const ko::log::Record& record) override {
+    if (record.message.find(fLine) != std::string::npos)
+      fWaiter.waitFor("ZUTextToSpeech", "started");
+  }
+
+ private:
+  const std::string fLine;
+  simtest::TimelineWaiter& fWaiter;
+};
+
+// A stop that lands while its posted say begins is never lost.
+TEST(TextToSpeechStops, AStopLandingWhileItsSayBeginsIsNeverLost) {
+  Robot robot(timing(1.0));
+  simtest::TimelineWaiter started(*robot.timeline);
+  const int id = robot.tts.post_say(std::string(400, 'a') + " \\mrk=1\\ end");
+  auto holder = std::make_shared<StopLineHolder>(id, started);
+  ko::log::addSink(holder);
+  robot.tts.stop(id);
+  ko::log::removeSink(holder);
+  EXPECT_FALSE(robot.ttsModule->wait(id, 10'000));
+  ASSERT_TRUE(robot.waitForStatus(id, "stopped"));
+  EXPECT_EQ(robot.statuses(id), (std::vector<std::string>{"started", "stopped"}));
+}
+
+// stopAll() and exit() end the says still queued behind the text being spoken: they never
+// start.
+TEST(TextToSpeechStops, StopAllAndExitEndTheSaysStillQueued) {
+  for (const bool viaExit : {false, true}) {
+    SCOPED_TRACE(viaExit ? "exit" : "stopAll");
+    Robot robot(timing(1.0));
+    const int running = robot.tts.post_say(std::string(200, 'a') + " \\mrk=1\\ end");
+    const int queued = robot.tts.post_say("never \\mrk=2\\ heard");
+    ASSERT_TRUE(robot.waitForStatus(running, "started"));
+    if (viaExit)
+      robot.ttsModule->exit();
+    else
+      robot.ttsModule->stopAll();
+    EXPECT_FALSE(robot.ttsModule->wait(running, 10'000));
+    EXPECT_FALSE(robot.ttsModule->wait(queued, 10'000));
+    const auto started = robot.timeline->entries("ZUTextToSpeech", "started");
+    ASSERT_EQ(started.size(), 1U);
+    EXPECT_EQ(started[0].arguments.asList().at(0).to<int>(), running);
+    EXPECT_TRUE(robot.timeline->entries("ZUTextToSpeech", "done").empty());
+  }
+}
+
+// A blocking call still queued when its text is stopped is never made.
+TEST(TextToSpeechStops, AStoppedTextsQueuedBlockingCallIsWithdrawn) {
+  Robot robot(timing(1.0));
+  simtest::TimelineWaiter holds(*robot.timeline);
+  robot.mokuto->holdBlockingBookmarks();
+  // Two texts stopped while their handlers hold both threads of the blocking calls...
+  for (int n = 1; n <= 2; ++n) {
+    const int id = robot.tts.post_say("\\mrkpause=" + std::to_string(n) + "\\ text");
+    ASSERT_TRUE(robot.mokuto->waitForBlockingBookmarks(static_cast<std::size_t>(n), kBound));
+    robot.tts.stop(id);
+    ASSERT_FALSE(robot.ttsModule->wait(id, 10'000));
+  }
+  // ...so that the call of the third waits in the queue when its text is stopped.
+  const int third = robot.tts.post_say("\\mrkpause=3\\ text");
+  ASSERT_TRUE(holds.waitFor("ZUTextToSpeech", "hold", 3));
+  robot.tts.stop(third);
+  ASSERT_FALSE(robot.ttsModule->wait(third, 10'000));
+  robot.mokuto->releaseBlockingBookmarks();
+  const int fourth = robot.tts.post_say("\\mrkpause=4\\ text");
+  ASSERT_FALSE(robot.ttsModule->wait(fourth, 10'000));
+  EXPECT_EQ(robot.mokuto->blockingBookmarks(), (std::vector<int>{1, 2, 4}));
+}
+
+// A listener of the speech's timeline that throws ends neither the notifier nor the text.
+TEST(TextToSpeechStops, AThrowingListenerIsLoggedAndTheTextEnds) {
+  ko::log::ScopedCapture cap;
+  Robot robot(timing());
+  robot.timeline->addListener([](const TimelineEntry& entry) {
+    if (entry.operation == "started" || entry.operation == "done")
+      throw std::runtime_error("viewer gone");
+  });
+  robot.speak("One \\mrk=1\\ two");
+  EXPECT_EQ(robot.bookmarks(), std::vector<int>{1});
+  EXPECT_TRUE(cap->containsPart("robotsim.timeline", ko::log::Error, "viewer gone"));
 }
 
 TEST(TextToSpeechTiming, ADirectSayReturnsAtTheEndWithAnIdOfItsOwn) {

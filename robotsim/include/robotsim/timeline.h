@@ -4,7 +4,8 @@
 // sound played, event raised), with the time in microseconds since the timeline began.
 //
 // Any thread may record; readers get a copy. Listeners are called in the recording
-// thread, after the entry is stored and outside the timeline's lock.
+// thread, after the entry is stored and outside the timeline's lock; one that throws is
+// logged, and the others and the recording thread go on.
 
 #include <chrono>
 #include <cstdint>

@@ -8,7 +8,16 @@
 // that ended the move); a delivery thread of the module then records it and triggers the
 // signal "behaviorStopped"(path), one behaviour at a time in the order of the ends. The
 // library, the running behaviours and the delivery queue are guarded by one mutex, which is
-// never held while another service is called or a signal is triggered.
+// never held while another service is called or a signal is triggered. The module's
+// threads find services through the session, never holding the broker.
+//
+// A run's stop is never heard after a later start of the same behaviour has returned: a
+// stop not yet signalled when the behaviour starts again is recorded on the timeline but
+// not signalled (one being signalled at that moment may still be running its subscribers).
+//
+// exit() and the destructor stop every behaviour, signal the stops still queued, join the
+// delivery thread (exit from a subscriber of the signal leaves that to the destructor) and
+// disconnect from ZUMotion; exit then unregisters.
 //
 // Installing and removing behaviours (installBehavior, removeBehavior, rescan) raises
 // "ZUBehaviorManager/BehaviorsAdded" or "ZUBehaviorManager/BehaviorsRemoved" through
@@ -41,7 +50,7 @@ class ZUBehaviorManager : public ZU::ZUModule {
                     std::shared_ptr<Timeline> timeline = nullptr, std::string root = "");
   ~ZUBehaviorManager() override;
 
-  // Stops every behaviour, then unregisters.
+  // See above.
   void exit() override;
   // Stops the posted call `id`; a posted runBehavior stops its behaviour.
   void stop(int id) override;
@@ -89,6 +98,7 @@ class ZUBehaviorManager : public ZU::ZUModule {
     std::string behavior;
     bool started = false;  // else stopped
     bool interrupted = false;
+    bool superseded = false;  // a later run started before the stop was signalled
   };
 
   void xBindMethods();
@@ -107,6 +117,8 @@ class ZUBehaviorManager : public ZU::ZUModule {
   void xRaise(const std::string& key, const std::vector<std::string>& behaviors);
   void xRecord(const std::string& operation, ko::AnyValue arguments, ko::AnyValue result = {});
   void xDisconnectMotion();
+  // Stops the behaviours and the delivery thread; exit and the destructor.
+  void xShutdown();
 
   const std::shared_ptr<Timeline> fTimeline;
   const std::filesystem::path fRoot;
@@ -127,6 +139,7 @@ class ZUBehaviorManager : public ZU::ZUModule {
   std::uint64_t fNextSerial = 1;
   std::deque<Delivery> fDeliveries;
   bool fQuit = false;
+  std::mutex fJoinMutex;  // the join of the delivery thread
   std::thread fDeliveryThread;
 };
 

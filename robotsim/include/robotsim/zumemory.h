@@ -8,8 +8,19 @@
 // its own that one loop thread at a time drains, so a module receives its events in the
 // order they were raised and one at a time, and a slow module holds up no other. The
 // keys, the subscriptions and the queues are guarded by one mutex; no lock is held while
-// a callback runs.
+// a callback runs. The delivery threads find the subscribers through the session, never
+// holding the broker.
+//
+// Unsubscribing: once unsubscribeToEvent returns, no callback of that subscription runs
+// or will run, except the one from which it was called (a callback may end its own
+// subscription). So it waits for a callback of that subscription running in another
+// thread: do not call it while holding a lock that the callback takes.
+//
+// exit() stops the delivery loop, waiting for the callbacks in progress (unless called
+// from one of them), and unregisters; events raised afterwards are kept but not
+// delivered. The destructor does the same stop; both may be called from any thread.
 
+#include <condition_variable>
 #include <cstdint>
 #include <deque>
 #include <map>
@@ -17,6 +28,7 @@
 #include <mutex>
 #include <set>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "ko/anyvalue.hpp"
@@ -38,6 +50,8 @@ class ZUMemory : public ZU::ZUModule {
   ZUMemory(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name,
            ZUMemoryOptions options = {});
   ~ZUMemory() override;
+
+  void exit() override;
 
   // ---- bound methods ----
   void declareEvent(const std::string& name);
@@ -81,6 +95,8 @@ class ZUMemory : public ZU::ZUModule {
   struct Inbox {
     std::deque<Delivery> queue;
     bool draining = false;
+    std::uint64_t delivering = 0;  // the serial of the subscription whose callback runs
+    std::thread::id thread;        // and the thread that runs it
   };
 
   void xBindMethods();
@@ -88,6 +104,7 @@ class ZUMemory : public ZU::ZUModule {
   void xUnsubscribe(const std::string& name, const std::string& module, const char* method);
   void xDrain(const std::string& module);
   void xDeliver(const Delivery& delivery);
+  // With fMutex held.
   bool xIsCurrent(const Delivery& delivery) const;
 
   const ZUMemoryOptions fOptions;
@@ -98,6 +115,7 @@ class ZUMemory : public ZU::ZUModule {
   std::set<std::string> fDeclared;
   std::map<std::string, std::map<std::string, Subscription>> fSubscriptions;  // event, module
   std::map<std::string, Inbox> fInboxes;                                      // by module
+  std::condition_variable fDelivered;                                         // a callback returned
   std::uint64_t fNextSerial = 1;
 };
 

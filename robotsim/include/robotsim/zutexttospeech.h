@@ -8,11 +8,25 @@
 //
 // Threads: calls arrive on ko threads; posted says run one at a time, in the order they
 // were posted, on the module's own one-thread event loop and wait there until their text
-// ends (a posted call that has not begun yet is stopped by its task's stop flag); texts are played
-// one at a time by the player thread, which raises the events and makes the blocking calls (each on
-// a thread of its own loop, so that stopping a text never waits for the handler); espeak-ng runs on
-// the one thread of the process that owns it. The settings and the table of texts in progress are
-// guarded by one mutex.
+// ends. Texts are played one at a time by the player thread; a notifier thread raises the
+// events and starts the blocking calls, each on a thread of the module's hold loop, so
+// that stopping a text never waits for the handler. espeak-ng runs on the one thread of
+// the process that owns it. The settings and the table of texts in progress are guarded
+// by one mutex. The module's threads find services through the session, never holding
+// the broker.
+//
+// Stopping, from any thread (a blocking-bookmark handler included):
+// - stop(id) stops the text of the posted say `id` whatever its state: queued, being
+//   registered, playing or held at a blocking bookmark; a say not begun yet ends at once.
+// - stopAll() stops every text in progress and every say posted before it, begun or not.
+// - A blocking call still queued when its text is stopped is never made; one in progress
+//   is not waited for: the text ends, the handler's call returns when it does.
+// Each returns at once; the says end (with their "stopped" status) shortly after.
+// exit() stops everything, waits for the posted says to end, then stops and joins the
+// player, the notifier and the hold loop (waiting for blocking calls in progress), and
+// unregisters. A say called afterwards ends at once, stopped. The destructor stops and
+// joins the threads the same way; like exit(), it may run on any thread but the module's
+// own (the framework sees to it, see ko/reaper.hpp).
 
 #include <cstdint>
 #include <filesystem>
@@ -66,9 +80,8 @@ class ZUTextToSpeech : public ZU::ZUModule {
                  ZUTextToSpeechOptions options = {});
   ~ZUTextToSpeech() override;
 
-  // Stops every text, then unregisters.
+  // See above.
   void exit() override;
-  // Stops the text of the posted call `id` at once, then asks the task to stop.
   void stop(int id) override;
 
   // ---- bound methods ----
@@ -113,6 +126,7 @@ class ZUTextToSpeech : public ZU::ZUModule {
   void xRaise(const std::string& key, const ZU::ZUValue& value);
   bool xNotificationsEnabled() const;
   void xStopText(int id);
+  void xStopThreads();
 
   const ZUTextToSpeechOptions fOptions;
   std::unique_ptr<SpeechSynthesizer> fSynthesizer;
@@ -125,7 +139,8 @@ class ZUTextToSpeech : public ZU::ZUModule {
   std::map<int, std::shared_ptr<SpeechUtterance>> fTexts;  // in progress
   std::map<int, std::vector<SpeechMarkRecord>> fHistory;   // ended
   int fNextDirectId = 1 << 30;
-  ko::AnyObject fMemory;  // cached lookup of the memory service
+  std::uint64_t fStopAllGeneration = 0;  // counts the calls of stopAll
+  ko::AnyObject fMemory;                 // cached lookup of the memory service
 
   std::unique_ptr<SpeechPlayer> fPlayer;  // last: stopped and joined first
 };
