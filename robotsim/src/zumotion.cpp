@@ -297,6 +297,11 @@ void ZUMotion::stop(int id) {
     fBody.stopMove(moveId);
 }
 
+void ZUMotion::exit() {
+  fBody.stopAllMoves();
+  ZU::ZUModule::exit();
+}
+
 int ZUMotion::_startBezierMove(const ko::AnyValue& jointNames, const ko::AnyValue& times,
                                const ko::AnyValue& controlPoints, float minDuration) {
   std::vector<JointTrack> tracks;

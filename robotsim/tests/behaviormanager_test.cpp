@@ -254,14 +254,22 @@ TEST_F(BehaviorManagerService, StopAllEndsEveryBehaviour) {
 // A run's stop that is not told yet when the behaviour starts again is not heard after
 // that start: the subscribers hear one stop, the later run's.
 TEST_F(BehaviorManagerService, AnUntoldStopIsNotHeardAfterTheNextStart) {
-  ko::test::Gate holding, release;
-  std::atomic<bool> first{true};
-  robot_->proxy.getObject()->connect("behaviorStopped", [&](const std::string&) {
-    if (first.exchange(false)) {
-      holding.open();
-      release.wait();
+  // Shared with the subscriber, which outlives the test's body.
+  struct Hold {
+    ko::test::Gate holding, release;
+    std::atomic<bool> first{true};
+  };
+  const auto hold = std::make_shared<Hold>();
+  const std::unique_ptr<Hold, void (*)(Hold*)> letGo(hold.get(),
+                                                     [](Hold* h) { h->release.open(); });
+  robot_->proxy.getObject()->connect("behaviorStopped", [hold](const std::string&) {
+    if (hold->first.exchange(false)) {
+      hold->holding.open();
+      hold->release.wait();
     }
   });
+  auto& holding = hold->holding;
+  auto& release = hold->release;
   robot_->proxy.startBehavior(kLongArm);
   robot_->proxy.stopBehavior(kLongArm);  // its news holds the delivery thread
   ASSERT_TRUE(holding.wait());

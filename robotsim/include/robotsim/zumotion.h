@@ -53,6 +53,8 @@ class ZUMotion : public ZU::ZUModule {
   void setBreathEnabled(const std::string& chainName, bool isEnabled);
   // Stops the posted call `id`; a posted move ends at once where the joints stand.
   void stop(int id) override;
+  // Ends every move where the joints stand, then the module's service.
+  void exit() override;
 
   // ---- for the behaviour manager ----
   // Starts a Bezier move and answers its id at once; the move holds its joints for at least
