@@ -178,22 +178,6 @@ TEST(ArmsIteration, StoppingTheBodyTalkStopsTheAnimationAndEndsTheWaitAtOnce) {
   EXPECT_EQ(log->count("robotbodytalk", ko::log::Error, kTooLong), 0u);
 }
 
-TEST(ArmsIteration, AFailedStopIsLogged) {
-  FakeRobot robot;
-  LogCapture log;
-  robot.behaviors->failStop = true;
-  Arms arms(robot, 1.0);
-  arms.arms.setAnimations({"a"}, ZU::Standing);
-  arms.worker.start();
-  ASSERT_TRUE(robot.behaviors->log.waitFor("startBehavior", 1));
-  arms.worker.requestStop();
-  arms.worker.stop();
-  const auto lines =
-      log->lines("robotbodytalk", ko::log::Error, "Error while stopping the behavior a\t");
-  ASSERT_EQ(lines.size(), 1u);
-  EXPECT_NE(lines[0].record.message.find("the behaviour does not listen"), std::string::npos);
-}
-
 // ---- the list -----------------------------------------------------------------------------
 
 TEST(ArmsList, ThreeEntriesPlayTheFirstAndTheThirdThenTheListIsShuffled) {

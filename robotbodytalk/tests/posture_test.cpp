@@ -80,17 +80,6 @@ TEST(PostureWatcher, FailuresAreLoggedAndTheFamiliesKeptOrReadStill) {
             1u);
 }
 
-TEST(PostureWatcher, AValueOutsideTheFamiliesIsUnknown) {
-  FakeRobot robot;
-  ZURobotBodyTalkPosture posture(robot.broker);
-  posture.setPostureFamily(ZU::SittingOnChair);
-  EXPECT_EQ(posture.getPostureFamily(), ZU::SittingOnChair);
-  posture.setPostureFamily(4);
-  EXPECT_EQ(posture.getPostureFamily(), ZU::Unknown);
-  posture.setPostureFamily(-1);
-  EXPECT_EQ(posture.getPostureFamily(), ZU::Unknown);
-}
-
 TEST(PostureWatcher, InAnUnknownPostureNeitherHeadNorArmsMove) {
   FakeRobot robot;
   LogCapture log;

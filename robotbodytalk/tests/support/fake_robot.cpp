@@ -127,8 +127,6 @@ void FakeBehaviorManager::startBehavior(const std::string& behavior) {
 
 void FakeBehaviorManager::stopBehavior(const std::string& behavior) {
   log.add("stopBehavior", {behavior});
-  if (failStop.load())
-    ZU_THROW_ERROR(getName(), "stopBehavior", "the behaviour does not listen");
 }
 
 void FakeBehaviorManager::failStartOf(const std::string& behavior) {

@@ -78,7 +78,6 @@ class FakeBehaviorManager : public ZU::ZUModule {
   // These raise a ZUError.
   void failStartOf(const std::string& behavior);
   void failPreloadOf(const std::string& behavior);
-  std::atomic<bool> failStop{false};
   // The behaviours started, in order.
   std::vector<std::string> started() const;
   CallLog log;
