@@ -48,7 +48,9 @@ struct ZURobotBodyTalkOptions {
   // Multiplies every rest, wait and limit of the body talk: 1.0 on the robot, smaller to
   // run it faster (the head moves and the animations keep their own durations).
   double timeScale = 1.0;
-  // The loop the two workers run on; a loop of their own with two threads when null.
+  // The loop the two workers run on; a loop of their own with two threads when null. Each
+  // worker holds a thread of it for a whole gesture: with fewer than two, one waits for the
+  // other.
   std::shared_ptr<ko::EventLoop> eventLoop;
 };
 
