@@ -78,9 +78,11 @@ void Timeline::clear() {
   start_ = std::chrono::steady_clock::now();
 }
 
-void Timeline::writeJsonLines(std::ostream& os) const {
+void Timeline::writeJsonLines(std::ostream& os,
+                              const std::function<bool(const TimelineEntry&)>& keep) const {
   for (const auto& e : entries()) {
-    os << toJson(e).dump(-1, ' ', false, nlohmann::json::error_handler_t::replace) << '\n';
+    if (!keep || keep(e))
+      os << toJson(e).dump(-1, ' ', false, nlohmann::json::error_handler_t::replace) << '\n';
   }
 }
 

@@ -224,9 +224,15 @@ void ZUMotion::angleInterpolationBezier(const ko::AnyValue& jointNames, const ko
     ZU_THROW_ERROR(getName(), "angleInterpolationBezier", e.what());
   }
   xWarnBeyondLimits("angleInterpolationBezier", tracks);
+  const auto joints = jointsOfTracks(tracks);
+  const std::vector<double> startAngles = fBody.angles(joints);
   const int moveId = fBody.startBezierMove(tracks);
+  // What was asked, for the readers of the timeline: the keys are absolute, the start angles
+  // those the joints had when the move began.
   xRecord("angleInterpolationBezier",
-          ko::AnyValue::list({jointNameList(jointsOfTracks(tracks)), durationOf(tracks)}), moveId);
+          ko::AnyValue::list({jointNameList(joints), durationOf(tracks), times, controlPoints,
+                              ko::AnyValue::from(startAngles)}),
+          moveId);
 
   // stop(id) looks the move up after setting the task's flag; the flag is read after the
   // move is registered, so one of the two sees the other.

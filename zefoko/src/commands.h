@@ -7,5 +7,7 @@ namespace zefoko {
 
 // zefoko speak [--wav FILE] [--timing] [--fast] [--language L] [--json] [TEXT]
 void addSpeakCommand(CLI::App& app, int& status);
+// zefoko bodytalk [--seconds N] [--posture Standing|Sitting|SittingOnChair] [--json]
+void addBodyTalkCommand(CLI::App& app, int& status);
 
 }  // namespace zefoko

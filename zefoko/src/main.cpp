@@ -11,6 +11,7 @@ int main(int argc, char** argv) {
   app.require_subcommand(1);
   int status = 0;
   zefoko::addSpeakCommand(app, status);
+  zefoko::addBodyTalkCommand(app, status);
   CLI11_PARSE(app, argc, argv);
   return status;
 }

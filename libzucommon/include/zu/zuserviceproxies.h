@@ -13,6 +13,8 @@
 #include <vector>
 
 #include "ko/anyvalue.hpp"
+#include "ko/eventloop.hpp"
+#include "ko/future.hpp"
 #include "zu/zubroker.h"
 #include "zu/zuproxy.h"
 #include "zu/zuvalue.h"
@@ -49,5 +51,12 @@ namespace ZU {
 // logged at warning level and answered as false; so is a missing proxy.
 bool preloadABehavior(const std::shared_ptr<ZUBehaviorManagerProxy>& behaviorManager,
                       const std::string& path);
+
+// Runs preloadABehavior as a job of `loop` (the process-wide loop when null) and answers at
+// once; the future holds its answer when the preload has ended. A job that a stopping loop
+// drops finishes the future with an error.
+ko::Future<bool> preloadABehaviorAsync(std::shared_ptr<ZUBehaviorManagerProxy> behaviorManager,
+                                       std::string path,
+                                       std::shared_ptr<ko::EventLoop> loop = nullptr);
 
 }  // namespace ZU

@@ -42,8 +42,10 @@ class Timeline {
                                      const std::string& operation) const;
   void clear();
 
-  // One JSON object per line: {"us":…,"service":…,"operation":…,"arguments":…,"result":…}.
-  void writeJsonLines(std::ostream& os) const;
+  // One JSON object per line: {"us":…,"service":…,"operation":…,"arguments":…,"result":…},
+  // for every entry or those that `keep` accepts.
+  void writeJsonLines(std::ostream& os,
+                      const std::function<bool(const TimelineEntry&)>& keep = {}) const;
 
   using Listener = std::function<void(const TimelineEntry&)>;
   // Listeners cannot be removed; add them before the services run.
