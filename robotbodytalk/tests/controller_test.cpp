@@ -86,7 +86,7 @@ TEST(BodyTalkInstance, WithoutTheRobotServicesTheControllerIsStillMadeAndHarmles
   ::setenv("KO_DEADLOCK_TIMEOUT", "20", 1);
   ZU::ZUBroker::resetDeadlockTimeoutForTesting();
   LogCapture log;
-  auto broker = std::make_shared<ZU::ZUBroker>(std::make_shared<ko::Session>());
+  auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
   {
     BodyTalkHandle bodyTalk(broker, kFast);
     const auto errors = log->lines("robotbodytalk", ko::log::Error, "Can't find service");

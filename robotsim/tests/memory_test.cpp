@@ -316,9 +316,10 @@ TEST(MemoryLifetime, NoCallbackRunsOnceTheUnsubscribeHasReturned) {
     unsubscribed = true;
     raiser.join();
     // Whatever was queued for "Late" before this comes first.
+    const int flushed = ticks.value() + 1;
     memory.subscribeToEvent("flush", "Late", "onEvent");
     memory.raiseEvent("flush", ZU::ZUValue(round));
-    ASSERT_TRUE(ticks.waitFor(ticks.value() + 1));
+    ASSERT_TRUE(ticks.waitFor(flushed));
     memory.unsubscribeToEvent("flush", "Late");
     ASSERT_EQ(late.load(), 0) << "round " << round;
   }
