@@ -19,12 +19,12 @@ namespace {
 constexpr const char* kCategory = "syntacticanalyzer.bindatabase";
 constexpr const char* kDataDirectory = "mokuto/syntacticanalysis/";
 
-// Reads exactly `size` bytes unless the file ends first; the count read.
+// Reads `size` bytes from the start of the file unless it ends first; the count read.
 std::size_t readFully(int fd, void* buffer, std::size_t size) {
   auto* out = static_cast<char*>(buffer);
   std::size_t done = 0;
   while (done < size) {
-    const ssize_t n = ::read(fd, out + done, size - done);
+    const ssize_t n = ::pread(fd, out + done, size - done, static_cast<off_t>(done));
     if (n < 0 && errno == EINTR)
       continue;
     if (n <= 0)
@@ -187,16 +187,19 @@ bool ZULingSyntacticAnalyzerBinaryDatabase::load(const std::string& path) {
   if (rootOffset >= bodySize)
     return xFail(path, "its root offset " + std::to_string(rootOffset) + " lies past its body");
 
-  std::unique_ptr<std::uint32_t[]> block(new (std::nothrow) std::uint32_t[(bodySize + 3) / 4]);
-  if (!block) {
+  constexpr std::size_t kLead = BodyDeleter::kLeadWords;
+  auto* block = new (std::nothrow) std::uint32_t[kLead + (bodySize + 3) / 4];
+  if (block == nullptr) {
     KO_LOG_WARNING(kCategory) << "Not enough RAM to load the linguistic database \"" << path
                               << "\".";
     return false;
   }
-  if (readFully(file.get(), block.get(), bodySize) != bodySize)
+  std::unique_ptr<std::uint32_t[], BodyDeleter> owned(block + kLead);
+  auto* fileStart = reinterpret_cast<char*>(owned.get()) - kBodyStart;
+  if (readFully(file.get(), fileStart, fileSize) != fileSize)
     return xFail(path, "its body could not be read whole");
 
-  body = std::move(block);
+  body = std::move(owned);
   size = static_cast<std::uint32_t>(bodySize);
   Node rootNode;
   if (!xNode(rootOffset, rootNode)) {
@@ -317,7 +320,7 @@ std::mutex& ZULingDatabaseCache::mutex() {
   return cacheMutex;
 }
 
-ZULingDatabasePtr ZULingDatabaseCache::xAcquire(const std::string& path) {
+ZULingDatabasePtr ZULingDatabaseCache::acquire(const std::string& path) {
   static std::map<std::string, std::shared_ptr<ZULingSyntacticAnalyzerBinaryDatabase>> cache;
   auto it = cache.find(path);
   if (it == cache.end()) {
@@ -345,7 +348,7 @@ void ZULingDatabaseUser::setLanguage(const std::string& key) {
     return;
   fDatabase.reset();
   fPath.clear();
-  fDatabase = ZULingDatabaseCache::xAcquire(language->second);
+  fDatabase = ZULingDatabaseCache::acquire(language->second);
   if (fDatabase)
     fPath = language->second;
 }
