@@ -76,11 +76,11 @@ void addLookupCommand(CLI::App& app, int& status) {
       if (loaded->load(options->database))
         database = std::move(loaded);
     } else {
-      ZU::ZULingDatabaseUser user(
-          std::make_shared<const ZU::ZULingLanguageMap>(ZU::makeLingLanguageMap()));
+      auto languages = std::make_shared<const ZU::ZULingLanguageMap>(ZU::makeLingLanguageMap());
+      ZU::ZULingDatabaseUser user(languages);
       user.setLanguage(options->language);
       database = user.database();
-      if (!database && ZU::makeLingLanguageMap().count(options->language) == 0)
+      if (languages->count(options->language) == 0)
         std::cerr << "mokuto lookup: \"" << options->language << "\" is not a language key\n";
     }
     if (!database) {
