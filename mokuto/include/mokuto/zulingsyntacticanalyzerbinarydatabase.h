@@ -71,7 +71,7 @@ class ZULingSyntacticAnalyzerBinaryDatabase {
   // the file copies markedly slower).
   struct BodyDeleter {
     static constexpr std::size_t kLeadWords = 5;
-    void operator()(std::uint32_t* body) const noexcept { delete[](body - kLeadWords); }
+    void operator()(std::uint32_t* start) const noexcept { delete[](start - kLeadWords); }
   };
 
   // Body size in bytes.
