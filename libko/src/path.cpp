@@ -39,6 +39,7 @@ std::vector<std::string> dataRoots() {
       roots.push_back(env.substr(start, end - start));
     start = end + 1;
   }
+  roots.emplace_back(KO_GENERATED_SHARE_DIR);
   roots.emplace_back(KO_BUILD_SHARE_DIR);
   roots.emplace_back(KO_INSTALL_SHARE_DIR);
   return roots;

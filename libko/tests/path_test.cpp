@@ -59,10 +59,11 @@ TEST_F(FindDataTest, FirstDirectoryOfTheVariableWins) {
 
 TEST_F(FindDataTest, RootsInOrderAndExistingDirectories) {
   const auto roots = ko::path::dataRoots();
-  ASSERT_EQ(roots.size(), 4u);  // the empty entry between "::" is skipped
+  ASSERT_EQ(roots.size(), 5u);  // the empty entry between "::" is skipped
   EXPECT_EQ(roots[0], first_.string());
   EXPECT_EQ(roots[1], second_.string());
-  EXPECT_EQ(roots[2], KO_TEST_BUILD_SHARE_DIR);
+  EXPECT_EQ(roots[2], KO_TEST_GENERATED_SHARE_DIR);
+  EXPECT_EQ(roots[3], KO_TEST_BUILD_SHARE_DIR);
   EXPECT_THAT(
       ko::path::dataDirectories("zefoko"),
       ::testing::IsSupersetOf({(first_ / "zefoko").string(), (second_ / "zefoko").string()}));

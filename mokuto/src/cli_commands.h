@@ -9,5 +9,7 @@ namespace mokuto::cli {
 void addConfigCommand(CLI::App& app, int& status);
 // mokuto parse [--japanese] [TEXT]
 void addParseCommand(CLI::App& app, int& status);
+// mokuto lookup [--language L | --database FILE] [--json] WORD...
+void addLookupCommand(CLI::App& app, int& status);
 
 }  // namespace mokuto::cli

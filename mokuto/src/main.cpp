@@ -9,6 +9,7 @@ int main(int argc, char** argv) {
   int status = 0;
   mokuto::cli::addConfigCommand(app, status);
   mokuto::cli::addParseCommand(app, status);
+  mokuto::cli::addLookupCommand(app, status);
   CLI11_PARSE(app, argc, argv);
   return status;
 }

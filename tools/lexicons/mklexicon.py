@@ -1,0 +1,544 @@
+#!/usr/bin/env python3
+"""Turns the lexicon packages into the plain lexicons that mkbdb reads.
+
+Each subcommand writes a lexicon (WORD<TAB>CLASS[/FEATURES][=BASEFORM]...) and, for the
+main databases, a frequency file (BASEFORM<TAB>COUNT) that orders the base forms that
+mkbdb keeps. Words are lowercased in ASCII only, byte for byte, as the analysis
+lowercases a text before looking its words up; a word whose first letter is an accented
+lowercase letter is also stored with that letter in capitals ("était" and "Était"),
+since the analysis leaves non-ASCII letters as they are written.
+
+Feature bytes (see README.md): s/p number, m/f gender, 1/2/3 person, tenses and
+moods W infinitive, P present, I imperfect, J simple past, F future, C conditional,
+S subjunctive present, T subjunctive imperfect, Y imperative, G present participle,
+K past participle; c/u comparative/superlative; n negation; e elided form. Several
+letters of one kind are alternatives ("PS13s": present or subjunctive, first or third
+person, singular).
+"""
+
+import argparse
+import glob
+import json
+import os
+import re
+import sys
+
+# Emotion labels, stored as the base form of a class-4 ("unkonwn") record.
+VERY_POSITIVE = "very positive"
+POSITIVE = "positive"
+NEGATIVE = "negative"
+VERY_NEGATIVE = "very negative"
+STRONG_ADVERB = "strong adverb"
+NEGATION = "negation"
+
+# Frequency given to the base forms of closed classes: kept right after the gesture tags.
+CLOSED_CLASS_FREQUENCY = 1e9
+
+
+def ascii_lower(text):
+    return "".join(c.lower() if "A" <= c <= "Z" else c for c in text)
+
+
+def keys_of(word):
+    """The keys under which a word is stored."""
+    key = ascii_lower(word)
+    keys = [key]
+    first = key[:1]
+    if first and ord(first) > 127 and first.islower() and first.upper() != first:
+        upper = first.upper()
+        if len(upper) == 1:
+            keys.append(upper + key[1:])
+    return keys
+
+
+def has_letter(text):
+    return any(c.isalpha() for c in text)
+
+
+def clean(text):
+    return text.replace("\t", " ").replace("\n", " ").replace("\r", " ")
+
+
+class LexiconWriter:
+    """Collects records by word, in the order given, without duplicates."""
+
+    def __init__(self):
+        self.words = {}
+
+    def add(self, word, word_class, features="", base_form=None):
+        for key in keys_of(word):
+            if not key or "\t" in key or len(key.encode("utf-8")) > 1000:
+                continue
+            record = word_class
+            if features:
+                record += "/" + features
+            if base_form is not None:
+                form = clean(base_form)
+                if len(form.encode("utf-8")) <= 255:
+                    record += "=" + form
+            records = self.words.setdefault(key, [])
+            if record not in records:
+                records.append(record)
+
+    def write(self, path):
+        with open(path, "w", encoding="utf-8", newline="\n") as out:
+            for word in sorted(self.words, key=lambda w: w.encode("utf-8")):
+                out.write(word + "\t" + "\t".join(self.words[word]) + "\n")
+        return len(self.words)
+
+
+def write_frequencies(path, frequencies):
+    with open(path, "w", encoding="utf-8", newline="\n") as out:
+        for form, count in sorted(frequencies.items(), key=lambda kv: (-kv[1], kv[0])):
+            if "\t" not in form and "\n" not in form:
+                out.write("%s\t%g\n" % (form, count))
+
+
+def read_closed_lexicon(path):
+    """Our own lexicon files: mkbdb's format, with '#' comments."""
+    entries = []
+    with open(path, encoding="utf-8") as source:
+        for line in source:
+            line = line.rstrip("\n")
+            if not line or line.startswith("#"):
+                continue
+            word, *records = line.split("\t")
+            parsed = []
+            for record in records:
+                head, _, base = record.partition("=")
+                word_class, _, features = head.partition("/")
+                parsed.append((word_class, features, base if "=" in record else None))
+            entries.append((word, parsed))
+    return entries
+
+
+# --- English: WordNet and our closed classes -------------------------------------------
+
+WORDNET_CLASSES = {"noun": "noun", "verb": "verb", "adj": "adjective", "adv": "adverb"}
+SENSE_TYPES = {"1": "noun", "2": "verb", "3": "adj", "4": "adv", "5": "adj"}
+
+
+def english_plural(word):
+    if re.search(r"(s|x|z|ch|sh)$", word):
+        return word + "es"
+    if re.search(r"[^aeiou]y$", word):
+        return word[:-1] + "ies"
+    return word + "s"
+
+
+def english_ing(word):
+    if word.endswith("ie"):
+        return word[:-2] + "ying"
+    if word.endswith("e") and not re.search(r"(ee|ye|oe)$", word) and len(word) > 2:
+        return word[:-1] + "ing"
+    return word + "ing"
+
+
+def english_ed(word):
+    if word.endswith("e"):
+        return word + "d"
+    if re.search(r"[^aeiou]y$", word):
+        return word[:-1] + "ied"
+    return word + "ed"
+
+
+def english_degree(word, suffix):
+    if word.endswith("e"):
+        return word + suffix[1:]
+    if re.search(r"[^aeiou]y$", word):
+        return word[:-1] + "i" + suffix
+    return word + suffix
+
+
+def syllables(word):
+    return len(re.findall(r"[aeiouy]+", word))
+
+
+def english(args):
+    wordnet = args.wordnet
+    counts = {}
+    with open(os.path.join(wordnet, "cntlist.rev"), encoding="latin-1") as source:
+        for line in source:
+            parts = line.split()
+            if len(parts) != 3 or "%" not in parts[0]:
+                continue
+            lemma, _, rest = parts[0].partition("%")
+            pos = SENSE_TYPES.get(rest[:1])
+            if pos:
+                counts[(lemma, pos)] = counts.get((lemma, pos), 0) + int(parts[2])
+
+    exceptions = {}  # (base, pos) -> inflected forms
+    for pos in WORDNET_CLASSES:
+        with open(os.path.join(wordnet, pos + ".exc"), encoding="latin-1") as source:
+            for line in source:
+                parts = line.split()
+                if len(parts) >= 2:
+                    for base in parts[1:]:
+                        exceptions.setdefault((base, pos), []).append(parts[0])
+
+    # word -> [(closed, -frequency, order, class, features, base)]
+    analyses = {}
+    order = [0]
+
+    def analysis(word, word_class, features, base, frequency, closed=False):
+        if "_" in word or not has_letter(word):
+            return
+        order[0] += 1
+        analyses.setdefault(word, []).append(
+            (0 if closed else 1, -frequency, order[0], word_class, features, base))
+
+    frequencies = {}
+    for pos, word_class in WORDNET_CLASSES.items():
+        with open(os.path.join(wordnet, "index." + pos), encoding="latin-1") as source:
+            for line in source:
+                if line.startswith(" "):
+                    continue
+                lemma = line.split(" ", 1)[0]
+                if "_" in lemma or not has_letter(lemma):
+                    continue
+                frequency = counts.get((lemma, pos), 0)
+                frequencies[lemma] = frequencies.get(lemma, 0) + frequency
+                irregular = exceptions.get((lemma, pos), [])
+                if pos == "noun":
+                    analysis(lemma, word_class, "s", lemma, frequency)
+                    plurals = irregular or ([english_plural(lemma)] if len(lemma) > 1 else [])
+                    for form in plurals:
+                        analysis(form, word_class, "p", lemma, frequency)
+                elif pos == "verb":
+                    analysis(lemma, word_class, "WP", lemma, frequency)
+                    analysis(english_plural(lemma), word_class, "P3s", lemma, frequency)
+                    irregular_ing = [f for f in irregular if f.endswith("ing")]
+                    irregular_past = [f for f in irregular if not f.endswith("ing")]
+                    for form in irregular_ing or [english_ing(lemma)]:
+                        analysis(form, word_class, "G", lemma, frequency)
+                    for form in irregular_past or [english_ed(lemma)]:
+                        analysis(form, word_class, "JK", lemma, frequency)
+                elif pos == "adj":
+                    analysis(lemma, word_class, "", lemma, frequency)
+                    if irregular:
+                        for form in irregular:
+                            analysis(form, word_class, "u" if form.endswith("st") else "c",
+                                     lemma, frequency)
+                    elif frequency > 0 and "-" not in lemma and (
+                            syllables(lemma) == 1 or (syllables(lemma) == 2 and lemma.endswith("y"))):
+                        analysis(english_degree(lemma, "er"), word_class, "c", lemma, frequency)
+                        analysis(english_degree(lemma, "est"), word_class, "u", lemma, frequency)
+                else:
+                    analysis(lemma, word_class, "", lemma, frequency)
+                    for form in irregular:
+                        analysis(form, word_class, "", lemma, frequency)
+
+    for word, records in read_closed_lexicon(args.closed):
+        for word_class, features, base in records:
+            analysis(word, word_class, features, base, 0, closed=True)
+            if base is not None:
+                frequencies[base] = CLOSED_CLASS_FREQUENCY
+
+    lexicon = LexiconWriter()
+    for word in analyses:
+        for _, _, _, word_class, features, base in sorted(analyses[word]):
+            lexicon.add(word, word_class, features, base)
+    print("english: %d words" % lexicon.write(args.lexicon), file=sys.stderr)
+    write_frequencies(args.frequencies, frequencies)
+
+
+# --- French: Lefff ---------------------------------------------------------------------
+
+# Lefff category -> (word class, rank of the class among the records of a word). Closed
+# classes come first: a word that is both ("la": determiner, clitic, noun) is most
+# often the closed one.
+LEFFF_CLASSES = {
+    "auxAvoir": ("auxiliary", 0), "auxEtre": ("auxiliary", 0),
+    "det": ("determinant", 1),
+    "cln": ("pronoun", 2), "pro": ("pronoun", 2), "prel": ("pronoun", 2),
+    "pri": ("pronoun", 2), "ce": ("pronoun", 2), "ilimp": ("pronoun", 2),
+    "caimp": ("pronoun", 2),
+    "cla": ("pronoun_comp", 3), "cld": ("pronoun_comp", 3), "clr": ("pronoun_comp", 3),
+    "cll": ("pronoun_comp", 3), "clar": ("pronoun_comp", 3), "cldr": ("pronoun_comp", 3),
+    "clg": ("pronoun_comp", 3),
+    "prep": ("preposition", 4),
+    "coo": ("conjunctive", 5),
+    "csu": ("sub_conj", 6), "que": ("sub_conj", 6),
+    "clneg": ("adverb", 7), "advneg": ("adverb", 7), "que_restr": ("adverb", 7),
+    "pres": ("interjection", 8),
+    "v": ("verb", 9),
+    "nc": ("noun", 10),
+    "adj": ("adjective", 11),
+    "adv": ("adverb", 12),
+    "np": ("proper_noun", 13),
+}
+LEFFF_CLOSED_RANK = 8
+LEFFF_NEGATIONS = {"clneg", "advneg"}
+COORDINATIONS = {"et", "ou", "and", "or"}
+
+
+def lefff_clean(text):
+    return re.sub(r"__\w+$", "", text)
+
+
+def french(args):
+    analyses = {}
+    frequencies = {}
+    order = 0
+    with open(args.lefff, encoding="utf-8") as source:
+        for line in source:
+            parts = line.rstrip("\n").split("\t")
+            if len(parts) < 3 or parts[1] not in LEFFF_CLASSES:
+                continue
+            form = lefff_clean(parts[0])
+            category = parts[1]
+            if form.startswith("_") or not has_letter(form):
+                continue
+            words = form.split(" ")
+            # A fixed phrase around a coordination would hide it from the analysis.
+            if len(words) > 1 and COORDINATIONS & set(w.lower() for w in words):
+                continue
+            word_class, rank = LEFFF_CLASSES[category]
+            lemma = lefff_clean(parts[2]).rstrip("?")
+            if lemma in LEFFF_CLASSES or lemma.startswith("_") or not lemma:
+                lemma = form
+            features = parts[3] if len(parts) > 3 else ""
+            if category in LEFFF_NEGATIONS:
+                features = "n" + features
+            order += 1
+            analyses.setdefault(ascii_lower(form), []).append(
+                (rank, order, word_class, features, lemma))
+            if rank < LEFFF_CLOSED_RANK:
+                frequencies[lemma] = CLOSED_CLASS_FREQUENCY
+
+    lexicon = LexiconWriter()
+    for word, records in read_closed_lexicon(args.extra):
+        for word_class, features, base in records:
+            lexicon.add(word, word_class, features, base)
+            if base is not None:
+                frequencies[base] = CLOSED_CLASS_FREQUENCY
+    for word in analyses:
+        for _, _, word_class, features, lemma in sorted(analyses[word]):
+            lexicon.add(word, word_class, features, lemma)
+    print("french: %d words" % lexicon.write(args.lexicon), file=sys.stderr)
+    write_frequencies(args.frequencies, frequencies)
+
+
+# --- Japanese: IPADIC ------------------------------------------------------------------
+
+def ipadic_class(pos1, pos2):
+    if pos1 == "名詞":
+        if pos2 == "固有名詞":
+            return "proper_noun"
+        if pos2 == "代名詞":
+            return "pronoun"
+        if pos2 in ("形容動詞語幹", "ナイ形容詞語幹"):
+            return "adjective"
+        return "noun"
+    if pos1 == "動詞":
+        return "auxiliary" if pos2 == "非自立" else "verb"
+    if pos1 == "形容詞":
+        return "adjective"
+    if pos1 == "副詞":
+        return "adverb"
+    if pos1 == "連体詞":
+        return "determinant"
+    if pos1 == "接続詞":
+        return "conjunctive"
+    if pos1 == "助詞":
+        if pos2 == "接続助詞":
+            return "sub_conj"
+        if pos2 == "並立助詞":
+            return "conjunctive"
+        if pos2 == "終助詞":
+            return "interjection"
+        return "preposition"
+    if pos1 == "助動詞":
+        return "auxiliary"
+    if pos1 in ("感動詞", "フィラー", "その他"):
+        return "interjection"
+    if pos1 == "接頭詞":
+        return "determinant"
+    return None  # 記号: punctuation is the tokeniser's
+
+
+JAPANESE_NEGATIONS = {"ない", "ぬ", "ん", "まい"}
+
+
+def read_ipadic(directory):
+    """(surface, cost, pos1, pos2, base) of every entry."""
+    for path in sorted(glob.glob(os.path.join(directory, "*.csv"))):
+        with open(path, encoding="euc_jp", errors="replace") as source:
+            for line in source:
+                parts = line.rstrip("\n").split(",")
+                if len(parts) < 13:
+                    continue
+                base = parts[10] if parts[10] != "*" else parts[0]
+                yield parts[0], int(parts[3]), parts[4], parts[5], base
+
+
+JAPANESE_CLOSED = {"助詞", "助動詞", "接続詞", "連体詞", "感動詞", "フィラー"}
+
+
+def japanese(args):
+    analyses = {}
+    # IPADIC's word costs (the lower, the likelier) are comparable within a part of
+    # speech only: a base form ranks by the share of its part of speech that is likelier
+    # than it. Closed classes come first, proper nouns last.
+    best_cost = {}  # (base, pos1, pos2) -> lowest cost
+    for surface, cost, pos1, pos2, base in read_ipadic(args.ipadic):
+        word_class = ipadic_class(pos1, pos2)
+        if word_class is None or not has_letter(surface):
+            continue
+        features = "n" if pos1 == "助動詞" and base in JAPANESE_NEGATIONS else ""
+        analyses.setdefault(surface, []).append((cost, word_class, features, base))
+        key = (base, pos1, pos2)
+        best_cost[key] = min(best_cost.get(key, cost), cost)
+
+    lexicon = LexiconWriter()
+    for word in analyses:
+        for _, word_class, features, base in sorted(analyses[word]):
+            lexicon.add(word, word_class, features, base)
+    print("japanese: %d words" % lexicon.write(args.lexicon), file=sys.stderr)
+
+    by_pos = {}
+    for (base, pos1, pos2), cost in best_cost.items():
+        by_pos.setdefault((pos1, pos2), []).append((cost, base))
+    frequencies = {}
+    for (pos1, pos2), entries in by_pos.items():
+        entries.sort()
+        for rank, (_, base) in enumerate(entries):
+            if pos1 in JAPANESE_CLOSED or pos2 in ("代名詞", "非自立"):
+                score = CLOSED_CLASS_FREQUENCY
+            elif pos2 == "固有名詞":
+                score = 0
+            else:
+                score = 1 - rank / len(entries)
+            frequencies[base] = max(frequencies.get(base, 0), score)
+    write_frequencies(args.frequencies, frequencies)
+
+
+# --- Emotion databases -----------------------------------------------------------------
+
+def add_labels(lexicon, labels):
+    for word in sorted(labels):
+        lexicon.add(word, "unkonwn", "", labels[word])
+
+
+def english_emotions(args):
+    labels = {}
+    with open(args.vader_lexicon, encoding="utf-8") as source:
+        for line in source:
+            parts = line.split("\t")
+            if len(parts) < 2 or " " in parts[0] or not has_letter(parts[0]):
+                continue
+            valence = float(parts[1])
+            # VADER's ratings run from -4 to 4; "very" from the rating step 3 on.
+            if valence >= 2.5:
+                labels[parts[0]] = VERY_POSITIVE
+            elif valence >= 0.5:
+                labels[parts[0]] = POSITIVE
+            elif valence <= -2.5:
+                labels[parts[0]] = VERY_NEGATIVE
+            elif valence <= -0.5:
+                labels[parts[0]] = NEGATIVE
+    with open(args.vader_source, encoding="utf-8") as source:
+        code = source.read()
+    boosters = re.search(r"BOOSTER_DICT\s*=\s*\{(.*?)\}", code, re.S)
+    negations = re.search(r"NEGATE\s*=\s*\[(.*?)\]", code, re.S)
+    if not boosters or not negations:
+        sys.exit("mklexicon: no NEGATE or BOOSTER_DICT in " + args.vader_source)
+    for word, weight in re.findall(r"""['"]?([^'",:\n]+?)['"]?\s*:\s*(B_INCR|B_DECR)""",
+                                   boosters.group(1)):
+        word = word.strip()
+        if weight == "B_INCR" and " " not in word:
+            labels[word] = STRONG_ADVERB
+    for single, double in re.findall(r"'([^'\n]*)'|\"([^\"\n]*)\"", negations.group(1)):
+        word = single or double
+        if word and " " not in word:
+            labels[word] = NEGATION
+    lexicon = LexiconWriter()
+    add_labels(lexicon, labels)
+    print("english emotions: %d words" % lexicon.write(args.lexicon), file=sys.stderr)
+
+
+def french_emotions(args):
+    with open(args.pattern, encoding="utf-8") as source:
+        pattern = json.load(source)
+    labels = {}
+    for word, entry in pattern.items():
+        if " " in word or not has_letter(word):
+            continue
+        polarity = float(entry.get("polarity") or 0)
+        intensity = float(entry.get("intensity") or 1)
+        if entry.get("pos") == "RB" and intensity >= 1.5:
+            labels[word] = STRONG_ADVERB
+        elif polarity >= 0.75:
+            labels[word] = VERY_POSITIVE
+        elif polarity >= 0.1:
+            labels[word] = POSITIVE
+        elif polarity <= -0.75:
+            labels[word] = VERY_NEGATIVE
+        elif polarity <= -0.1:
+            labels[word] = NEGATIVE
+    for word, records in read_closed_lexicon(args.extra):
+        for _, _, base in records:
+            labels[word] = base
+    lexicon = LexiconWriter()
+    add_labels(lexicon, labels)
+    print("french emotions: %d words" % lexicon.write(args.lexicon), file=sys.stderr)
+
+
+def japanese_emotions(args):
+    wanted = {}
+    exact = {}
+    for word, records in read_closed_lexicon(args.list):
+        for _, _, base in records:
+            if word.startswith("="):
+                exact[word[1:]] = base
+            else:
+                wanted[word] = base
+    labels = dict(wanted)
+    for surface, _, pos1, _, base in read_ipadic(args.ipadic):
+        if base in wanted and pos1 != "記号":
+            labels.setdefault(surface, wanted[base])
+    labels.update(exact)
+    lexicon = LexiconWriter()
+    add_labels(lexicon, labels)
+    print("japanese emotions: %d words" % lexicon.write(args.lexicon), file=sys.stderr)
+
+
+def main():
+    parser = argparse.ArgumentParser(description=__doc__.split("\n")[0])
+    commands = parser.add_subparsers(dest="command", required=True)
+
+    command = commands.add_parser("english")
+    command.add_argument("--wordnet", required=True)
+    command.add_argument("--closed", required=True)
+    command.set_defaults(run=english)
+    command = commands.add_parser("french")
+    command.add_argument("--lefff", required=True)
+    command.add_argument("--extra", required=True)
+    command.set_defaults(run=french)
+    command = commands.add_parser("japanese")
+    command.add_argument("--ipadic", required=True)
+    command.set_defaults(run=japanese)
+    for name in ("english", "french", "japanese"):
+        commands.choices[name].add_argument("--frequencies", required=True)
+
+    command = commands.add_parser("english-emotions")
+    command.add_argument("--vader-lexicon", required=True)
+    command.add_argument("--vader-source", required=True)
+    command.set_defaults(run=english_emotions)
+    command = commands.add_parser("french-emotions")
+    command.add_argument("--pattern", required=True)
+    command.add_argument("--extra", required=True)
+    command.set_defaults(run=french_emotions)
+    command = commands.add_parser("japanese-emotions")
+    command.add_argument("--list", required=True)
+    command.add_argument("--ipadic", required=True)
+    command.set_defaults(run=japanese_emotions)
+    for name in commands.choices:
+        commands.choices[name].add_argument("--lexicon", required=True)
+
+    args = parser.parse_args()
+    args.run(args)
+
+
+if __name__ == "__main__":
+    main()
