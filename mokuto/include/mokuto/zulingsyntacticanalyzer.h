@@ -12,6 +12,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <memory>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -30,6 +31,8 @@ struct ZULingSyntacticAnalyzerChunk {
   // Bytes of the chunk's text, 0 for a speech-engine tag.
   std::int32_t length = 0;
   std::vector<ZULingClassFeatures> classes;
+  // The word's node in the database of the analysis, when the word is stored there.
+  std::optional<std::uint32_t> node;
 
   ZULingWordClass wordClass() const noexcept {
     return classes.empty() ? WORD_CLASS_UNKNOWN : classes.front().wordClass;

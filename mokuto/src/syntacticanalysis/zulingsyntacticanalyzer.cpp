@@ -35,6 +35,17 @@ bool isOneOf(std::string_view word, const std::array<std::string_view, N>& words
   return std::find(words.begin(), words.end(), word) != words.end();
 }
 
+// The first bytes of the coordinating words: most words are none of them at once.
+constexpr std::array<bool, 256> coordinationFirstBytes() {
+  std::array<bool, 256> first{};
+  for (const std::string_view word : kAndWords)
+    first[static_cast<unsigned char>(word[0])] = true;
+  for (const std::string_view word : kOrWords)
+    first[static_cast<unsigned char>(word[0])] = true;
+  return first;
+}
+constexpr std::array<bool, 256> kCoordinationFirstBytes = coordinationFirstBytes();
+
 char lowerByte(char c) noexcept {
   return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
 }
@@ -200,11 +211,21 @@ class Cutter {
     return p < end && isWordCharacter(decode(fText.substr(0, end), p).value);
   }
 
-  std::size_t xLongestStored(std::size_t p, std::size_t end) const {
+  // The length of the longest stored word at p, and its node.
+  std::size_t xLongestStored(std::size_t p, std::size_t end,
+                             std::optional<std::uint32_t>& node) const {
     std::size_t longest = 0;
     if (fDatabase != nullptr)
-      fDatabase->find(fLower.substr(0, end), p, longest);
+      node = fDatabase->findLongest(fLower.substr(0, end), p, longest);
     return longest;
+  }
+
+  // The node of exactly these bytes, when they are a stored word.
+  std::optional<std::uint32_t> xStored(std::size_t begin, std::size_t end) const {
+    std::size_t longest = 0;
+    if (fDatabase == nullptr)
+      return std::nullopt;
+    return fDatabase->find(fLower.substr(begin, end - begin), 0, longest);
   }
 
   // Returns the position after what was taken; afterWord tells whether that ends with
@@ -223,21 +244,22 @@ class Cutter {
         while (q < end && isDigit(fText[q]))
           ++q;
       }
-      xPushWord(p, q);
+      xPushWord(p, q, xStored(p, q));
       return q;
     }
-    const std::size_t stored = xLongestStored(p, end);
+    std::optional<std::uint32_t> node;
+    const std::size_t stored = xLongestStored(p, end, node);
     if (stored > 0) {
       const std::size_t m = p + stored;
       const char last = fLower[m - 1];
       if ((last == '\'' || last == '-') && stored > 1) {
-        xPushWord(p, m - 1);
+        xPushWord(p, m - 1, xStored(p, m - 1));
         xPush(m - 1, m, WORD_CLASS_LINK_BETWEEN_WORDS);
         afterWord = false;
         return m;
       }
       if (!xWordStartsAt(m, end)) {
-        xPushWord(p, m);
+        xPushWord(p, m, node);
         return m;
       }
     }
@@ -248,15 +270,17 @@ class Cutter {
         break;
       q += cp.length;
     }
-    xPushWord(p, q);
+    // A stored word can be shorter than the longest stored prefix ("peut" of "peut-êtres").
+    xPushWord(p, q, stored > q - p ? xStored(p, q) : std::nullopt);
     return q;
   }
 
   std::size_t xUnspacedWord(std::size_t p, std::size_t end, CodePoint cp) {
-    const std::size_t stored = xLongestStored(p, end);
+    std::optional<std::uint32_t> node;
+    const std::size_t stored = xLongestStored(p, end, node);
     if (stored > 0 &&
         (p + stored == end || (static_cast<unsigned char>(fText[p + stored]) & 0xC0) != 0x80)) {
-      xPushWord(p, p + stored);
+      xPushWord(p, p + stored, node);
       return p + stored;
     }
     std::size_t q = p + cp.length;
@@ -268,7 +292,8 @@ class Cutter {
         q += next.length;
       }
     }
-    xPushWord(p, q);
+    // Not stored: a stored word would have been the longest prefix.
+    xPushWord(p, q, std::nullopt);
     return q;
   }
 
@@ -280,14 +305,15 @@ class Cutter {
     fChunks.push_back(std::move(chunk));
   }
 
-  void xPushWord(std::size_t begin, std::size_t end) {
+  void xPushWord(std::size_t begin, std::size_t end, std::optional<std::uint32_t> node) {
     Chunk chunk;
     chunk.text.assign(fText, begin, end - begin);
     chunk.length = static_cast<std::int32_t>(end - begin);
-    if (fDatabase != nullptr)
-      chunk.classes = fDatabase->wordClasses(fLower.substr(begin, end - begin));
+    if (node)
+      chunk.classes = fDatabase->wordClassesAt(*node);
     else
       chunk.classes.push_back({WORD_CLASS_UNKNOWN, {}});
+    chunk.node = node;
     if (fText[begin] >= 'A' && fText[begin] <= 'Z') {
       if (chunk.classes.size() == 1 && chunk.classes.front().wordClass == WORD_CLASS_UNKNOWN)
         chunk.classes.front() = {WORD_CLASS_PROPER_NOUN, {}};
@@ -366,7 +392,8 @@ struct Token {
   Role role = Role::Noun;
   Coordination coordination = Coordination::None;
   bool particle = false;
-  std::string lower;
+  // The word lowercased, in the builder's buffer.
+  std::string_view lower;
   std::uint32_t records = 0;  // bit per word class the word has
   bool infinitive = false;    // a verb record of the infinitive
 
@@ -393,13 +420,21 @@ class StructureBuilder {
     else
       xUnspacedRoles();
     xGroups();
-    std::vector<Structure> structures = xCoordinations();
+    // Both lists are in text order.
+    std::vector<Structure> coordinations = xCoordinations();
+    std::vector<Structure> structures;
+    structures.reserve(fGroups.size());
+    auto next = coordinations.begin();
     for (const Group& group : fGroups) {
-      if (!group.used)
-        structures.push_back(xGroupStructure(group));
+      if (group.used)
+        continue;
+      Structure structure = xGroupStructure(group);
+      for (; next != coordinations.end() && next->first < structure.first; ++next)
+        structures.push_back(std::move(*next));
+      structures.push_back(std::move(structure));
     }
-    std::sort(structures.begin(), structures.end(),
-              [](const Structure& a, const Structure& b) { return a.first < b.first; });
+    for (; next != coordinations.end(); ++next)
+      structures.push_back(std::move(*next));
     return structures;
   }
 
@@ -407,12 +442,17 @@ class StructureBuilder {
   static constexpr std::size_t kNone = static_cast<std::size_t>(-1);
 
   void xTokens() {
+    std::size_t bytes = 0;
+    for (const Chunk& chunk : fChunks)
+      bytes += chunk.text.size();
+    fLower.reserve(bytes);
     for (std::size_t c = 0; c < fChunks.size(); ++c) {
       const Chunk& chunk = fChunks[c];
       const ZULingWordClass wordClass = chunk.wordClass();
       if (wordClass == WORD_CLASS_PUNCTUATION) {
         Token token;
-        token.type = isOneOf(chunk.text, kItemSeparators) ? Token::Comma : Token::Break;
+        token.type = chunk.text.size() <= 3 && isOneOf(chunk.text, kItemSeparators) ? Token::Comma
+                                                                                    : Token::Break;
         token.chunk = c;
         fTokens.push_back(std::move(token));
         continue;
@@ -422,7 +462,10 @@ class StructureBuilder {
       Token token;
       token.type = Token::Word;
       token.chunk = c;
-      token.lower = lowercase(chunk.text);
+      const std::size_t from = fLower.size();
+      for (const char b : chunk.text)
+        fLower += lowerByte(b);
+      token.lower = std::string_view(fLower).substr(from);
       token.role = roleOfClass(wordClass);
       for (const ZULingClassFeatures& record : chunk.classes) {
         if (record.wordClass >= 0 && record.wordClass < 32)
@@ -430,11 +473,13 @@ class StructureBuilder {
         if (record.wordClass == WORD_CLASS_VERB && record.features.find('W') != std::string::npos)
           token.infinitive = true;
       }
-      if (isOneOf(token.lower, kAndWords))
-        token.coordination = Coordination::And;
-      else if (isOneOf(token.lower, kOrWords))
-        token.coordination = Coordination::Or;
-      token.particle = isOneOf(token.lower, kParticles);
+      if (kCoordinationFirstBytes[static_cast<unsigned char>(token.lower[0])]) {
+        if (isOneOf(token.lower, kAndWords))
+          token.coordination = Coordination::And;
+        else if (isOneOf(token.lower, kOrWords))
+          token.coordination = Coordination::Or;
+        token.particle = isOneOf(token.lower, kParticles);
+      }
       if (token.coordination != Coordination::None)
         token.role = Role::Conjunction;
       else if (lingIsNegationWord(chunk.text) && !isVerbal(token.role))
@@ -485,10 +530,9 @@ class StructureBuilder {
         continue;
       }
       Role role = token.role;
-      const bool nounContext =
-          t > 0 && xIsWord(t - 1) &&
-          (previous == Role::Determiner || previous == Role::Adjective ||
-           (previous == Role::Preposition && previousWord != "to"));
+      const bool nounContext = t > 0 && xIsWord(t - 1) &&
+                               (previous == Role::Determiner || previous == Role::Adjective ||
+                                (previous == Role::Preposition && previousWord != "to"));
       const bool canBeVerb = token.has(WORD_CLASS_VERB);
       const bool canBeNoun = token.has(WORD_CLASS_NOUN);
       if (list == List::Verbal && canBeVerb &&
@@ -780,6 +824,7 @@ class StructureBuilder {
 
   const std::vector<Chunk>& fChunks;
   bool fSpaced;
+  std::string fLower;
   std::vector<Token> fTokens;
   std::vector<Group> fGroups;
   std::vector<std::size_t> fGroupOfToken;
@@ -788,7 +833,21 @@ class StructureBuilder {
 }  // namespace
 
 bool lingIsNegationWord(std::string_view chunkText) noexcept {
-  return isOneOf(chunkText, kNegationWords);
+  // Most chunks are none of them at once.
+  if (chunkText.empty() || chunkText.size() > 9)
+    return false;
+  switch (chunkText[0]) {
+    case 'n':
+    case 'p':
+    case 's':
+    case 'c':
+    case 'd':
+    case 'h':
+    case 'w':
+      return isOneOf(chunkText, kNegationWords);
+    default:
+      return false;
+  }
 }
 
 ZULingSpeechTag lingSpeechTag(const ZULingSyntacticAnalyzerChunk& chunk) noexcept {

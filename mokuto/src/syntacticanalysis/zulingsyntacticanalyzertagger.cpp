@@ -1,6 +1,7 @@
 #include "mokuto/zulingsyntacticanalyzertagger.h"
 
 #include <algorithm>
+#include <charconv>
 #include <cstdlib>
 #include <unordered_map>
 #include <utility>
@@ -28,13 +29,18 @@ std::string lowercase(std::string_view text) {
 }
 
 Chunk tagChunk(std::string_view name, std::int64_t value) {
+  // " \name=value\ "
+  char buffer[48];
+  char* end = buffer;
+  *end++ = ' ';
+  *end++ = '\\';
+  end = std::copy(name.begin(), name.begin() + std::min<std::size_t>(name.size(), 16), end);
+  *end++ = '=';
+  end = std::to_chars(end, buffer + sizeof buffer - 2, value).ptr;
+  *end++ = '\\';
+  *end++ = ' ';
   Chunk chunk;
-  chunk.text.reserve(name.size() + 24);
-  chunk.text += " \\";
-  chunk.text += name;
-  chunk.text += '=';
-  chunk.text += std::to_string(value);
-  chunk.text += "\\ ";
+  chunk.text.assign(buffer, end);
   chunk.classes.push_back({WORD_CLASS_BOOKMARK, {}});
   return chunk;
 }
@@ -68,6 +74,12 @@ class ChunkList {
   std::size_t head() const noexcept { return fHead; }
   std::size_t previous(std::size_t k) const noexcept { return fPrevious[k]; }
   std::size_t next(std::size_t k) const noexcept { return fNext[k]; }
+  // Room for `more` chunks without moving the others.
+  void reserve(std::size_t more) {
+    fChunks.reserve(fChunks.size() + more);
+    fPrevious.reserve(fPrevious.size() + more);
+    fNext.reserve(fNext.size() + more);
+  }
   Chunk& operator[](std::size_t k) noexcept { return fChunks[k]; }
   const Chunk& operator[](std::size_t k) const noexcept { return fChunks[k]; }
 
@@ -155,6 +167,8 @@ class TagInsertion {
 
   void insertCandidates() {
     const bool ahead = fDatabase && fDatabase->flag != 0;
+    // A bookmark per candidate, and a split pause at most.
+    fChunks.reserve(2 * fCandidates.size());
     for (Candidate& candidate : fCandidates) {
       auto action = std::make_shared<MKAnimationAction>(AUTO_START_TAG);
       action->text = "AUTO_START_TAG(" + candidate.tag + ")";
@@ -182,7 +196,11 @@ class TagInsertion {
                             k);
       }
     }
+    std::size_t length = 0;
+    for (std::size_t k = fChunks.head(); k != kNone; k = fChunks.next(k))
+      length += fChunks[k].text.size();
     std::string text;
+    text.reserve(length);
     for (std::size_t k = fChunks.head(); k != kNone; k = fChunks.next(k))
       text += fChunks[k].text;
     if (reorder) {
@@ -215,15 +233,19 @@ class TagInsertion {
   // The configuration's tags for the word, one at random; else its base form.
   void xWordTag(std::size_t c) {
     const Chunk& chunk = fChunks[c];
-    const std::string word = lowercase(chunk.text);
-    const auto bound = fJob.config.wordsToTags.find(word);
-    if (bound != fJob.config.wordsToTags.end() && !bound->second.empty()) {
-      const auto pick = static_cast<std::size_t>(std::rand()) % bound->second.size();
-      xPropose(bound->second[pick], c);
-      return;
+    const auto& wordsToTags = fJob.config.wordsToTags;
+    if (!wordsToTags.empty()) {
+      const auto bound = wordsToTags.find(lowercase(chunk.text));
+      if (bound != wordsToTags.end() && !bound->second.empty()) {
+        const auto pick = static_cast<std::size_t>(std::rand()) % bound->second.size();
+        xPropose(bound->second[pick], c);
+        return;
+      }
     }
+    // The chunk's node is the lowercased word's in the analysis' database.
     std::string baseForm;
-    if (fDatabase && fDatabase->lemma(word, chunk.wordClass(), baseForm) && !baseForm.empty())
+    if (fDatabase && chunk.node && fDatabase->lemmaAt(*chunk.node, chunk.wordClass(), baseForm) &&
+        !baseForm.empty())
       xPropose(baseForm, c);
   }
 
