@@ -8,6 +8,7 @@
 #include <atomic>
 #include <filesystem>
 #include <fstream>
+#include <random>
 #include <set>
 #include <sstream>
 #include <string>
@@ -245,6 +246,59 @@ TEST_F(AnalysisTest, TheTokeniserCutsTagsSpacesLinksPunctuationAndWords) {
   const auto the = analyse("The").chunks.at(0).classes;
   EXPECT_EQ(the, (std::vector<ZULingClassFeatures>{{WORD_CLASS_DETERMINANT, ""},
                                                    {WORD_CLASS_PROPER_NOUN, ""}}));
+}
+
+// Whatever the bytes, the chunks hold the whole text once: the tags with a space on
+// either side, every other byte as written; tagging them never fails.
+TEST_F(AnalysisTest, AnyTextIsCutWithoutLosingAByte) {
+  std::vector<std::string> texts = {
+      "",
+      "\\",
+      "\\\\",
+      "\\ \\",
+      "a\\b\\c\\",
+      "\xE3",
+      "\xE3\x81",
+      "a\xFF'b",
+      "-'-",
+      "'''",
+      "1 , . 2 ,3.",
+      "\\pau=-5\\ x",
+      "\\pau=99999999999999999999\\ a and b",
+      "\\mrk=\\ \\mrkpause=2\\",
+      "and or , and",
+      "l'",
+      "'l",
+      "n'",
+      "ペッパーーー",
+      std::string(300, 'x') + " and y",
+  };
+  std::mt19937 random(7);
+  const std::string alphabet = "ab AI,'-\\=1.\xC3\xA9\xE3\x81\x82pau";
+  for (int k = 0; k < 200; ++k) {
+    std::string text;
+    for (std::size_t n = random() % 40; n > 0; --n)
+      text += alphabet[random() % alphabet.size()];
+    texts.push_back(text);
+  }
+  for (const char* language : {"English", "Japanese", "Klingon"}) {
+    for (const std::string& text : texts) {
+      SCOPED_TRACE(std::string(language) + ": " + text);
+      const ZULingSyntacticAnalysis analysis = analyse(text, language);
+      std::string joined;
+      for (const auto& chunk : analysis.chunks) {
+        ASSERT_FALSE(chunk.text.empty());
+        if (chunk.wordClass() == WORD_CLASS_BOOKMARK)
+          joined += chunk.text.substr(1, chunk.text.size() - 2);
+        else
+          joined += chunk.text;
+      }
+      EXPECT_EQ(joined, text);
+      for (const auto& structure : analysis.structures)
+        ASSERT_LT(structure.last, analysis.chunks.size());
+      compile(text, language);
+    }
+  }
 }
 
 TEST_F(AnalysisTest, StructuresGroupWordsAndFindCoordinations) {
