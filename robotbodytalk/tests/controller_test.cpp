@@ -2,6 +2,7 @@
 // resume, the start delays, and the loop of a worker.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <condition_variable>
 #include <cstdlib>
 #include <functional>
