@@ -4,6 +4,7 @@
 #include <exception>
 #include <iterator>
 #include <limits>
+#include <stdexcept>
 #include <string_view>
 #include <utility>
 
@@ -42,6 +43,18 @@ bool startsWith(std::string_view text, std::string_view prefix) {
 
 bool isPostureFamily(PostureFamily family) {
   return family >= Standing && family < Unknown;
+}
+
+// The action as the record that its type calls for; raises std::invalid_argument when the
+// record is of another class.
+template <class Record>
+Record& recordOf(MKTaskAction& action) {
+  auto* record = dynamic_cast<Record*>(&action);
+  if (!record)
+    throw std::invalid_argument(action.text +
+                                " is not held in the record of its type. "
+                                "Instruction skipped.");
+  return *record;
 }
 
 // The service of that name through the session: in the local scope, then in any scope,
@@ -99,147 +112,116 @@ void LoaderTask::process(MKTaskInstruction& instruction) {
     std::lock_guard lock(fPreloadMutex);
     fPreloadCounts.clear();
   }
-  for (const auto& action : instruction.actions) {
-    if (!action)
+  const PostureFamily family = instruction.postureFamily;
+  for (const auto& held : instruction.actions) {
+    if (!held)
       continue;
+    MKTaskAction& action = *held;
     try {
-      switch (action->type) {
+      switch (action.type) {
         case START:
         case RUN:
         case WAIT:
-        case STOP:
-          xPrepareAnimation(*action);
+        case STOP: {
+          std::string& animation = recordOf<MKAnimationAction>(action).animation;
+          std::string resolved;
+          try {
+            resolved = xBehaviorManager()->resolveBehaviorName(animation);
+          } catch (const std::exception& e) {
+            KO_LOG_ERROR(kCategory) << e.what();
+            action.markAsError("ANIMATION_NOT_FOUND");
+            break;
+          }
+          if (resolved.empty()) {
+            KO_LOG_ERROR(kCategory)
+                << "Animation \"" << animation << "\" not found. Instruction skipped.";
+            action.markAsError("ANIMATION_NOT_FOUND");
+          } else if (resolved == animation) {
+            if (action.type == START)
+              xRegisterPreload(animation);
+          } else {
+            KO_LOG_WARNING(kCategory) << "Animation name badly formatted given \"" << animation
+                                      << "\" instead of \"" << resolved << "\".";
+            animation = std::move(resolved);
+          }
           break;
+        }
         case AUTO_START_TAG:
         case START_TAG:
         case RUN_TAG:
         case WAIT_TAG:
-        case STOP_TAG:
-          xPrepareTag(*action, instruction);
+        case STOP_TAG: {
+          MKAnimationAction& tagAction = recordOf<MKAnimationAction>(action);
+          if (!isPostureFamily(family)) {
+            KO_LOG_WARNING(kCategory)
+                << action.text
+                << " action can't be done because the robot is in an unknown posture.";
+            action.markAsError("NO_ANIMATION_FOR_CURRENT_POSTURE");
+            break;
+          }
+          std::lock_guard lock(fTagsMutex);
+          const auto index = static_cast<std::size_t>(family);
+          const TagMap& configured = instruction.config.tagsToAnimations[index];
+          const TagMap& installed = fInstalledTags[index];
+          const std::set<std::string>* candidates = nullptr;
+          if (const auto it = configured.find(tagAction.tag); it != configured.end()) {
+            candidates = &it->second;
+          } else if (const auto found = installed.find(tagAction.tag); found != installed.end()) {
+            candidates = &found->second;
+          }
+          // A configured tag without animations hides the installed ones and finds nothing.
+          if (!candidates || candidates->empty()) {
+            if (action.type != AUTO_START_TAG) {
+              KO_LOG_WARNING(kCategory)
+                  << "Tag \"" << tagAction.tag << "\" not found for the "
+                  << postureFamilyToStr(family) << " posture. Instruction skipped.";
+              action.markAsError("NO_ANIMATION_FOR_CURRENT_POSTURE");
+            }
+            action.type = UNKNOWN;
+            break;
+          }
+          const std::set<std::string> choice = *candidates;
+          const auto k = static_cast<std::size_t>(std::rand()) % choice.size();
+          tagAction.animation = *std::next(choice.begin(), static_cast<std::ptrdiff_t>(k));
+          xRegisterPreload(tagAction.animation);
           break;
+        }
         case START_SOUND:
-        case RUN_SOUND:
-          xPrepareSound(*action);
+        case RUN_SOUND: {
+          const std::string& soundSet = recordOf<MKSoundAction>(action).soundSet;
+          try {
+            xAudioPlayer()->loadSoundSet(soundSet);
+          } catch (const std::exception& e) {
+            KO_LOG_ERROR(kCategory) << e.what();
+            action.markAsError("SOUND_SET_NOT_FOUND");
+          }
           break;
+        }
         case CALL:
-        case PCALL:
-          xPrepareCall(*action);
+        case PCALL: {
+          MKCallAction& call = recordOf<MKCallAction>(action);
+          try {
+            if (!fSession)
+              ZU_THROW_ERROR("ZUProxy", "ZUProxy", "Broker is invalid");
+            ko::AnyObject service = fSession->service(call.module, "").value(kCallLookupTimeoutMs);
+            call.proxy = std::make_shared<ZUProxy>(std::move(service), call.module);
+          } catch (const std::exception& e) {
+            KO_LOG_ERROR(kCategory) << e.what();
+            action.markAsError("MODULE_NOT_FOUND");
+          }
           break;
+        }
         default:
           break;
       }
     } catch (const std::exception& e) {
-      KO_LOG_ERROR(kCategory) << action->text << ": " << e.what();
-      action->type = UNKNOWN;
+      // A record that does not fit its type, or no memory left: only this action is lost.
+      KO_LOG_ERROR(kCategory) << e.what();
+      action.type = UNKNOWN;
     }
   }
   if (!instruction.config.behaviorAtEndOfMokuto.empty())
     xLoadAnimation(instruction.config.behaviorAtEndOfMokuto);
-}
-
-void LoaderTask::xPrepareAnimation(MKTaskAction& action) {
-  auto* animationAction = dynamic_cast<MKAnimationAction*>(&action);
-  if (!animationAction) {
-    KO_LOG_ERROR(kCategory) << action.text
-                            << " is not an animation instruction. Instruction skipped.";
-    action.type = UNKNOWN;
-    return;
-  }
-  std::string& animation = animationAction->animation;
-  std::string resolved;
-  try {
-    resolved = xBehaviorManager()->resolveBehaviorName(animation);
-  } catch (const std::exception& e) {
-    KO_LOG_ERROR(kCategory) << e.what();
-    action.markAsError("ANIMATION_NOT_FOUND");
-    return;
-  }
-  if (resolved.empty()) {
-    KO_LOG_ERROR(kCategory) << "Animation \"" << animation << "\" not found. Instruction skipped.";
-    action.markAsError("ANIMATION_NOT_FOUND");
-  } else if (resolved == animation) {
-    if (action.type == START)
-      xRegisterPreload(animation);
-  } else {
-    KO_LOG_WARNING(kCategory) << "Animation name badly formatted given \"" << animation
-                              << "\" instead of \"" << resolved << "\".";
-    animation = std::move(resolved);
-  }
-}
-
-void LoaderTask::xPrepareTag(MKTaskAction& action, const MKTaskInstruction& instruction) {
-  auto* tagAction = dynamic_cast<MKAnimationAction*>(&action);
-  if (!tagAction) {
-    KO_LOG_ERROR(kCategory) << action.text << " is not a tag instruction. Instruction skipped.";
-    action.type = UNKNOWN;
-    return;
-  }
-  const PostureFamily family = instruction.postureFamily;
-  if (!isPostureFamily(family)) {
-    KO_LOG_WARNING(kCategory) << action.text
-                              << " action can't be done because the robot is in an unknown "
-                                 "posture.";
-    action.markAsError("NO_ANIMATION_FOR_CURRENT_POSTURE");
-    return;
-  }
-
-  std::lock_guard lock(fTagsMutex);
-  const auto index = static_cast<std::size_t>(family);
-  const TagMap& configured = instruction.config.tagsToAnimations[index];
-  const TagMap& installed = fInstalledTags[index];
-  const std::set<std::string>* candidates = nullptr;
-  if (const auto it = configured.find(tagAction->tag); it != configured.end()) {
-    candidates = &it->second;
-  } else if (const auto found = installed.find(tagAction->tag); found != installed.end()) {
-    candidates = &found->second;
-  }
-  // A configured tag without animations hides the installed ones and finds nothing.
-  if (!candidates || candidates->empty()) {
-    if (action.type != AUTO_START_TAG) {
-      KO_LOG_WARNING(kCategory) << "Tag \"" << tagAction->tag << "\" not found for the "
-                                << postureFamilyToStr(family) << " posture. Instruction skipped.";
-      action.markAsError("NO_ANIMATION_FOR_CURRENT_POSTURE");
-    }
-    action.type = UNKNOWN;
-    return;
-  }
-  const std::set<std::string> choice = *candidates;
-  const auto k = static_cast<std::size_t>(std::rand()) % choice.size();
-  tagAction->animation = *std::next(choice.begin(), static_cast<std::ptrdiff_t>(k));
-  xRegisterPreload(tagAction->animation);
-}
-
-void LoaderTask::xPrepareSound(MKTaskAction& action) {
-  auto* soundAction = dynamic_cast<MKSoundAction*>(&action);
-  if (!soundAction) {
-    KO_LOG_ERROR(kCategory) << action.text << " is not a sound instruction. Instruction skipped.";
-    action.type = UNKNOWN;
-    return;
-  }
-  try {
-    xAudioPlayer()->loadSoundSet(soundAction->soundSet);
-  } catch (const std::exception& e) {
-    KO_LOG_ERROR(kCategory) << e.what();
-    action.markAsError("SOUND_SET_NOT_FOUND");
-  }
-}
-
-void LoaderTask::xPrepareCall(MKTaskAction& action) {
-  auto* callAction = dynamic_cast<MKCallAction*>(&action);
-  if (!callAction) {
-    KO_LOG_ERROR(kCategory) << action.text << " is not a call instruction. Instruction skipped.";
-    action.type = UNKNOWN;
-    return;
-  }
-  try {
-    if (!fSession)
-      ZU_THROW_ERROR("ZUProxy", "ZUProxy", "Broker is invalid");
-    ko::AnyObject service = fSession->service(callAction->module, "").value(kCallLookupTimeoutMs);
-    callAction->proxy = std::make_shared<ZUProxy>(std::move(service), callAction->module);
-  } catch (const std::exception& e) {
-    KO_LOG_ERROR(kCategory) << e.what();
-    action.markAsError("MODULE_NOT_FOUND");
-  }
 }
 
 void LoaderTask::xLoadAnimation(const std::string& name) {

@@ -108,11 +108,6 @@ class LoaderTask {
   // of the behaviour manager's list.
   using BodyTalkLists = std::array<std::vector<std::string>, 4>;
 
-  // The stage's treatment of one action.
-  void xPrepareAnimation(MKTaskAction& action);
-  void xPrepareTag(MKTaskAction& action, const MKTaskInstruction& instruction);
-  void xPrepareSound(MKTaskAction& action);
-  void xPrepareCall(MKTaskAction& action);
   // Preloads one behaviour and waits; a failure is logged.
   void xLoadAnimation(const std::string& name);
   // Counts one expected start; the first one preloads.
