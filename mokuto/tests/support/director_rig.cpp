@@ -1,0 +1,185 @@
+#include "director_rig.h"
+
+#include <atomic>
+#include <chrono>
+#include <condition_variable>
+#include <fstream>
+#include <mutex>
+#include <sstream>
+#include <utility>
+
+#include <unistd.h>
+
+#include "ko/reaper.hpp"
+#include "ko/session.hpp"
+#include "mokuto/zumokutoparser.h"
+#include "robotsim/robot.h"
+#include "robotsim/zuaudioplayer.h"
+#include "robotsim/zubehaviormanager.h"
+#include "robotsim/zumemory.h"
+#include "robotsim/zumotion.h"
+#include "robotsim/zurobotstate.h"
+#include "zu/zuproxy.h"
+#include "zu/zuserviceproxies.h"
+
+namespace mokutotest {
+
+namespace fs = std::filesystem;
+
+namespace {
+
+struct Gesture {
+  const char* path;
+  double seconds;
+  const char* joint;
+  const char* tags;
+};
+// Each on joints of its own: no gesture takes another's joints over.
+constexpr Gesture kGestures[] = {
+    {kShort, 0.3, "LWristYaw", "\"short\""},
+    {kMid, 1.0, "LShoulderRoll", "\"mid\""},
+    {kLongA, 30.0, "LElbowYaw", "\"hello\", \"long\""},
+    {kLongB, 30.0, "RElbowYaw", "\"hello\""},
+    {kLongC, 30.0, "RWristYaw", "\"yeah\""},
+    {kEnd, 0.2, "RShoulderRoll", "\"end\""},
+};
+
+void writeGesture(const fs::path& root, const Gesture& gesture) {
+  const fs::path folder = root / gesture.path;
+  fs::create_directories(folder);
+  std::ofstream out(folder / "behavior.json");
+  out << "{\"tags\": [" << gesture.tags << "], \"duration\": " << gesture.seconds
+      << ", \"joints\": {\"" << gesture.joint << "\": {\"times\": [" << gesture.seconds
+      << "], \"keys\": [[0.2, [3, " << -gesture.seconds / 3 << ", 0.0], [3, 0.0, 0.0]]]}}}";
+}
+
+fs::path makeLibrary() {
+  static std::atomic<int> serial{0};
+  const fs::path root =
+      fs::temp_directory_path() /
+      ("mokuto-director-" + std::to_string(::getpid()) + "-" + std::to_string(serial.fetch_add(1)));
+  for (const auto& gesture : kGestures)
+    writeGesture(root, gesture);
+  return root;
+}
+
+std::string firstArgument(const robotsim::TimelineEntry& entry) {
+  try {
+    const auto list = entry.arguments.to<std::vector<ko::AnyValue>>();
+    return list.empty() ? std::string() : list.front().to<std::string>();
+  } catch (const std::exception&) {
+    return {};
+  }
+}
+
+}  // namespace
+
+// Wakes the waiters at each timeline entry; lives as long as the timeline.
+struct DirectorRig::Waiter {
+  std::mutex mutex;
+  std::condition_variable recorded;
+};
+
+DirectorRig::DirectorRig(Speech kind)
+    : fLibrary(makeLibrary()), fWaiter(std::make_shared<Waiter>()) {
+  using ZU::ZUModule;
+  if (kind == Speech::Espeak) {
+    robotsim::RobotOptions options;
+    options.behaviorsRoot = fLibrary.string();
+    fRobot = std::make_unique<robotsim::Robot>(options);
+    broker = fRobot->broker();
+    timeline = fRobot->timeline();
+  } else {
+    broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
+    timeline = std::make_shared<robotsim::Timeline>();
+    robotsim::ZUMemoryOptions memory;
+    memory.timeline = timeline;
+    fServices.push_back(ZUModule::createModule<robotsim::ZUMemory>(broker, "ZUMemory", memory));
+    fServices.push_back(ZUModule::createModule<robotsim::ZUMotion>(broker, "ZUMotion", timeline));
+    fServices.push_back(ZUModule::createModule<robotsim::ZUBehaviorManager>(
+        broker, "ZUBehaviorManager", timeline, fLibrary.string()));
+    fServices.push_back(
+        ZUModule::createModule<robotsim::ZUAudioPlayer>(broker, "ZUAudioPlayer", timeline));
+    fServices.push_back(
+        ZUModule::createModule<robotsim::ZURobotPosture>(broker, "ZURobotPosture", timeline));
+    fServices.push_back(ZUModule::createModule<robotsim::ZURobotModel>(broker, "ZURobotModel"));
+    fServices.push_back(
+        ZUModule::createModule<robotsim::ZUAutonomousMoves>(broker, "ZUAutonomousMoves", timeline));
+    speech = ZUModule::createModule<ScriptedSpeech>(broker, "ZUTextToSpeech");
+    fServices.push_back(speech);
+  }
+  timeline->addListener([waiter = fWaiter](const robotsim::TimelineEntry&) {
+    std::lock_guard lock(waiter->mutex);
+    waiter->recorded.notify_all();
+  });
+  ZU::ZUAudioPlayerProxy(broker).loadSoundSet("bells");
+  host = ZUModule::createModule<DirectorHost>(broker, "ZUMokuto");
+  // As the posture watcher would report it: the body talk moves the head.
+  host->bodyTalk()->getPosture()->setPostureFamily(ZU::Standing);
+}
+
+DirectorRig::~DirectorRig() {
+  host->exit();
+  host.reset();
+  fRobot.reset();
+  while (!fServices.empty()) {
+    fServices.back()->exit();
+    fServices.pop_back();
+  }
+  speech.reset();
+  broker.reset();
+  ko::waitForReaper();
+  std::error_code ec;
+  fs::remove_all(fLibrary, ec);
+}
+
+std::shared_ptr<robotsim::ZUTextToSpeech> DirectorRig::espeak() const {
+  return fRobot ? fRobot->speech() : nullptr;
+}
+
+std::shared_ptr<ZU::MKTaskInstruction> DirectorRig::job(
+    const std::string& annotated, const ZU::MokutoConfig& config,
+    const std::map<std::string, std::string>& tags) {
+  auto job = std::make_shared<ZU::MKTaskInstruction>();
+  job->config = config;
+  ZU::ZUMokutoParser().parse(job, annotated, false);
+  for (const auto& action : job->actions) {
+    if (auto* animation = dynamic_cast<ZU::MKAnimationAction*>(action.get())) {
+      if (animation->animation.empty()) {
+        const auto it = tags.find(animation->tag);
+        animation->animation = it != tags.end() ? it->second : animation->tag;
+      }
+    } else if (auto* call = dynamic_cast<ZU::MKCallAction*>(action.get())) {
+      try {
+        call->proxy = std::make_shared<ZU::ZUProxy>(call->module, broker);
+      } catch (const std::exception&) {
+        call->markAsError("MODULE_NOT_FOUND");
+      }
+    }
+  }
+  return job;
+}
+
+std::future<ZU::MKID> DirectorRig::sayAsync(std::shared_ptr<ZU::MKTaskInstruction> job) {
+  return std::async(std::launch::async,
+                    [host = host, job = std::move(job)] { return host->say(job); });
+}
+
+std::size_t DirectorRig::count(const std::string& service, const std::string& operation,
+                               const std::string& first) const {
+  std::size_t n = 0;
+  for (const auto& entry : timeline->entries(service, operation)) {
+    if (first.empty() || firstArgument(entry) == first)
+      ++n;
+  }
+  return n;
+}
+
+bool DirectorRig::waitFor(const std::string& service, const std::string& operation,
+                          const std::string& first, std::size_t wanted) const {
+  std::unique_lock lock(fWaiter->mutex);
+  return fWaiter->recorded.wait_for(lock, kBound,
+                                    [&] { return count(service, operation, first) >= wanted; });
+}
+
+}  // namespace mokutotest
