@@ -71,7 +71,8 @@ constexpr const char* kJapanese =
     "好き\tadjective=好き\n"
     "です\tauxiliary=です\n"
     "食べ\tverb=食べる\n"
-    "ない\tadjective=ない\tauxiliary/n=ない\n";
+    "ない\tadjective=ない\tauxiliary/n=ない\n"
+    "思い\tnoun=思い\tverb=思う\n";
 
 constexpr const char* kEmotions =
     "happy\tunkonwn=positive\n"
@@ -322,6 +323,8 @@ TEST_F(AnalysisTest, StructuresGroupWordsAndFindCoordinations) {
   EXPECT_EQ(describe(analyse("りんご、バナナとみかんが好きです", "Japanese")),
             "and3[りんご バナナ と みかん] nominal[好き] verb[です]");
   EXPECT_EQ(describe(analyse("食べない", "Japanese")), "verb[食べ ない]");
+  // A quoting particle after an adjective coordinates nothing.
+  EXPECT_EQ(describe(analyse("ないと思い", "Japanese")), "nominal[ない] nominal[思い]");
   EXPECT_TRUE(lingIsNegationWord("wouldn't"));
   EXPECT_FALSE(lingIsNegationWord("Not"));
 }

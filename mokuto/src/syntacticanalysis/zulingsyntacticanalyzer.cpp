@@ -713,9 +713,9 @@ class StructureBuilder {
   // Coordinations: around each "and" or "or" word, the item after it (more items after
   // further same words) and the items before it, separated by commas or by the same
   // word ("apples, pears and plums", "A と B と C"); all items are groups of one kind,
-  // nominal for the Japanese particles. Items begin with a preposition only when the
-  // last one does; otherwise a preposition ends the list. A pronoun after the word that begins a
-  // clause
+  // nominal groups ending in a noun or pronoun for the Japanese particles. Items begin with a
+  // preposition only when the last one does; otherwise a preposition ends the list. A pronoun after
+  // the word that begins a clause
   // ("I like tea and he likes coffee") coordinates nothing.
   std::vector<Structure> xCoordinations() {
     std::vector<Structure> structures;
@@ -729,13 +729,13 @@ class StructureBuilder {
       if (!xItemAt(c + 1, item))
         continue;
       const ZULingStructureKind kind = fGroups[item.group].kind;
-      if (word.particle && kind != STRUCTURE_NOMINAL)
+      if (word.particle && !xNounHeaded(item.group))
         continue;
       after.push_back(item);
       std::vector<std::size_t> words{c};
       for (std::size_t k = fGroups[item.group].lastToken + 1;
            xIsWord(k) && fTokens[k].coordination == word.coordination && xItemAt(k + 1, item) &&
-           fGroups[item.group].kind == kind;
+           fGroups[item.group].kind == kind && (!word.particle || xNounHeaded(item.group));
            k = fGroups[item.group].lastToken + 1) {
         words.push_back(k);
         after.push_back(item);
@@ -745,7 +745,8 @@ class StructureBuilder {
       if (end > 0 && fTokens[end - 1].type == Token::Comma && fSpaced)
         --end;  // "apples, pears, and plums"
       const bool prepositions = after.front().firstToken != fGroups[after.front().group].firstToken;
-      while (end > 0 && xItemBefore(end - 1, item) && fGroups[item.group].kind == kind) {
+      while (end > 0 && xItemBefore(end - 1, item) && fGroups[item.group].kind == kind &&
+             (!word.particle || xNounHeaded(item.group))) {
         if (item.firstToken != fGroups[item.group].firstToken && !prepositions) {
           // "for example apples, pears and plums": the preposition leads the list.
           item.firstToken = fGroups[item.group].firstToken;
@@ -788,6 +789,14 @@ class StructureBuilder {
       structures.push_back(std::move(structure));
     }
     return structures;
+  }
+
+  // A nominal group ending in its noun or pronoun: the only items of a Japanese particle,
+  // which also quotes ("ないと思います") and marks case.
+  bool xNounHeaded(std::size_t g) const {
+    const Group& group = fGroups[g];
+    return group.kind == STRUCTURE_NOMINAL &&
+           (group.lastRole == Role::Noun || group.lastRole == Role::Pronoun);
   }
 
   // A lone pronoun after the coordinating word, followed by a verb, while the first
