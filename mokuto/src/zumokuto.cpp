@@ -255,7 +255,7 @@ void ZUMokuto::init() {
         return;
       std::shared_lock lock(module->configLock);
       for (const auto& package : module->config.animationsPackages) {
-        if (module->hasExited())
+        if (module->hasExited() || module->loader->isUpdateAborted())
           return;
         module->loader->updateRepresentations(package);
       }
