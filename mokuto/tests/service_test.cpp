@@ -409,6 +409,37 @@ TEST_F(ServicePipeline, DiagnosisWithNoTextRunning) {
   EXPECT_EQ(logged, expected);
 }
 
+TEST_F(ServicePipeline, PrepareCompilesAndLoadsInTheLastReportedPostureWithoutSpeaking) {
+  struct Report {
+    ZU::ZUValue value;
+    ZU::PostureFamily family;
+  };
+  const std::vector<Report> reports = {
+      {ZU::ZUValue("SittingOnChair"), ZU::SittingOnChair},
+      {ZU::ZUValue("Crouching"), ZU::Unknown},
+      {ZU::ZUValue(1), ZU::Unknown},  // not a name: ignored
+      {ZU::ZUValue("Standing"), ZU::Standing},
+  };
+  for (const auto& report : reports) {
+    SCOPED_TRACE(report.value.toString());
+    mokuto_->_postureFamilyChangedCallback("PostureFamilyChanged", report.value, "");
+    EXPECT_EQ(mokuto_->prepare("Hi")->postureFamily, report.family);
+  }
+  const std::string gesture = "animations/Stand/Gestures/Hey_1";
+  const auto job = mokuto_->prepare("Hi ^start(" + gesture + ") there",
+                                    ZU::ZUValue::makeArray({ZU::ZUValue::makeArray(
+                                        {ZU::ZUValue("msPauseBeforeSpeech"), ZU::ZUValue(0)})}));
+  ASSERT_EQ(job->actions.size(), 1u);
+  EXPECT_EQ(job->actions[0]->text, "^start(" + gesture + ")");
+  EXPECT_EQ(job->config.msPauseBeforeSpeech, 0);
+  EXPECT_EQ(timeline_->entries("ZUBehaviorManager", "preloadBehavior").size(), 1u);
+  EXPECT_EQ(speech_->sayCount(), 0u);
+  EXPECT_FALSE(mokuto_->_isRunning());
+  EXPECT_TRUE(endEvents().empty());
+  for (const auto& entry : stages_->all())
+    EXPECT_NE(entry.first, Stage::Director);
+}
+
 // ---- the method table and the configuration methods ---------------------------------------
 
 struct MethodRow {
