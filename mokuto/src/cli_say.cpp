@@ -59,9 +59,10 @@ Parsed parseJsonOption(const std::string& option, const std::string& json) {
   Parsed parsed;
   try {
     const ko::AnyValue value = ko::fromJson(json);
-    parsed.value = ZU::fromAnyReference(value);
-    if (!parsed.value->isArray())
+    if (value.kind() != ko::Kind::List)
       parsed.error = option + " takes a JSON array";
+    else
+      parsed.value = ZU::fromAnyReference(value);
   } catch (const ko::JsonError& e) {
     parsed.error = option + ": invalid JSON: " + e.what();
   } catch (const ZU::ZUError& e) {
@@ -188,7 +189,7 @@ int say(SayOptions& o) {
       robot.timeline()->clear();
       const auto job = service.prepare(*o.text, configuration ? *configuration : noConfiguration);
       std::cout << dumpJson(preparedJobToJson(*job)) << std::endl;
-      if (timelineFile)
+      if (timelineFile.is_open())
         robot.timeline()->writeJsonLines(timelineFile);
     } else {
       const auto recorder = SayTimeline::create(robot.timeline(), o.quiet ? nullptr : &std::cout);
@@ -208,12 +209,12 @@ int say(SayOptions& o) {
         robot.speech()->saveRecording(o.wav);
         std::cout << "Audio written to " << o.wav << std::endl;
       }
-      if (timelineFile) {
+      if (timelineFile.is_open()) {
         recorder->writeJsonLines(timelineFile);
         std::cout << "Timeline written to " << o.timeline << std::endl;
       }
     }
-    if (timelineFile && !timelineFile.flush()) {
+    if (timelineFile.is_open() && !timelineFile.flush()) {
       std::cerr << "mokuto say: cannot write " << o.timeline << std::endl;
       return kFailure;
     }
