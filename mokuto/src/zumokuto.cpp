@@ -255,7 +255,7 @@ void ZUMokuto::init() {
         return;
       std::shared_lock lock(module->configLock);
       for (const auto& package : module->config.animationsPackages) {
-        if (module->hasExited())
+        if (module->hasExited() || module->loader->isUpdateAborted())
           return;
         module->loader->updateRepresentations(package);
       }
@@ -332,38 +332,46 @@ void ZUMokuto::xSay(const std::shared_ptr<MKTaskInstruction>& instruction) {
     KO_LOG_ERROR(kMain) << kNotInitialized;
     return;
   }
-  std::optional<MKID> id;
+  // Set while the identifier is registered: the guard frees it once.
+  std::optional<MKID> registered;
   try {
-    id = xNewMKID(instruction);
+    const MKID id = xNewMKID(instruction);
+    registered = id;
     instruction->postureFamily = bodyTalk->bodyTalk->getPostureFamily();
     const auto& timeChecker = director->getTimeChecker();
     if (timeChecker && timeChecker->enabled())
-      timeChecker->startOfMokuto(*id);
+      timeChecker->startOfMokuto(id);
     {
       std::lock_guard lock(compilerMutex);
-      if (!textRegister.isMKIDStopped(*id))
+      if (!textRegister.isMKIDStopped(id)) {
+        xEnterStage(ZUMokutoStage::Compiler, id);
         compiler->process(instruction);
+      }
     }
     {
       std::lock_guard lock(loaderMutex);
-      if (!textRegister.isMKIDStopped(*id))
+      if (!textRegister.isMKIDStopped(id)) {
+        xEnterStage(ZUMokutoStage::Loader, id);
         loader->process(*instruction);
+      }
     }
     {
       std::lock_guard lock(directorMutex);
-      if (!textRegister.isMKIDStopped(*id)) {
+      if (!textRegister.isMKIDStopped(id)) {
+        xEnterStage(ZUMokutoStage::Director, id);
         KO_LOG_INFO(kMain) << "Animated saying: " << *instruction;
         director->process(instruction);
       }
     }
-    xFreeMKID(*id);
-    memory->raiseEvent(kEndEvent, ZUValue(*id));
+    registered.reset();
+    xFreeMKID(id);
+    memory->raiseEvent(kEndEvent, ZUValue(id));
     if (timeChecker && timeChecker->enabled())
-      timeChecker->stopOfMokuto(*id);
+      timeChecker->stopOfMokuto(id);
   } catch (const std::exception& e) {
     KO_LOG_ERROR(kMain) << "say() method detects an exception: " << e.what();
-    if (id)
-      xFreeMKID(*id);
+    if (registered)
+      xFreeMKID(*registered);
     throw;
   }
 }
@@ -382,13 +390,17 @@ std::shared_ptr<MKTaskInstruction> ZUMokuto::prepare(const std::string& text,
     instruction->postureFamily = bodyTalk->bodyTalk->getPostureFamily();
     {
       std::lock_guard lock(compilerMutex);
-      if (!textRegister.isMKIDStopped(id))
+      if (!textRegister.isMKIDStopped(id)) {
+        xEnterStage(ZUMokutoStage::Compiler, id);
         compiler->process(instruction);
+      }
     }
     {
       std::lock_guard lock(loaderMutex);
-      if (!textRegister.isMKIDStopped(id))
+      if (!textRegister.isMKIDStopped(id)) {
+        xEnterStage(ZUMokutoStage::Loader, id);
         loader->process(*instruction);
+      }
     }
   } catch (...) {
     xFreeMKID(id);
@@ -444,6 +456,11 @@ bool ZUMokuto::waitForIndex(std::chrono::milliseconds bound) {
     built = fIndexBuilt;
   }
   return !built || built->wait(static_cast<int>(bound.count())) != ko::FutureState::Timeout;
+}
+
+void ZUMokuto::xEnterStage(ZUMokutoStage stage, MKID id) const {
+  if (fOptions.onStage)
+    fOptions.onStage(stage, id);
 }
 
 // ---- the emotion of a recognised text ----

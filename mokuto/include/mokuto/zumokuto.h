@@ -19,6 +19,7 @@
 
 #include <chrono>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -43,12 +44,19 @@ namespace ZU {
 class LoaderTask;
 class ZUMemoryProxy;
 
+// The stages of the say pipeline, in the order a text goes through them.
+enum class ZUMokutoStage { Compiler, Loader, Director };
+
 // What a host may change in the module's making; the defaults are those of the robot.
 struct ZUMokutoOptions {
   // For the body talk instance, when this module is the first to make it.
   ZURobotBodyTalkOptions bodyTalk;
   // How long a blocking _stopAll waits for a text to be freed before it gives up.
   std::chrono::microseconds stopAllWait{3'000'000};
+  // Called in the say caller's thread as a text enters a stage, under that stage's lock
+  // once its stop check has passed, for hosts that trace the pipeline. What it throws
+  // fails the text as the stage's own error would.
+  std::function<void(ZUMokutoStage stage, MKID id)> onStage;
 };
 
 class ZUMokuto : public ZUModule {
@@ -139,6 +147,7 @@ class ZUMokuto : public ZUModule {
   // it is wired here every text is neutral.
   std::int32_t xEstimateEmotion(const std::string& text);
   void xBindMethods();
+  void xEnterStage(ZUMokutoStage stage, MKID id) const;
 
   const ZUMokutoOptions fOptions;
 

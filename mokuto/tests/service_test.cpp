@@ -1,0 +1,667 @@
+// The service module ZUMokuto: its method table and library, the say pipeline and its
+// stops on the simulated robot with a scripted speech engine, the index callbacks, the
+// diagnosis and the tag page.
+#include <gtest/gtest.h>
+
+#include <dlfcn.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <atomic>
+#include <chrono>
+#include <filesystem>
+#include <fstream>
+#include <future>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <stdexcept>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "ko/log.hpp"
+#include "ko/reaper.hpp"
+#include "ko/session.hpp"
+#include "ko_test_helpers.hpp"
+#include "mokuto/zumokuto.h"
+#include "robotsim/timeline.h"
+#include "robotsim/zuaudioplayer.h"
+#include "robotsim/zubehaviormanager.h"
+#include "robotsim/zumemory.h"
+#include "robotsim/zumotion.h"
+#include "robotsim/zurobotstate.h"
+#include "robotsim/zutexttospeech.h"
+#include "scripted_speech.h"
+#include "zefoko/host.h"
+#include "zu/zumoduleentry.h"
+#include "zu/zuproxy.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+using namespace std::chrono_literals;
+using mokutotest::kBound;
+using mokutotest::ScriptedSpeech;
+using Stage = ZU::ZUMokutoStage;
+
+constexpr const char* kMain = "mokuto.main";
+constexpr const char* kEnd = "ZUMokuto/EndOfMokuto";
+
+// ---- services of the tests -----------------------------------------------------------------
+
+// "block" holds its caller until the test opens the gate.
+class ZUSlow : public ZU::ZUModule {
+ public:
+  ZUSlow(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
+      : ZU::ZUModule(broker, name) {
+    beginMethod("block", "ZUSlow", "Returns once the gate opens.");
+    describeParameter("n", "Unused.");
+    bindMethod(&ZUSlow::block);
+  }
+  void block(int /*n*/) {
+    entered->increment();
+    gate->wait();
+  }
+  std::shared_ptr<ko::test::Gate> gate = std::make_shared<ko::test::Gate>();
+  std::shared_ptr<ko::test::Counter> entered = std::make_shared<ko::test::Counter>();
+};
+
+// A memory service that accepts everything but micro-event subscriptions.
+class RefusingMemory : public ZU::ZUModule {
+ public:
+  RefusingMemory(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
+      : ZU::ZUModule(broker, name) {
+    beginMethod("declareEvent", "RefusingMemory", "Accepted.");
+    describeParameter("eventName", "");
+    describeParameter("extractorName", "");
+    bindMethod(&RefusingMemory::declareEvent);
+    beginMethod("raiseEvent", "RefusingMemory", "Accepted.");
+    describeParameter("key", "");
+    describeParameter("value", "");
+    bindMethod(&RefusingMemory::raiseEvent);
+    beginMethod("subscribeToEvent", "RefusingMemory", "Accepted.");
+    describeParameter("name", "");
+    describeParameter("callbackModule", "");
+    describeParameter("callbackMethod", "");
+    bindMethod(&RefusingMemory::subscribeToEvent);
+    beginMethod("subscribeToMicroEvent", "RefusingMemory", "Refused.");
+    describeParameter("name", "");
+    describeParameter("callbackModule", "");
+    describeParameter("callbackMessage", "");
+    describeParameter("callbackMethod", "");
+    bindMethod(&RefusingMemory::subscribeToMicroEvent);
+    beginMethod("unsubscribeToEvent", "RefusingMemory", "Accepted.");
+    describeParameter("name", "");
+    describeParameter("callbackModule", "");
+    bindMethod(&RefusingMemory::unsubscribeToEvent);
+  }
+  void declareEvent(const std::string&, const std::string&) {}
+  void raiseEvent(const std::string&, const ZU::ZUValue&) {}
+  void subscribeToEvent(const std::string&, const std::string&, const std::string&) {}
+  void subscribeToMicroEvent(const std::string&, const std::string&, const std::string&,
+                             const std::string&) {
+    ZU_THROW_ERROR(getName(), "subscribeToMicroEvent", "micro-events are not served here");
+  }
+  void unsubscribeToEvent(const std::string&, const std::string&) {}
+};
+
+// A behaviour manager with a library that the test sets, counting the list requests (one
+// per refresh of a package).
+class StubBehaviorManager : public ZU::ZUModule {
+ public:
+  StubBehaviorManager(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
+      : ZU::ZUModule(broker, name) {
+    beginMethod("getInstalledBehaviors", "StubBehaviorManager", "The library.");
+    describeReturn("behaviors", "");
+    bindMethod(&StubBehaviorManager::getInstalledBehaviors);
+    beginMethod("getBehaviorTags", "StubBehaviorManager", "The tags of one behaviour.");
+    describeParameter("behavior", "");
+    describeReturn("tags", "");
+    bindMethod(&StubBehaviorManager::getBehaviorTags);
+  }
+  std::vector<std::string> getInstalledBehaviors() {
+    lists.fetch_add(1);
+    std::lock_guard lock(fMutex);
+    std::vector<std::string> paths;
+    for (const auto& entry : fLibrary)
+      paths.push_back(entry.first);
+    return paths;
+  }
+  std::vector<std::string> getBehaviorTags(const std::string& behavior) {
+    std::lock_guard lock(fMutex);
+    const auto it = fLibrary.find(behavior);
+    return it == fLibrary.end() ? std::vector<std::string>{} : it->second;
+  }
+  void setLibrary(std::map<std::string, std::vector<std::string>> library) {
+    std::lock_guard lock(fMutex);
+    fLibrary = std::move(library);
+  }
+  std::atomic<int> lists{0};
+
+ private:
+  std::mutex fMutex;
+  std::map<std::string, std::vector<std::string>> fLibrary;
+};
+
+// The stages entered, in order, as the module reports them.
+struct StageLog {
+  std::mutex mutex;
+  std::condition_variable changed;
+  std::vector<std::pair<Stage, ZU::MKID>> entries;
+  std::atomic<int> failAt{-1};  // a stage that throws
+
+  void enter(Stage stage, ZU::MKID id) {
+    {
+      std::lock_guard lock(mutex);
+      entries.emplace_back(stage, id);
+    }
+    changed.notify_all();
+    if (failAt.load() == static_cast<int>(stage))
+      throw std::runtime_error("the stage broke");
+  }
+  bool waitFor(Stage stage, ZU::MKID id) {
+    std::unique_lock lock(mutex);
+    return changed.wait_for(lock, kBound, [&] {
+      return std::find(entries.begin(), entries.end(), std::pair{stage, id}) != entries.end();
+    });
+  }
+  std::vector<std::pair<Stage, ZU::MKID>> all() {
+    std::lock_guard lock(mutex);
+    return entries;
+  }
+};
+
+fs::path makeLibrary() {
+  static std::atomic<int> serial{0};
+  const fs::path root =
+      fs::temp_directory_path() /
+      ("mokuto-service-" + std::to_string(::getpid()) + "-" + std::to_string(serial.fetch_add(1)));
+  const fs::path folder = root / "animations/Stand/Gestures/Hey_1";
+  fs::create_directories(folder);
+  std::ofstream(folder / "behavior.json")
+      << "{\"tags\": [\"hello\"], \"duration\": 0.3, \"joints\": {\"LWristYaw\": {\"times\": "
+         "[0.3], \"keys\": [[0.2, [3, -0.1, 0.0], [3, 0.0, 0.0]]]}}}";
+  return root;
+}
+
+// ---- the service on the simulated robot, with a scripted speech engine ---------------------
+
+class ServicePipeline : public testing::Test {
+ protected:
+  ServicePipeline() : fLibrary(makeLibrary()) {
+    using ZU::ZUModule;
+    broker_ = ZU::ZUBroker::create(std::make_shared<ko::Session>());
+    robotsim::ZUMemoryOptions memoryOptions;
+    memoryOptions.timeline = timeline_;
+    fServices.push_back(
+        ZUModule::createModule<robotsim::ZUMemory>(broker_, "ZUMemory", memoryOptions));
+    fServices.push_back(ZUModule::createModule<robotsim::ZUMotion>(broker_, "ZUMotion", timeline_));
+    fServices.push_back(ZUModule::createModule<robotsim::ZUBehaviorManager>(
+        broker_, "ZUBehaviorManager", timeline_, fLibrary.string()));
+    fServices.push_back(
+        ZUModule::createModule<robotsim::ZUAudioPlayer>(broker_, "ZUAudioPlayer", timeline_));
+    fServices.push_back(
+        ZUModule::createModule<robotsim::ZURobotPosture>(broker_, "ZURobotPosture", timeline_));
+    fServices.push_back(ZUModule::createModule<robotsim::ZURobotModel>(broker_, "ZURobotModel"));
+    fServices.push_back(ZUModule::createModule<robotsim::ZUAutonomousMoves>(
+        broker_, "ZUAutonomousMoves", timeline_));
+    slow_ = ZUModule::createModule<ZUSlow>(broker_, "ZUSlow");
+    fServices.push_back(slow_);
+    speech_ = ZUModule::createModule<ScriptedSpeech>(broker_, "ZUTextToSpeech");
+    fServices.push_back(speech_);
+
+    ZU::ZUMokutoOptions options;
+    options.bodyTalk.timeScale = 0.01;
+    options.stopAllWait = 100ms;  // the robot waits 3 s
+    options.onStage = [stages = stages_](Stage stage, ZU::MKID id) { stages->enter(stage, id); };
+    mokuto_ = ZUModule::createModule<ZU::ZUMokuto>(broker_, "ZUMokuto", options);
+    mokuto_->setBodyLanguageModeFromStr("disabled");
+    EXPECT_TRUE(mokuto_->waitForIndex(kBound));
+  }
+
+  ~ServicePipeline() override {
+    mokuto_->exit();
+    mokuto_.reset();
+    while (!fServices.empty()) {
+      fServices.back()->exit();
+      fServices.pop_back();
+    }
+    slow_.reset();
+    speech_.reset();
+    broker_.reset();
+    ko::waitForReaper();
+    std::error_code ec;
+    fs::remove_all(fLibrary, ec);
+  }
+
+  std::future<void> sayAsync(const std::string& text) {
+    return std::async(std::launch::async, [module = mokuto_, text] { module->say(text); });
+  }
+  ScriptedSpeech::Say spoken(std::size_t index) {
+    const auto say = speech_->waitForSay(index);
+    EXPECT_TRUE(say.has_value()) << "say " << index << " never came";
+    return say.value_or(ScriptedSpeech::Say{});
+  }
+  // The values of the end events raised so far, in order.
+  std::vector<int> endEvents() const {
+    std::vector<int> values;
+    for (const auto& entry : timeline_->entries("ZUMemory", "raiseEvent")) {
+      const auto arguments = entry.arguments.to<std::vector<ko::AnyValue>>();
+      if (arguments.at(0).to<std::string>() == kEnd)
+        values.push_back(arguments.at(1).to<int>());
+    }
+    return values;
+  }
+  static bool ready(std::future<void>& done) {
+    return done.wait_for(kBound) == std::future_status::ready;
+  }
+
+  ko::log::ScopedCapture log_{ko::log::Info};
+  std::shared_ptr<robotsim::Timeline> timeline_ = std::make_shared<robotsim::Timeline>();
+  std::shared_ptr<StageLog> stages_ = std::make_shared<StageLog>();
+  std::shared_ptr<ZU::ZUBroker> broker_;
+  std::shared_ptr<ZUSlow> slow_;
+  std::shared_ptr<ScriptedSpeech> speech_;
+  std::shared_ptr<ZU::ZUMokuto> mokuto_;
+
+ private:
+  fs::path fLibrary;
+  std::vector<std::shared_ptr<ZU::ZUModuleCore>> fServices;
+};
+
+TEST_F(ServicePipeline, TwoTextsOverlapInThePipelineButAreNeverSpokenAtOnce) {
+  auto first = sayAsync("Hello there");
+  const auto firstSay = spoken(0);
+  auto second = sayAsync("And again");
+  // The second text is compiled and loaded while the first one is spoken...
+  ASSERT_TRUE(stages_->waitFor(Stage::Loader, 2));
+  EXPECT_EQ(speech_->sayCount(), 1u);
+  EXPECT_EQ(second.wait_for(0ms), std::future_status::timeout);
+  // ... and spoken once the first has ended.
+  speech_->finish(firstSay.id);
+  ASSERT_TRUE(ready(first));
+  const auto secondSay = spoken(1);
+  EXPECT_TRUE(speech_->hasEnded(firstSay.id));
+  speech_->finish(secondSay.id);
+  ASSERT_TRUE(ready(second));
+  first.get();
+  second.get();
+
+  using E = std::pair<Stage, ZU::MKID>;
+  EXPECT_EQ(stages_->all(), (std::vector<E>{{Stage::Compiler, 1},
+                                            {Stage::Loader, 1},
+                                            {Stage::Director, 1},
+                                            {Stage::Compiler, 2},
+                                            {Stage::Loader, 2},
+                                            {Stage::Director, 2}}));
+  EXPECT_EQ(endEvents(), (std::vector<int>{1, 2}));
+  EXPECT_FALSE(mokuto_->_isRunning());
+}
+
+TEST_F(ServicePipeline, APostedSayIsKnownByItsTaskIdAndStoppedByIt) {
+  // A first posted call, so that the say's task id differs from the first local id.
+  mokuto_->pCall(ko::AnyValue::list({ko::AnyValue(std::string("_isRunning"))}));
+  const int task = mokuto_->pCall(
+      ko::AnyValue::list({ko::AnyValue(std::string("say")), ko::AnyValue(std::string("Hi"))}));
+  EXPECT_NE(task, 1);
+  const auto say = spoken(0);
+  ASSERT_TRUE(stages_->waitFor(Stage::Director, task));
+  mokuto_->stop(task + 100);  // not running: ignored
+  mokuto_->stop(task);
+  EXPECT_TRUE(speech_->waitForCall("stop(" + std::to_string(say.id) + ")"));
+  EXPECT_FALSE(mokuto_->wait(task, 10000));  // the call has ended
+  EXPECT_EQ(endEvents(), std::vector<int>{task});
+  EXPECT_FALSE(mokuto_->_isRunning());
+}
+
+TEST_F(ServicePipeline, StopAllWithoutWaitingStopsATextWaitingForTheDirector) {
+  auto first = sayAsync("Hello there");
+  spoken(0);
+  auto second = sayAsync("Never spoken");
+  ASSERT_TRUE(stages_->waitFor(Stage::Loader, 2));
+  mokuto_->_stopAll(false);
+  ASSERT_TRUE(ready(first));
+  ASSERT_TRUE(ready(second));
+  EXPECT_EQ(speech_->sayCount(), 1u);
+  const auto entries = stages_->all();
+  EXPECT_EQ(std::count(entries.begin(), entries.end(), std::pair{Stage::Director, 2}), 0);
+  auto ends = endEvents();
+  std::sort(ends.begin(), ends.end());
+  EXPECT_EQ(ends, (std::vector<int>{1, 2}));
+}
+
+TEST_F(ServicePipeline, StopAllWaitingWithNothingRunningReturnsSilently) {
+  log_->clear();
+  mokuto_->_stopAll(true);
+  for (const auto& record : log_->records())
+    EXPECT_NE(record.category, kMain) << record.message;
+}
+
+TEST_F(ServicePipeline, StopAllWaitingGivesUpWhenTheDirectorDoesNotReturn) {
+  auto text = sayAsync("^call(ZUSlow.block(1)) hi");
+  spoken(0);
+  auto pause = speech_->mrkpause(1);
+  ASSERT_TRUE(slow_->entered->waitFor(1));
+  mokuto_->_stopAll(true);
+  EXPECT_TRUE(log_->contains(kMain, ko::log::Error,
+                             "ZUMokuto.stopAll() makes more than 3 seconds, we skip this method"));
+  EXPECT_TRUE(mokuto_->_isRunning());
+  slow_->gate->open();
+  ASSERT_TRUE(ready(text));
+  EXPECT_EQ(endEvents(), std::vector<int>{1});
+}
+
+TEST_F(ServicePipeline, AStageThatThrowsFailsTheSayWithoutEndEvent) {
+  stages_->failAt = static_cast<int>(Stage::Loader);
+  EXPECT_THROW(mokuto_->say("Hello"), std::runtime_error);
+  EXPECT_TRUE(
+      log_->contains(kMain, ko::log::Error, "say() method detects an exception: the stage broke"));
+  EXPECT_FALSE(mokuto_->_isRunning());
+  EXPECT_TRUE(endEvents().empty());
+  EXPECT_EQ(speech_->sayCount(), 0u);
+  // The stage locks were released: the next text goes through.
+  stages_->failAt = -1;
+  auto next = sayAsync("Hello");
+  speech_->finish(spoken(0).id);
+  ASSERT_TRUE(ready(next));
+  EXPECT_EQ(endEvents(), std::vector<int>{2});
+}
+
+TEST_F(ServicePipeline, ExitWhileATextIsSpokenEndsTheTextFirst) {
+  auto text = sayAsync("Hello there");
+  spoken(0);
+  const auto lines = mokuto_->diagnosisLines();
+  ASSERT_GE(lines.size(), 11u);
+  EXPECT_EQ(lines[7], "number of texts in the stack: 1");
+  EXPECT_EQ(lines[9], "print the text:");
+  EXPECT_EQ(lines[10].rfind("Text number 1: ", 0), 0u);
+  mokuto_->exit();
+  ASSERT_TRUE(ready(text));
+  EXPECT_EQ(endEvents(), std::vector<int>{1});
+  EXPECT_FALSE(mokuto_->_isRunning());
+  const auto names = broker_->session()->services();
+  EXPECT_EQ(std::count(names.begin(), names.end(), "ZUMokuto"), 0);
+}
+
+TEST_F(ServicePipeline, DiagnosisWithNoTextRunning) {
+  const std::vector<std::string> expected = {
+      "Diagnosis of Mokuto:",
+      "----------------------------",
+      "get body language mode: disabled",
+      "get time pause before the sentence: 500ms",
+      "is Mokuto running: false",
+      "is bodytalk running: false",
+      "is TextToSpeech running: false",
+      "number of texts in the stack: 0",
+      "number of texts asked to stop: 0",
+  };
+  EXPECT_EQ(mokuto_->diagnosisLines(), expected);
+  log_->clear();
+  mokuto_->_diagnosis();
+  std::vector<std::string> logged;
+  for (const auto& record : log_->records()) {
+    if (record.category == kMain) {
+      EXPECT_EQ(record.function, "ZU::ZUMokuto::diagnosis");
+      logged.push_back(record.message);
+    }
+  }
+  EXPECT_EQ(logged, expected);
+}
+
+// ---- the method table and the configuration methods ---------------------------------------
+
+struct MethodRow {
+  const char* name;
+  std::vector<std::string> parameters;
+  const char* result;  // "" for none
+};
+
+TEST_F(ServicePipeline, PublishesItsMethodsInOrderAfterTheBuiltIns) {
+  const std::vector<MethodRow> table = {
+      {"say", {"text"}, ""},
+      {"say", {"text", "configuration"}, ""},
+      {"_reset", {}, ""},
+      {"_stopAll", {"blocking"}, ""},
+      {"_isRunning", {}, "running"},
+      {"setBodyTalkEnabled", {"enable"}, ""},
+      {"setBodyLanguageEnabled", {"enable"}, ""},
+      {"setBodyLanguageModeFromStr", {"stringBodyLanguageMode"}, ""},
+      {"setBodyLanguageMode", {"bodyLanguageMode"}, ""},
+      {"getBodyLanguageModeToStr", {}, "stringBodyLanguageMode"},
+      {"getBodyLanguageMode", {}, "bodyLanguageMode"},
+      {"declareAnimationsPackage", {"animationsPackage"}, ""},
+      {"_setMSPauseBeforeSpeech", {"pause"}, ""},
+      {"_getMSPauseBeforeSpeech", {}, "pause"},
+      {"_isCheckExecutionTimesEnabled", {}, "enable"},
+      {"_setCheckExecutionTimes", {"pause"}, ""},
+      {"addTagsToWords", {"tagsToWords"}, ""},
+      {"declareTagForAnimations", {"tagsToAnimations"}, ""},
+      {"_diagnosis", {}, ""},
+      {"isBodyTalkEnabled", {}, "enable"},
+      {"isBodyLanguageEnabled", {}, "enable"},
+      {"_getTagList", {}, "tags"},
+      {"_getAnimationsByTag", {"tag"}, "animations"},
+      {"_speechBookMarkCallback", {"memoryKey", "value", "message"}, ""},
+      {"_mrkpauseCallback", {"pBookmark"}, ""},
+      {"_speechStatusCallback", {"memoryKey", "value", "message"}, ""},
+      {"_postureFamilyChangedCallback", {"memoryKey", "value", "message"}, ""},
+      {"_updateRepresentations", {"memoryKey", "value", "message"}, ""},
+      {"_dialogMatchedInputCallback", {"memoryKey", "value", "message"}, ""},
+  };
+  const auto infos = mokuto_->getMethodInfos();
+  ASSERT_GT(infos.size(), table.size());
+  const std::size_t builtIns = infos.size() - table.size();
+  for (std::size_t i = 0; i < table.size(); ++i) {
+    const auto& info = infos[builtIns + i];
+    SCOPED_TRACE(info.name);
+    EXPECT_EQ(info.name, table[i].name);
+    EXPECT_EQ(info.moduleClass, "ZUMokuto");
+    std::vector<std::string> parameters;
+    for (const auto& parameter : info.parameters)
+      parameters.push_back(parameter.name);
+    EXPECT_EQ(parameters, table[i].parameters);
+    EXPECT_EQ(info.returnValue ? info.returnValue->name : "", table[i].result);
+  }
+  EXPECT_EQ(mokuto_->getModuleDescription(),
+            "The Mokuto module makes ZEFO interpret a text annotated with behaviors.");
+  EXPECT_EQ(infos[builtIns + 24].description,
+            "Method called by the tts when \"mrkpause\" bookmark is reached.This method is "
+            "blocking until the action is finish.");
+  EXPECT_EQ(infos[builtIns + 7].description,
+            "Set the current body language mode.\n3 modes exist: \"disabled\", \"random\" and "
+            "\"contextual\"\n(see BodyLanguageMode enum for more details)");
+}
+
+TEST_F(ServicePipeline, ConfigurationMethodsRefuseBadValuesAndKeepTheConfiguration) {
+  struct Bad {
+    const char* name;
+    std::function<void()> call;
+    const char* text;
+  };
+  const std::vector<Bad> cases = {
+      {"mode 3", [&] { mokuto_->setBodyLanguageMode(3); },
+       "\tZUMokuto::setBodyLanguageMode\n\tInvalid body language mode: 3\nThe body language "
+       "modes values have to be between 0 and 2.\n0: BODY_LANGUAGE_MODE_DISABLED\n1: "
+       "BODY_LANGUAGE_MODE_RANDOM\n2: BODY_LANGUAGE_MODE_CONTEXTUAL"},
+      {"mode Random", [&] { mokuto_->setBodyLanguageModeFromStr("Random"); },
+       "\tZUMokuto::setBodyLanguageModeFromStr\n\tInvalid body language mode: \"Random\"\nAll "
+       "the possible body language modes are: \"disabled\", \"random\" and \"contextual\"."},
+      {"negative pause", [&] { mokuto_->_setMSPauseBeforeSpeech(-1); },
+       "\tZUMokuto::setMSPauseBeforeSpeech\n\tpause time can't be negative."},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.name);
+    try {
+      c.call();
+      ADD_FAILURE() << "no error";
+    } catch (const ZU::ZUError& e) {
+      EXPECT_EQ(std::string(e.what()), c.text);
+    }
+  }
+  EXPECT_EQ(mokuto_->getBodyLanguageModeToStr(), "disabled");
+  EXPECT_EQ(mokuto_->_getMSPauseBeforeSpeech(), 500);
+
+  mokuto_->setBodyLanguageModeFromStr("contextual_0");
+  EXPECT_EQ(mokuto_->getBodyLanguageMode(), 2u);
+  EXPECT_EQ(mokuto_->_getMSPauseBeforeSpeech(), 0);
+  EXPECT_TRUE(log_->contains(kMain, ko::log::Error,
+                             "contextual_0 is deprecated and will soon be removed, so call: "
+                             "\nsetBodyLanguageModeFromStr(\"contextual\") "
+                             "and_setMSPauseBeforeSpeech(0) instead."));
+  mokuto_->setBodyTalkEnabled(true);
+  EXPECT_EQ(mokuto_->getBodyLanguageModeToStr(), "random");
+  EXPECT_TRUE(mokuto_->isBodyLanguageEnabled());
+  mokuto_->_setCheckExecutionTimes(true);
+  EXPECT_TRUE(mokuto_->_isCheckExecutionTimesEnabled());
+  mokuto_->_reset();
+  EXPECT_EQ(mokuto_->getBodyLanguageModeToStr(), "contextual");
+}
+
+// ---- the index callbacks, the tag page and the start, on stand-in services ----------------
+
+class ServiceIndex : public testing::Test {
+ protected:
+  ServiceIndex() {
+    using ZU::ZUModule;
+    broker_ = ZU::ZUBroker::create(std::make_shared<ko::Session>());
+    fServices.push_back(ZUModule::createModule<RefusingMemory>(broker_, "ZUMemory"));
+    behaviors_ = ZUModule::createModule<StubBehaviorManager>(broker_, "ZUBehaviorManager");
+    fServices.push_back(behaviors_);
+    fServices.push_back(ZUModule::createModule<ScriptedSpeech>(broker_, "ZUTextToSpeech"));
+    mokuto_ = ZUModule::createModule<ZU::ZUMokuto>(broker_, "ZUMokuto");
+    EXPECT_TRUE(mokuto_->waitForIndex(kBound));
+  }
+  ~ServiceIndex() override {
+    mokuto_->exit();
+    mokuto_.reset();
+    while (!fServices.empty()) {
+      fServices.back()->exit();
+      fServices.pop_back();
+    }
+    behaviors_.reset();
+    broker_.reset();
+    ko::waitForReaper();
+  }
+  void changed(const std::vector<std::string>& names) {
+    ZU::ZUValue value = ZU::ZUValue::makeArray({});
+    for (const auto& name : names)
+      value.arrayPush(name);
+    mokuto_->_updateRepresentations("ZUBehaviorManager/BehaviorsAdded", value, "");
+  }
+
+  ko::log::ScopedCapture log_{ko::log::Info};
+  std::shared_ptr<ZU::ZUBroker> broker_;
+  std::shared_ptr<StubBehaviorManager> behaviors_;
+  std::shared_ptr<ZU::ZUMokuto> mokuto_;
+
+ private:
+  std::vector<std::shared_ptr<ZU::ZUModuleCore>> fServices;
+};
+
+TEST_F(ServiceIndex, StartsWhenTheMicroEventSubscriptionIsRefused) {
+  EXPECT_TRUE(log_->containsPart(kMain, ko::log::Error,
+                                 "Cannot subscribe to microEvent "
+                                 "WordRecognized: "));
+  EXPECT_TRUE(log_->containsPart(kMain, ko::log::Error, "micro-events are not served here"));
+  const auto names = mokuto_->getMethodList();
+  EXPECT_EQ(names.back(), "_dialogMatchedInputCallback");
+  EXPECT_EQ(ZU::ZUProxy("ZUMokuto", broker_).call<std::string>("getBodyLanguageModeToStr"),
+            "contextual");
+}
+
+TEST_F(ServiceIndex, PackagesAreRefreshedOnceForTheBehavioursThatChanged) {
+  EXPECT_EQ(behaviors_->lists.load(), 1);           // the index of "animations/" at start
+  mokuto_->declareAnimationsPackage("animations");  // "animations/" is there already
+  EXPECT_EQ(behaviors_->lists.load(), 1);
+  changed({"animations/Stand/A", "", "animations/Sit/B", "elsewhere/Stand/C"});
+  EXPECT_EQ(behaviors_->lists.load(), 2);
+  mokuto_->declareAnimationsPackage("extra");
+  EXPECT_EQ(behaviors_->lists.load(), 3);
+  changed({"extra/Stand/A", "animations/Stand/B", "extra/Stand/C"});
+  EXPECT_EQ(behaviors_->lists.load(), 5);
+}
+
+TEST_F(ServiceIndex, TagPageListsTheVisibleTags) {
+  const std::string head =
+      "<html><body><script>"
+      "function runBehavior (behavior) {\n"
+      "var xhr_object = null;\n"
+      "if (window.XMLHttpRequest) {\n"
+      "xhr_object = new XMLHttpRequest();\n"
+      "}\n"
+      "else if (window.ActiveXObject) {\n"
+      "xhr_object = new ActiveXObject(\"Microsoft.XMLHTTP\");\n"
+      "}\n"
+      "else {\n"
+      "return;\n"
+      "}\n"
+      "var evalUrl = document.URL.substring(0, document.URL.lastIndexOf(\"/\") + 1) + "
+      "\"?eval=\";\n"
+      "xhr_object.onreadystatechange = function () {\n"
+      "if (xhr_object.readyState == 4 && xhr_object.status == 200) {\n"
+      "xhr_object.onreadystatechange = null;\n"
+      "}\n"
+      "}\n"
+      "xhr_object.open(\"GET\", evalUrl + \"ZUBehaviorManager.runBehavior('\" + behavior + "
+      "\"')\");\n"
+      "xhr_object.send(null);\n"
+      "}\n"
+      "</script>";
+  const std::string tail = "</body></html>";
+  EXPECT_TRUE(mokuto_->_getTagList().empty());
+  EXPECT_EQ(mokuto_->httpGet(), head + tail);
+
+  behaviors_->setLibrary({{"animations/Stand/A", {"hello", ".hidden"}},
+                          {"animations/Stand/B", {"hello", "animationMode"}},
+                          {"animations/Sit/C", {"sit"}}});
+  changed({"animations/Stand/A"});
+  EXPECT_EQ(mokuto_->_getTagList(),
+            (std::vector<std::string>{".hidden", "animationMode", "hello", "sit"}));
+  EXPECT_EQ(mokuto_->_getAnimationsByTag("hello"),
+            (std::vector<std::string>{"animations/Stand/A", "animations/Stand/B"}));
+  EXPECT_TRUE(mokuto_->_getAnimationsByTag("nothing").empty());
+  const std::string link = "<a href=\"javascript:runBehavior('";
+  const std::string rows =
+      "<tr><td>hello</td><td>" + link + "animations/Stand/A');\">animations/Stand/A</a><br/>" +
+      link + "animations/Stand/B');\">animations/Stand/B</a>" + "<tr><td>sit</td><td>" + link +
+      "animations/Sit/C');\">animations/Sit/C</a>";
+  const std::string table =
+      "<b><u><i>Available tags</i></u></b><br><table cellspacing=\"5\" cellpadding=\"5\" "
+      "border=\"1\"><tr><td><b>Tag name</b></td><td><b>Corresponding behaviors</b><br/><i>(click "
+      "to run the behavior)</i></td></tr>";
+  EXPECT_EQ(mokuto_->tagPage(), head + table + rows + "</table>" + tail);
+}
+
+// ---- the module library -------------------------------------------------------------------
+
+TEST(ServiceLibrary, TheHostLoadsItAndItsEntryPointsAnswerZero) {
+  zefoko::HostOptions options;
+  options.robot.speech.backend = robotsim::ZUTextToSpeechOptions::Backend::Timing;
+  options.robot.speech.playbackRate = robotsim::kSpeechAsFastAsPossible;
+  zefoko::Host host(options);
+  ASSERT_EQ(host.loadModuleLibrary(ZUMOKUTO_PLUGIN), std::vector<std::string>{"ZUMokuto"});
+  const ZU::ZUProxy mokuto("ZUMokuto", host.broker());
+  mokuto.call("setBodyLanguageModeFromStr", std::string("disabled"));
+  mokuto.call("say", std::string("Hello from the library."));
+  bool ended = false;
+  for (const auto& entry : host.robot().timeline()->entries("ZUMemory", "raiseEvent")) {
+    ended =
+        ended || entry.arguments.to<std::vector<ko::AnyValue>>().at(0).to<std::string>() == kEnd;
+  }
+  EXPECT_TRUE(ended);
+
+  void* library = ::dlopen(ZUMOKUTO_PLUGIN, RTLD_NOW | RTLD_NOLOAD);
+  ASSERT_NE(library, nullptr);
+  const auto close =
+      reinterpret_cast<ZU::ZUCloseModuleFunction>(::dlsym(library, ZU::kCloseModuleSymbol));
+  ASSERT_NE(close, nullptr);
+  EXPECT_NE(::dlsym(library, ZU::kCreateModuleSymbol), nullptr);
+  EXPECT_EQ(close(host.broker()), 0);
+  EXPECT_EQ(mokuto.call<bool>("_isRunning"), false);  // still serving
+  ::dlclose(library);
+  host.shutdown();
+  EXPECT_TRUE(host.moduleNames().empty());
+}
+
+}  // namespace
