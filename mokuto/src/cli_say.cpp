@@ -194,17 +194,21 @@ int say(SayOptions& o) {
     } else {
       const auto recorder = SayTimeline::create(robot.timeline(), o.quiet ? nullptr : &std::cout);
       service.setDirectorObserver(recorder);
+      embedded.setStageObserver([recorder](ZU::ZUMokutoStage stage, ZU::MKID id) {
+        if (stage == ZU::ZUMokutoStage::Compiler)
+          recorder->accepted(id);
+      });
       robot.timeline()->clear();
-      // The embedded service is fresh and this is its first text: identifier 1.
-      constexpr ZU::MKID kId = 1;
-      recorder->begin(kId, *o.text);
+      recorder->begin(*o.text);
       if (configuration)
         service.say(*o.text, *configuration);
       else
         service.say(*o.text);
-      const SaySummary summary = recorder->end();
+      ZU::MKID id = 0;
+      const SaySummary summary = recorder->end(&id);
+      embedded.setStageObserver(nullptr);
       service.setDirectorObserver(nullptr);
-      SayTimeline::printSummary(std::cout, kId, summary);
+      SayTimeline::printSummary(std::cout, id, summary);
       if (!o.wav.empty()) {
         robot.speech()->saveRecording(o.wav);
         std::cout << "Audio written to " << o.wav << std::endl;

@@ -77,17 +77,24 @@ std::shared_ptr<SayTimeline> SayTimeline::create(std::shared_ptr<robotsim::Timel
 SayTimeline::SayTimeline(std::shared_ptr<robotsim::Timeline> timeline, std::ostream* live)
     : fTimeline(std::move(timeline)), fLive(live) {}
 
-void SayTimeline::begin(ZU::MKID id, const std::string& text) {
+void SayTimeline::begin(const std::string& text) {
+  std::lock_guard lock(fMutex);
+  fText = text;
+  const std::int64_t before = fTimeline->now();
+  const std::int64_t ustime = ko::os::ustime();
+  const std::int64_t after = fTimeline->now();
+  fClockOffsetUs = ustime - (before + after) / 2;
+  fBeginUs = after;
+}
+
+void SayTimeline::accepted(ZU::MKID id) {
+  std::string text;
   {
     std::lock_guard lock(fMutex);
     fId = id;
-    const std::int64_t before = fTimeline->now();
-    const std::int64_t ustime = ko::os::ustime();
-    const std::int64_t after = fTimeline->now();
-    fClockOffsetUs = ustime - (before + after) / 2;
-    fBeginUs = after;
+    text = fText;
   }
-  fTimeline->record(kService, "say", ko::AnyValue::List{id, text});
+  fTimeline->record(kService, "say", ko::AnyValue::List{id, std::move(text)});
 }
 
 void SayTimeline::onAction(const ZU::DirectorActionReport& report) {
@@ -125,9 +132,9 @@ void SayTimeline::onAction(const ZU::DirectorActionReport& report) {
                     ko::AnyValue::map({{"index", static_cast<std::int64_t>(index)}}));
 }
 
-SaySummary SayTimeline::end() {
+SaySummary SayTimeline::end(ZU::MKID* id) {
   SaySummary summary;
-  ZU::MKID id = 0;
+  ZU::MKID textId = 0;
   {
     std::lock_guard lock(fMutex);
     for (auto& action : fActions)
@@ -135,12 +142,14 @@ SaySummary SayTimeline::end() {
     summary = xSummary();
     summary.durationUs = fTimeline->now() - fBeginUs;
     fSummary = summary;
-    id = fId;
+    textId = fId;
   }
+  if (id)
+    *id = textId;
   const auto optional = [&summary](std::int64_t us) {
     return summary.syncCount > 0 ? ko::AnyValue(us) : ko::AnyValue::none();
   };
-  fTimeline->record(kService, "end", ko::AnyValue::List{id},
+  fTimeline->record(kService, "end", ko::AnyValue::List{textId},
                     ko::AnyValue::map({{"executed", summary.executed},
                                        {"skipped", summary.skipped},
                                        {"stopped", summary.stopped},
@@ -243,9 +252,13 @@ void SayTimeline::xOnEntry(const robotsim::TimelineEntry& entry) {
       if (!index.is_number_integer() || index.get<std::size_t>() >= fActions.size())
         return;
       const Action& action = fActions[index.get<std::size_t>()];
-      std::string line = action.text + "  " + action.outcome;
+      // An erroneous action's text starts with its code, shown after the outcome instead.
+      std::string line =
+          action.error ? action.text.substr(std::min(action.text.size(), action.error->size() + 1))
+                       : action.text;
+      line += "  " + action.outcome;
       if (action.error)
-        line += " " + *action.error;
+        line += ": " + *action.error;
       if (action.outcome == "executed") {
         if (action.bookmarkUs && action.startUs)
           line += ", started " + milliseconds(*action.startUs - *action.bookmarkUs) +

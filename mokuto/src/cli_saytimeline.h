@@ -47,11 +47,14 @@ class SayTimeline : public ZU::DirectorObserver, public std::enable_shared_from_
   static std::shared_ptr<SayTimeline> create(std::shared_ptr<robotsim::Timeline> timeline,
                                              std::ostream* live);
 
-  // The text `id` is handed to the service now: the "say" entry; times are shown from it.
-  void begin(ZU::MKID id, const std::string& text);
+  // The text is handed to the service now: times are shown from here.
+  void begin(const std::string& text);
+  // The service has taken the text up as `id`: the "say" entry.
+  void accepted(ZU::MKID id);
   void onAction(const ZU::DirectorActionReport& report) override;
   // The service's say has returned: the "end" entry, with the summary as its result.
-  SaySummary end();
+  // `id` (when given) receives the text's identifier.
+  SaySummary end(ZU::MKID* id = nullptr);
 
   static void printSummary(std::ostream& os, ZU::MKID id, const SaySummary& summary);
   // The robot's entries and the service's, in their order, one JSON object per line.
@@ -81,6 +84,7 @@ class SayTimeline : public ZU::DirectorObserver, public std::enable_shared_from_
   std::ostream* const fLive;
 
   mutable std::mutex fMutex;
+  std::string fText;
   ZU::MKID fId = 0;
   std::int64_t fBeginUs = 0;
   // ko::os::ustime() minus the timeline's time.

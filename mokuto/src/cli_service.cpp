@@ -5,8 +5,8 @@
 
 #include "ko/log.hpp"
 #include "ko/os.hpp"
+#include "zu/zubroker.h"
 #include "zu/zuerror.h"
-#include "zu/zumoduleentry.h"
 
 namespace mokuto::cli {
 
@@ -30,10 +30,22 @@ EmbeddedService::EmbeddedService(const EmbeddedServiceOptions& options) {
   host.postureFamily = options.posture;
   try {
     fHost = std::make_unique<zefoko::Host>(std::move(host));
+    // As the module library's _createModule does, with the stage hook.
     const auto& broker = fHost->broker();
-    ZU::createLibraryModule<ZU::ZUMokuto>(broker, ZU::ZUMokuto::kModuleName);
-    fService =
-        std::dynamic_pointer_cast<ZU::ZUMokuto>(broker->getModuleByName(ZU::ZUMokuto::kModuleName));
+    ZU::ZUBrokerManager::setInstance(broker->getBrokerManager());
+    broker->getBrokerManager()->addBroker(broker);
+    ZU::ZUMokutoOptions moduleOptions;
+    moduleOptions.onStage = [hook = fStageHook](ZU::ZUMokutoStage stage, ZU::MKID id) {
+      StageObserver observer;
+      {
+        std::lock_guard lock(hook->mutex);
+        observer = hook->observer;
+      }
+      if (observer)
+        observer(stage, id);
+    };
+    fService = ZU::ZUModule::createModule<ZU::ZUMokuto>(broker, ZU::ZUMokuto::kModuleName,
+                                                        std::move(moduleOptions));
   } catch (const ZU::ZUError& e) {
     throw ServiceError(e.description());
   } catch (const std::exception& e) {
@@ -43,6 +55,11 @@ EmbeddedService::EmbeddedService(const EmbeddedServiceOptions& options) {
     throw ServiceError("the module ZUMokuto was not registered");
   if (!fService->waitForIndex(kIndexBound))
     throw ServiceError("the animation index was not built within 60 s");
+}
+
+void EmbeddedService::setStageObserver(StageObserver observer) {
+  std::lock_guard lock(fStageHook->mutex);
+  fStageHook->observer = std::move(observer);
 }
 
 EmbeddedService::~EmbeddedService() {

@@ -6,7 +6,9 @@
 //
 // Built, used and destroyed by the command's main thread; the robot's services and the
 // module serve their own threads.
+#include <functional>
 #include <memory>
+#include <mutex>
 #include <stdexcept>
 #include <string>
 
@@ -44,7 +46,19 @@ class EmbeddedService {
   robotsim::Robot& robot() { return fHost->robot(); }
   ZU::ZUMokuto& service() { return *fService; }
 
+  // Hears each text enter each stage of the pipeline, in the say caller's thread (null:
+  // nothing).
+  using StageObserver = std::function<void(ZU::ZUMokutoStage stage, ZU::MKID id)>;
+  void setStageObserver(StageObserver observer);
+
  private:
+  // Shared with the module's stage hook, which may outlive this object.
+  struct StageHook {
+    std::mutex mutex;
+    StageObserver observer;
+  };
+
+  const std::shared_ptr<StageHook> fStageHook = std::make_shared<StageHook>();
   std::unique_ptr<zefoko::Host> fHost;
   std::shared_ptr<ZU::ZUMokuto> fService;
 };
