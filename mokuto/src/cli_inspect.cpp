@@ -4,6 +4,7 @@
 #include <iostream>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "cli_commands.h"
 #include "cli_json.h"
@@ -18,6 +19,7 @@ namespace {
 
 struct InspectOptions {
   std::string posture;
+  std::vector<std::string> packages;
   std::string tag;
 };
 
@@ -51,6 +53,8 @@ int withService(const char* command, const InspectOptions& o, Body&& body) {
     options.speech = "timing";
     options.posture = o.posture;
     EmbeddedService embedded(options);
+    for (const auto& package : o.packages)
+      embedded.service().declareAnimationsPackage(package);
     body(embedded.service());
   } catch (const ServiceError& e) {
     std::cerr << "mokuto " << command << ": the service cannot start: " << e.what() << std::endl;
@@ -66,14 +70,17 @@ int withService(const char* command, const InspectOptions& o, Body&& body) {
 }
 
 CLI::App* addInspectCommand(CLI::App& app, int& status, const char* name, const char* help,
-                            bool withPosture, void (*run)(ZU::ZUMokuto&, const InspectOptions&)) {
+                            bool withLibraryOptions,
+                            void (*run)(ZU::ZUMokuto&, const InspectOptions&)) {
   auto o = std::make_shared<InspectOptions>();
   CLI::App* command = app.add_subcommand(name, help);
-  if (withPosture) {
+  if (withLibraryOptions) {
     command
         ->add_option("--posture", o->posture,
                      "The robot's posture family (default: the robot's own)")
         ->check(CLI::IsMember({"Standing", "Sitting", "SittingOnChair"}));
+    command->add_option("--package", o->packages,
+                        "An animations package to declare first (repeatable)");
   }
   if (std::string(name) == "animations")
     command->add_option("tag", o->tag, "The tag")->required();

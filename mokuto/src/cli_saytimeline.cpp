@@ -17,6 +17,7 @@ using Json = nlohmann::ordered_json;
 
 constexpr const char* kService = "ZUMokuto";
 constexpr const char* kEndEvent = "ZUMokuto/EndOfMokuto";
+constexpr const char* kBookmarkEvent = "ZUTextToSpeech/CurrentBookMark";
 
 constexpr std::array<std::string_view, ZU::kMKTaskActionTypeCount> kTypeNames = {
     "AUTO_START_TAG", "START_TAG",   "START",       "RUN_TAG",   "RUN",
@@ -216,10 +217,7 @@ void SayTimeline::xOnEntry(const robotsim::TimelineEntry& entry) {
       xPrint(entry.us, "speech started");
     } else if ((operation == "bookmark" || operation == "hold") &&
                argument(1).is_number_integer()) {
-      const auto number = argument(1).get<std::int32_t>();
-      fBookmarks.emplace_back(number, entry.us);
-      xPrint(entry.us, "bookmark " + std::to_string(number) +
-                           (operation == "hold" ? " (the speech waits for its action)" : ""));
+      xBookmarkReached(argument(1).get<std::int32_t>(), entry.us, operation == "hold");
     } else if (operation == "done" || operation == "stopped") {
       xPrint(entry.us, "speech " + operation);
     }
@@ -238,6 +236,10 @@ void SayTimeline::xOnEntry(const robotsim::TimelineEntry& entry) {
       xPrint(entry.us, "sound " + shown(argument(0)) + " stopped");
   } else if (service == "ZUMemory" && operation == "raiseEvent") {
     const std::string key = shown(argument(0));
+    // The engine raises the bookmark's event before it records the bookmark: whichever
+    // comes first is when the speech reached it.
+    if (key == kBookmarkEvent && fSpeechId && argument(1).is_number_integer())
+      xBookmarkReached(argument(1).get<std::int32_t>(), entry.us, false);
     if (key.rfind("ZUTextToSpeech/", 0) == 0)
       return;
     if (key == kEndEvent)
@@ -271,6 +273,16 @@ void SayTimeline::xOnEntry(const robotsim::TimelineEntry& entry) {
       xPrint(entry.us, line);
     }
   }
+}
+
+void SayTimeline::xBookmarkReached(std::int32_t number, std::int64_t us, bool blocking) {
+  for (const auto& known : fBookmarks) {
+    if (known.first == number)
+      return;
+  }
+  fBookmarks.emplace_back(number, us);
+  xPrint(us, "bookmark " + std::to_string(number) +
+                 (blocking ? " (the speech waits for its action)" : ""));
 }
 
 void SayTimeline::xPrint(std::int64_t us, const std::string& line) {

@@ -74,6 +74,7 @@ class SayTimeline : public ZU::DirectorObserver, public std::enable_shared_from_
   SayTimeline(std::shared_ptr<robotsim::Timeline> timeline, std::ostream* live);
   void xOnEntry(const robotsim::TimelineEntry& entry);
   // With fMutex held.
+  void xBookmarkReached(std::int32_t number, std::int64_t us, bool blocking);
   void xPrint(std::int64_t us, const std::string& line);
   void xResolveBookmark(Action& action) const;
   std::optional<std::int64_t> xToTimeline(std::int64_t ustime) const;
