@@ -79,8 +79,10 @@ CLI::App* addInspectCommand(CLI::App& app, int& status, const char* name, const 
         ->add_option("--posture", o->posture,
                      "The robot's posture family (default: the robot's own)")
         ->check(CLI::IsMember({"Standing", "Sitting", "SittingOnChair"}));
-    command->add_option("--package", o->packages,
-                        "An animations package to declare first (repeatable)");
+    command
+        ->add_option("--package", o->packages,
+                     "An animations package to declare first (repeatable)")
+        ->type_name("NAME");
   }
   if (std::string(name) == "animations")
     command->add_option("tag", o->tag, "The tag")->required();
@@ -106,8 +108,7 @@ void addInspectCommands(CLI::App& app, int& status) {
                         std::cout << tag << '\n';
                     });
   addInspectCommand(app, status, "animations",
-                    "Print the animations of a tag for the posture, one a line (as "
-                    "_getAnimationsByTag)",
+                    "Print the animations bound to a tag, one a line (as _getAnimationsByTag)",
                     true, [](ZU::ZUMokuto& service, const InspectOptions& o) {
                       for (const auto& animation : service._getAnimationsByTag(o.tag))
                         std::cout << animation << '\n';

@@ -261,23 +261,33 @@ void addSayCommand(CLI::App& app, int& status) {
       ->check(CLI::IsMember({"espeak", "timing"}))
       ->capture_default_str();
   command->add_flag("--fast", o->fast, "Play the speech without waiting in real time");
-  command->add_option("--config", o->config,
-                      "A configuration value form for the two-argument say: "
-                      "[[\"bodyLanguageMode\", \"random\"], [\"msPauseBeforeSpeech\", 0], ...]");
-  command->add_option("--tags-to-words", o->tagsToWords,
-                      "Words bound to tags, given to addTagsToWords before the text: "
-                      "[[\"tag\", [\"word\", ...]], ...]");
-  command->add_option("--tags-to-animations", o->tagsToAnimations,
-                      "Animations bound to tags, given to declareTagForAnimations before the "
-                      "text: [[\"tag\", [\"animation\", ...]], ...]");
-  command->add_option("--package", o->packages,
-                      "An animations package to declare before the text (repeatable)");
+  command
+      ->add_option("--config", o->config,
+                   "A configuration value form for the two-argument say: "
+                   "[[\"bodyLanguageMode\", \"random\"], [\"msPauseBeforeSpeech\", 0], ...]")
+      ->type_name("JSON");
+  command
+      ->add_option("--tags-to-words", o->tagsToWords,
+                   "Words bound to tags, given to addTagsToWords before the text: "
+                   "[[\"tag\", [\"word\", ...]], ...]")
+      ->type_name("JSON");
+  command
+      ->add_option("--tags-to-animations", o->tagsToAnimations,
+                   "Animations bound to tags, given to declareTagForAnimations before the "
+                   "text: [[\"tag\", [\"animation\", ...]], ...]")
+      ->type_name("JSON");
+  command
+      ->add_option("--package", o->packages,
+                   "An animations package to declare before the text (repeatable)")
+      ->type_name("NAME");
   command->add_flag("--check-times", o->checkTimes,
                     "Switch the timing checker on (ZUMokuto/StartOfMK and StopOfMK, and the "
                     "durations in the log category mokuto.times)");
-  command->add_option("--wav", o->wav, "Write the audio of the whole performance to this WAV file");
-  command->add_option("--timeline", o->timeline,
-                      "Write the whole timeline to this file as JSON lines");
+  command->add_option("--wav", o->wav, "Write the audio of the whole performance to this WAV file")
+      ->type_name("FILE");
+  command
+      ->add_option("--timeline", o->timeline, "Write the whole timeline to this file as JSON lines")
+      ->type_name("FILE");
   command->add_flag("--dry-run", o->dryRun,
                     "Run the compiler and loader stages only and print the prepared job as "
                     "JSON, without speaking");
