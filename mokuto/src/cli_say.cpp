@@ -2,13 +2,19 @@
 // service embedded in the process, prints the live timeline and a summary, and can write
 // the audio (WAV) and the whole timeline (JSON lines). --dry-run shows the prepared job
 // without speaking.
+#include <pthread.h>
+
+#include <atomic>
+#include <csignal>
 #include <filesystem>
 #include <fstream>
+#include <functional>
 #include <iostream>
 #include <iterator>
 #include <memory>
 #include <optional>
 #include <string>
+#include <thread>
 #include <tuple>
 #include <utility>
 #include <vector>
@@ -30,6 +36,61 @@ namespace {
 
 constexpr int kUsage = 2;
 constexpr int kFailure = 1;
+// The shell's status for a command ended by SIGINT.
+constexpr int kInterrupted = 128 + SIGINT;
+
+// SIGINT and SIGTERM blocked in the constructing thread (and in every thread it starts
+// afterwards) for the object's life.
+class InterruptMask {
+ public:
+  InterruptMask() {
+    sigemptyset(&fSignals);
+    sigaddset(&fSignals, SIGINT);
+    sigaddset(&fSignals, SIGTERM);
+    pthread_sigmask(SIG_BLOCK, &fSignals, &fPrevious);
+  }
+  ~InterruptMask() { pthread_sigmask(SIG_SETMASK, &fPrevious, nullptr); }
+  InterruptMask(const InterruptMask&) = delete;
+  InterruptMask& operator=(const InterruptMask&) = delete;
+
+  const sigset_t& signals() const { return fSignals; }
+
+ private:
+  sigset_t fSignals{};
+  sigset_t fPrevious{};
+};
+
+// While a text is spoken, Ctrl-C (SIGINT) or SIGTERM stops it rather than the process, so
+// that the summary and the files still come. A thread of its own waits for the signal;
+// the destructor wakes and joins it.
+class InterruptWatcher {
+ public:
+  InterruptWatcher(const InterruptMask& mask, std::function<void()> stop)
+      : fThread([this, signals = mask.signals(), stop = std::move(stop)] {
+          int received = 0;
+          sigwait(&signals, &received);
+          if (!fDone.load()) {
+            fInterrupted.store(true);
+            std::cerr << "mokuto say: " << (received == SIGINT ? "SIGINT" : "SIGTERM")
+                      << ", stopping the text" << std::endl;
+            stop();
+          }
+        }) {}
+  ~InterruptWatcher() {
+    fDone.store(true);
+    pthread_kill(fThread.native_handle(), SIGTERM);
+    fThread.join();
+  }
+  InterruptWatcher(const InterruptWatcher&) = delete;
+  InterruptWatcher& operator=(const InterruptWatcher&) = delete;
+
+  bool interrupted() const { return fInterrupted.load(); }
+
+ private:
+  std::atomic<bool> fDone{false};
+  std::atomic<bool> fInterrupted{false};
+  std::thread fThread;  // last: it uses the flags
+};
 
 struct SayOptions {
   std::string mode;
@@ -151,6 +212,7 @@ int say(SayOptions& o) {
     if (!timelineFile)
       return usage("--timeline: cannot write " + o.timeline);
   }
+  int status = 0;
   // The live timeline is the command's output; the service's log keeps to its warnings
   // unless ZEFOKO_LOG says otherwise.
   if (ko::os::getenv("ZEFOKO_LOG").empty())
@@ -163,6 +225,9 @@ int say(SayOptions& o) {
     serviceOptions.language = o.language;
     serviceOptions.posture = o.posture;
     serviceOptions.recordAudio = !o.wav.empty();
+    // Blocked before the robot's threads start, so that they all inherit the mask and the
+    // watcher below alone takes the signals.
+    const InterruptMask interruptMask;
     EmbeddedService embedded(serviceOptions);
     ZU::ZUMokuto& service = embedded.service();
     robotsim::Robot& robot = embedded.robot();
@@ -200,10 +265,17 @@ int say(SayOptions& o) {
       });
       robot.timeline()->clear();
       recorder->begin(*o.text);
-      if (configuration)
-        service.say(*o.text, *configuration);
-      else
-        service.say(*o.text);
+      bool interrupted = false;
+      {
+        const InterruptWatcher watcher(interruptMask, [&service] { service._stopAll(false); });
+        if (configuration)
+          service.say(*o.text, *configuration);
+        else
+          service.say(*o.text);
+        interrupted = watcher.interrupted();
+      }
+      if (interrupted)
+        status = kInterrupted;
       ZU::MKID id = 0;
       const SaySummary summary = recorder->end(&id);
       embedded.setStageObserver(nullptr);
@@ -232,7 +304,7 @@ int say(SayOptions& o) {
     std::cerr << "mokuto say: " << e.what() << std::endl;
     return kFailure;
   }
-  return std::cout.good() ? 0 : kFailure;
+  return std::cout.good() ? status : kFailure;
 }
 
 }  // namespace
@@ -296,7 +368,8 @@ void addSayCommand(CLI::App& app, int& status) {
                       "The annotated text; read from standard input when absent or \"-\"");
   command->footer(
       "Exit status: 0 when the text was spoken (instruction errors included), 2 for an "
-      "unusable argument or option, 1 when the service fails.\nLog lines go to standard "
+      "unusable argument or option, 1 when the service fails, 130 when Ctrl-C (SIGINT) or "
+      "SIGTERM stopped the text (its summary and files still come).\nLog lines go to standard "
       "error, warnings and errors only unless ZEFOKO_LOG sets the levels.");
   command->callback([o, &status] { status = say(*o); });
 }

@@ -161,7 +161,8 @@ SaySummary SayTimeline::end(ZU::MKID* id) {
 }
 
 void SayTimeline::printSummary(std::ostream& os, ZU::MKID id, const SaySummary& s) {
-  os << "Text " << id << " done in " << milliseconds(s.durationUs) << "\n"
+  os << "Text " << id << (s.stopped > 0 ? " stopped after " : " done in ")
+     << milliseconds(s.durationUs) << "\n"
      << "  actions: " << s.executed << " executed, " << s.skipped << " skipped";
   if (s.stopped > 0)
     os << ", " << s.stopped << " stopped";

@@ -6,7 +6,9 @@
 
 #include <algorithm>
 #include <cmath>
+#include <csignal>
 #include <cstdint>
+#include <cstdio>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
@@ -238,6 +240,34 @@ TEST_F(MokutoCommand, ExitStatusTellsAnUnusableArgumentFromATextWithErrors) {
     EXPECT_EQ(r.status, c.status) << r.out << r.err;
     EXPECT_NE((c.status == 0 ? r.out : r.err).find(c.message), std::string::npos) << r.out << r.err;
   }
+}
+
+TEST_F(MokutoCommand, CtrlCStopsTheTextAndStillGivesTheSummary) {
+  // The shell prints the command's process id, then becomes the command, which reads the
+  // text from its standard input.
+  std::ofstream(folder / "in.txt") << kText;
+  const std::string command = "sh -c 'echo $$; exec " + std::string(MOKUTO_EXECUTABLE) +
+                              " say --speech timing' <" + quoted((folder / "in.txt").string()) +
+                              " 2>/dev/null";
+  FILE* pipe = ::popen(command.c_str(), "r");
+  ASSERT_NE(pipe, nullptr);
+  std::string out;
+  char buffer[4096];
+  ASSERT_NE(std::fgets(buffer, sizeof buffer, pipe), nullptr);
+  const pid_t pid = static_cast<pid_t>(std::stol(buffer));
+  bool sent = false;
+  while (std::fgets(buffer, sizeof buffer, pipe)) {
+    out += buffer;
+    // The speech waits there for the gesture's end: the text is in full swing.
+    if (!sent && out.find("bookmark 2 (the speech waits") != std::string::npos)
+      sent = ::kill(pid, SIGINT) == 0;
+  }
+  const int raw = ::pclose(pipe);
+  ASSERT_TRUE(sent) << out;
+  EXPECT_EQ(WIFEXITED(raw) ? WEXITSTATUS(raw) : -1, 130) << out;
+  EXPECT_NE(out.find("^runSound(bells/ding, 50)  stopped"), std::string::npos) << out;
+  EXPECT_NE(out.find("Text 1 stopped after"), std::string::npos) << out;
+  EXPECT_NE(out.find(", 2 stopped"), std::string::npos) << out;
 }
 
 TEST_F(MokutoCommand, ReadsTheTextFromStandardInput) {
