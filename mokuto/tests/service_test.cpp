@@ -55,8 +55,7 @@ class ZUSlow : public ZU::ZUModule {
  public:
   ZUSlow(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
       : ZU::ZUModule(broker, name) {
-    beginMethod("block", "ZUSlow", "Returns once the gate opens.");
-    describeParameter("n", "Unused.");
+    beginMethod("block", "ZUSlow", "");
     bindMethod(&ZUSlow::block);
   }
   void block(int /*n*/) {
@@ -72,29 +71,15 @@ class RefusingMemory : public ZU::ZUModule {
  public:
   RefusingMemory(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
       : ZU::ZUModule(broker, name) {
-    beginMethod("declareEvent", "RefusingMemory", "Accepted.");
-    describeParameter("eventName", "");
-    describeParameter("extractorName", "");
-    bindMethod(&RefusingMemory::declareEvent);
-    beginMethod("raiseEvent", "RefusingMemory", "Accepted.");
-    describeParameter("key", "");
-    describeParameter("value", "");
-    bindMethod(&RefusingMemory::raiseEvent);
-    beginMethod("subscribeToEvent", "RefusingMemory", "Accepted.");
-    describeParameter("name", "");
-    describeParameter("callbackModule", "");
-    describeParameter("callbackMethod", "");
-    bindMethod(&RefusingMemory::subscribeToEvent);
-    beginMethod("subscribeToMicroEvent", "RefusingMemory", "Refused.");
-    describeParameter("name", "");
-    describeParameter("callbackModule", "");
-    describeParameter("callbackMessage", "");
-    describeParameter("callbackMethod", "");
-    bindMethod(&RefusingMemory::subscribeToMicroEvent);
-    beginMethod("unsubscribeToEvent", "RefusingMemory", "Accepted.");
-    describeParameter("name", "");
-    describeParameter("callbackModule", "");
-    bindMethod(&RefusingMemory::unsubscribeToEvent);
+    const auto bind = [this](const char* method, auto function) {
+      beginMethod(method, "RefusingMemory", "");
+      bindMethod(function);
+    };
+    bind("declareEvent", &RefusingMemory::declareEvent);
+    bind("raiseEvent", &RefusingMemory::raiseEvent);
+    bind("subscribeToEvent", &RefusingMemory::subscribeToEvent);
+    bind("subscribeToMicroEvent", &RefusingMemory::subscribeToMicroEvent);
+    bind("unsubscribeToEvent", &RefusingMemory::unsubscribeToEvent);
   }
   void declareEvent(const std::string&, const std::string&) {}
   void raiseEvent(const std::string&, const ZU::ZUValue&) {}
@@ -112,12 +97,9 @@ class StubBehaviorManager : public ZU::ZUModule {
  public:
   StubBehaviorManager(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
       : ZU::ZUModule(broker, name) {
-    beginMethod("getInstalledBehaviors", "StubBehaviorManager", "The library.");
-    describeReturn("behaviors", "");
+    beginMethod("getInstalledBehaviors", "StubBehaviorManager", "");
     bindMethod(&StubBehaviorManager::getInstalledBehaviors);
-    beginMethod("getBehaviorTags", "StubBehaviorManager", "The tags of one behaviour.");
-    describeParameter("behavior", "");
-    describeReturn("tags", "");
+    beginMethod("getBehaviorTags", "StubBehaviorManager", "");
     bindMethod(&StubBehaviorManager::getBehaviorTags);
   }
   std::vector<std::string> getInstalledBehaviors() {
@@ -409,6 +391,37 @@ TEST_F(ServicePipeline, DiagnosisWithNoTextRunning) {
   EXPECT_EQ(logged, expected);
 }
 
+TEST_F(ServicePipeline, PrepareCompilesAndLoadsInTheLastReportedPostureWithoutSpeaking) {
+  struct Report {
+    ZU::ZUValue value;
+    ZU::PostureFamily family;
+  };
+  const std::vector<Report> reports = {
+      {ZU::ZUValue("SittingOnChair"), ZU::SittingOnChair},
+      {ZU::ZUValue("Crouching"), ZU::Unknown},
+      {ZU::ZUValue(1), ZU::Unknown},  // not a name: ignored
+      {ZU::ZUValue("Standing"), ZU::Standing},
+  };
+  for (const auto& report : reports) {
+    SCOPED_TRACE(report.value.toString());
+    mokuto_->_postureFamilyChangedCallback("PostureFamilyChanged", report.value, "");
+    EXPECT_EQ(mokuto_->prepare("Hi")->postureFamily, report.family);
+  }
+  const std::string gesture = "animations/Stand/Gestures/Hey_1";
+  const auto job = mokuto_->prepare("Hi ^start(" + gesture + ") there",
+                                    ZU::ZUValue::makeArray({ZU::ZUValue::makeArray(
+                                        {ZU::ZUValue("msPauseBeforeSpeech"), ZU::ZUValue(0)})}));
+  ASSERT_EQ(job->actions.size(), 1u);
+  EXPECT_EQ(job->actions[0]->text, "^start(" + gesture + ")");
+  EXPECT_EQ(job->config.msPauseBeforeSpeech, 0);
+  EXPECT_EQ(timeline_->entries("ZUBehaviorManager", "preloadBehavior").size(), 1u);
+  EXPECT_EQ(speech_->sayCount(), 0u);
+  EXPECT_FALSE(mokuto_->_isRunning());
+  EXPECT_TRUE(endEvents().empty());
+  for (const auto& entry : stages_->all())
+    EXPECT_NE(entry.first, Stage::Director);
+}
+
 // ---- the method table and the configuration methods ---------------------------------------
 
 struct MethodRow {
@@ -583,34 +596,15 @@ TEST_F(ServiceIndex, PackagesAreRefreshedOnceForTheBehavioursThatChanged) {
 }
 
 TEST_F(ServiceIndex, TagPageListsTheVisibleTags) {
-  const std::string head =
-      "<html><body><script>"
-      "function runBehavior (behavior) {\n"
-      "var xhr_object = null;\n"
-      "if (window.XMLHttpRequest) {\n"
-      "xhr_object = new XMLHttpRequest();\n"
-      "}\n"
-      "else if (window.ActiveXObject) {\n"
-      "xhr_object = new ActiveXObject(\"Microsoft.XMLHTTP\");\n"
-      "}\n"
-      "else {\n"
-      "return;\n"
-      "}\n"
-      "var evalUrl = document.URL.substring(0, document.URL.lastIndexOf(\"/\") + 1) + "
-      "\"?eval=\";\n"
-      "xhr_object.onreadystatechange = function () {\n"
-      "if (xhr_object.readyState == 4 && xhr_object.status == 200) {\n"
-      "xhr_object.onreadystatechange = null;\n"
-      "}\n"
-      "}\n"
-      "xhr_object.open(\"GET\", evalUrl + \"ZUBehaviorManager.runBehavior('\" + behavior + "
-      "\"')\");\n"
-      "xhr_object.send(null);\n"
-      "}\n"
-      "</script>";
+  // With no tag: the head, the script (20 lines) and the end of the page, no table.
+  const std::string empty = mokuto_->httpGet();
   const std::string tail = "</body></html>";
+  const auto scriptEnd = empty.find("</script>") + std::string("</script>").size();
+  const std::string head = empty.substr(0, scriptEnd);
+  EXPECT_EQ(head.rfind("<html><body><script>function runBehavior (behavior) {\n", 0), 0u);
+  EXPECT_EQ(std::count(head.begin(), head.end(), '\n'), 20);
+  EXPECT_EQ(empty, head + tail);
   EXPECT_TRUE(mokuto_->_getTagList().empty());
-  EXPECT_EQ(mokuto_->httpGet(), head + tail);
 
   behaviors_->setLibrary({{"animations/Stand/A", {"hello", ".hidden"}},
                           {"animations/Stand/B", {"hello", "animationMode"}},
