@@ -142,7 +142,8 @@ SaySummary SayTimeline::end(ZU::MKID* id) {
       xResolveBookmark(action);
     summary = xSummary();
     summary.durationUs = fTimeline->now() - fBeginUs;
-    fSummary = summary;
+    // What comes later (the body talk settling) goes to the file only, not amid the summary.
+    fEnded = true;
     textId = fId;
   }
   if (id)
@@ -287,7 +288,7 @@ void SayTimeline::xBookmarkReached(std::int32_t number, std::int64_t us, bool bl
 }
 
 void SayTimeline::xPrint(std::int64_t us, const std::string& line) {
-  if (fLive)
+  if (fLive && !fEnded)
     *fLive << seconds(us - fBeginUs) << "  " << line << std::endl;
 }
 

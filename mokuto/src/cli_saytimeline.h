@@ -95,7 +95,7 @@ class SayTimeline : public ZU::DirectorObserver, public std::enable_shared_from_
   std::optional<std::int64_t> fSpeechId;
   std::vector<std::pair<std::int32_t, std::int64_t>> fBookmarks;
   std::vector<Action> fActions;
-  std::optional<SaySummary> fSummary;
+  bool fEnded = false;
 };
 
 }  // namespace mokuto::cli
