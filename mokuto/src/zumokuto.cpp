@@ -32,6 +32,17 @@ std::shared_ptr<T> makeMember(const char* what, Make&& make) {
   }
 }
 
+// The compiler asks the speech engine for its language; without one it goes on without.
+std::shared_ptr<CompilerTask> makeCompiler(const std::shared_ptr<ZUBroker>& broker) {
+  std::shared_ptr<ZUTextToSpeechProxy> tts;
+  try {
+    tts = std::make_shared<ZUTextToSpeechProxy>(broker);
+  } catch (const std::exception& e) {
+    KO_LOG_ERROR(kMain) << "The compiler works without the speech engine: " << e.what();
+  }
+  return std::make_shared<CompilerTask>(std::move(tts));
+}
+
 }  // namespace
 
 ZUMokuto::ZUMokuto(const std::shared_ptr<ZUBroker>& broker, const std::string& name,
@@ -40,18 +51,7 @@ ZUMokuto::ZUMokuto(const std::shared_ptr<ZUBroker>& broker, const std::string& n
       fOptions(std::move(options)),
       memory(std::make_shared<ZUMemoryProxy>(broker)),
       bodyTalk(std::make_shared<ZURobotBodyTalkInstance>(broker, fOptions.bodyTalk)),
-      compiler(makeMember<CompilerTask>("compiler",
-                                        [&] {
-                                          std::shared_ptr<ZUTextToSpeechProxy> tts;
-                                          try {
-                                            tts = std::make_shared<ZUTextToSpeechProxy>(broker);
-                                          } catch (const std::exception& e) {
-                                            KO_LOG_ERROR(kMain)
-                                                << "The compiler works without the speech engine: "
-                                                << e.what();
-                                          }
-                                          return std::make_shared<CompilerTask>(std::move(tts));
-                                        })),
+      compiler(makeMember<CompilerTask>("compiler", [&] { return makeCompiler(broker); })),
       loader(makeMember<LoaderTask>(
           "loader", [&] { return std::make_shared<LoaderTask>(broker, bodyTalk); })),
       director(makeMember<DirectorTask>("director", [&] {
