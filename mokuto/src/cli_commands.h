@@ -16,5 +16,12 @@ void addLookupCommand(CLI::App& app, int& status);
 void addAnalyseCommand(CLI::App& app, int& status);
 // mokuto emotion [--language L] [--json] TEXT
 void addEmotionCommand(CLI::App& app, int& status);
+// mokuto say [--mode M] [--language L] [--posture P] [--speech espeak|timing] [--fast]
+//            [--config JSON] [--tags-to-words JSON] [--tags-to-animations JSON]
+//            [--package NAME]... [--check-times] [--wav FILE] [--timeline FILE]
+//            [--dry-run] [--quiet] [TEXT]
+void addSayCommand(CLI::App& app, int& status);
+// mokuto methods | tags | animations TAG | diagnosis | page
+void addInspectCommands(CLI::App& app, int& status);
 
 }  // namespace mokuto::cli

@@ -205,6 +205,7 @@ void DirectorTask::xReport(Text& text, std::size_t index) {
   report.bookmarkUs = trace.bookmarkUs;
   report.beginUs = trace.beginUs;
   report.endUs = trace.endUs;
+  report.action = job.actions[index];
   job.mutex.unlock();
   try {
     text.observer->onAction(report);

@@ -12,6 +12,13 @@ int main(int argc, char** argv) {
   mokuto::cli::addLookupCommand(app, status);
   mokuto::cli::addAnalyseCommand(app, status);
   mokuto::cli::addEmotionCommand(app, status);
-  CLI11_PARSE(app, argc, argv);
+  mokuto::cli::addSayCommand(app, status);
+  mokuto::cli::addInspectCommands(app, status);
+  try {
+    app.parse(argc, argv);
+  } catch (const CLI::ParseError& e) {
+    // Help is a success; an unusable argument or option is status 2.
+    return app.exit(e) == 0 ? 0 : 2;
+  }
   return status;
 }

@@ -69,6 +69,8 @@ struct DirectorActionReport {
   std::int64_t bookmarkUs = -1;  // its bookmark arrived (the first report of it)
   std::int64_t beginUs = -1;     // the director took it up
   std::int64_t endUs = -1;       // its execution returned
+  // The action itself, as the loader left it (its text carries an error code in front).
+  std::shared_ptr<const MKTaskAction> action;
 };
 
 // Hears every action of every text, once, in list order. Called in the director's thread
