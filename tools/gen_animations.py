@@ -329,26 +329,261 @@ def meditate(g):
     g.pose(2.5 + g.jitter(0.2), HeadPitch=0.35)
 
 
+def we_all(g):
+    """Both arms open wide, then gathered to the chest."""
+    for side in ("L", "R"):
+        g.pose(0.5, g.arm(side, ShoulderPitch=0.55, ShoulderRoll=0.7, ElbowYaw=-0.6,
+                          ElbowRoll=-0.4, WristYaw=0.8, Hand=1.0))
+    g.pose(0.5, HeadPitch=-0.05)
+    t = 1.2 + g.jitter(0.05)
+    for side in ("L", "R"):
+        g.pose(t, g.arm(side, ShoulderPitch=0.85, ShoulderRoll=0.05, ElbowYaw=-1.4,
+                        ElbowRoll=-1.3, WristYaw=-0.3, Hand=0.8))
+    g.pose(t, HeadPitch=0.1)
+
+
+def they_side(g):
+    """An open hand towards someone at the side, the head turned there."""
+    g.pose(0.5, g.arm("R", ShoulderPitch=0.55, ShoulderRoll=0.9, ElbowYaw=-0.5, ElbowRoll=-0.2,
+                      WristYaw=1.0, Hand=1.0), HeadYaw=-0.35)
+    g.pose(1.3 + g.jitter(0.05), g.arm("R", ShoulderRoll=0.8), HeadYaw=-0.25)
+
+
+def big_wide(g):
+    for side in ("L", "R"):
+        g.pose(0.5, g.arm(side, ShoulderPitch=0.45, ShoulderRoll=0.95, ElbowYaw=-0.4,
+                          ElbowRoll=-0.25, WristYaw=0.9, Hand=1.0))
+    g.pose(0.5, HeadPitch=-0.12)
+    t = 1.2 + g.jitter(0.05)
+    for side in ("L", "R"):
+        g.pose(t, g.arm(side, ShoulderRoll=1.15))
+
+
+def small_close(g):
+    for side in ("L", "R"):
+        g.pose(0.5, g.arm(side, ShoulderPitch=0.6, ShoulderRoll=-0.05, ElbowYaw=-0.7,
+                          ElbowRoll=-1.1, WristYaw=1.2, Hand=0.5))
+    g.pose(0.5, HeadPitch=0.15)
+    t = 1.2 + g.jitter(0.05)
+    for side in ("L", "R"):
+        g.pose(t, g.arm(side, ShoulderRoll=-0.2, ElbowRoll=-1.3, Hand=0.3))
+
+
+def all_sweep(g):
+    """One open hand sweeping from the middle out to the side."""
+    g.pose(0.45, g.arm("R", ShoulderPitch=0.45, ShoulderRoll=-0.2, ElbowYaw=-0.3, ElbowRoll=-0.3,
+                       WristYaw=0.0, Hand=1.0), HeadYaw=0.1)
+    g.pose(1.2 + g.jitter(0.05), g.arm("R", ShoulderRoll=1.0), HeadYaw=-0.3)
+
+
+def many_both(g):
+    for side in ("L", "R"):
+        g.pose(0.45, g.arm(side, ShoulderPitch=0.5, ShoulderRoll=0.0, ElbowYaw=-0.6,
+                           ElbowRoll=-0.5, Hand=1.0))
+    t = 1.2 + g.jitter(0.05)
+    for side in ("L", "R"):
+        g.pose(t, g.arm(side, ShoulderRoll=0.9))
+    g.pose(t, HeadPitch=-0.1)
+
+
+def nothing_wipe(g):
+    """Both hands, palms down, crossed and wiped apart; a small shake of the head."""
+    for side in ("L", "R"):
+        g.pose(0.45, g.arm(side, ShoulderPitch=0.65, ShoulderRoll=-0.15, ElbowYaw=-0.2,
+                           ElbowRoll=-0.9, WristYaw=0.0, Hand=1.0))
+    t = 1.1 + g.jitter(0.05)
+    for side in ("L", "R"):
+        g.pose(t, g.arm(side, ShoulderRoll=0.9, ElbowRoll=-0.3))
+    g.pose(0.6, HeadYaw=0.15)
+    g.pose(1.0, HeadYaw=-0.15)
+    g.pose(1.4, HeadYaw=0.0)
+
+
+def explain_open(g):
+    """Both palms up, the hands rising and falling in turn."""
+    for side in ("L", "R"):
+        g.pose(0.5, g.arm(side, ShoulderPitch=0.65, ShoulderRoll=0.2, ElbowYaw=0.4,
+                          ElbowRoll=-0.8, WristYaw=1.4, Hand=1.0))
+    t = 1.0 + g.jitter(0.04)
+    g.pose(t, g.arm("L", ShoulderPitch=0.5), g.arm("R", ShoulderPitch=0.75))
+    t += 0.5 + g.jitter(0.04)
+    g.pose(t, g.arm("L", ShoulderPitch=0.75), g.arm("R", ShoulderPitch=0.5))
+    g.pose(t + 0.5, g.arm("L", ShoulderPitch=0.65), g.arm("R", ShoulderPitch=0.65))
+
+
+def weigh(g):
+    """Two options weighed on open palms."""
+    for side in ("L", "R"):
+        g.pose(0.5, g.arm(side, ShoulderPitch=0.7, ShoulderRoll=0.35, ElbowYaw=0.3,
+                          ElbowRoll=-0.9, WristYaw=1.5, Hand=1.0))
+    t = 1.0 + g.jitter(0.04)
+    g.pose(t, g.arm("L", ShoulderPitch=0.55), g.arm("R", ShoulderPitch=0.85), HeadYaw=0.15)
+    g.pose(t + 0.5, g.arm("L", ShoulderPitch=0.85), g.arm("R", ShoulderPitch=0.55), HeadYaw=-0.15)
+
+
+def shrug(g):
+    for side in ("L", "R"):
+        g.pose(0.5, g.arm(side, ShoulderPitch=0.9, ShoulderRoll=0.45, ElbowYaw=0.5,
+                          ElbowRoll=-1.0, WristYaw=1.5, Hand=1.0))
+    g.pose(0.5, HeadPitch=0.05, HeadYaw=0.15)
+    t = 1.3 + g.jitter(0.05)
+    for side in ("L", "R"):
+        g.pose(t, g.arm(side, ShoulderRoll=0.55))
+    g.pose(t, HeadYaw=0.1)
+
+
+def here_down(g):
+    g.pose(0.5, g.arm("R", ShoulderPitch=0.95, ShoulderRoll=0.05, ElbowYaw=-0.6, ElbowRoll=-0.35,
+                      WristYaw=0.0, Hand=0.2), HeadPitch=0.3)
+    g.pose(1.1 + g.jitter(0.05), g.arm("R", ShoulderPitch=1.1))
+    g.pose(1.5 + g.jitter(0.05), HeadPitch=0.2)
+
+
+def far_point(g):
+    g.pose(0.6, g.arm("R", ShoulderPitch=-0.05, ShoulderRoll=0.25, ElbowYaw=-0.9, ElbowRoll=-0.05,
+                      WristYaw=0.0, Hand=0.3), HeadPitch=-0.2, HeadYaw=-0.2)
+    g.pose(1.4 + g.jitter(0.05), g.arm("R", ShoulderPitch=0.0))
+
+
+def thanks_bow(g):
+    for side in ("L", "R"):
+        g.pose(0.5, g.arm(side, ShoulderPitch=0.95, ShoulderRoll=-0.05, ElbowYaw=-1.3,
+                          ElbowRoll=-1.25, WristYaw=0.0, Hand=0.9))
+    g.pose(0.5, HeadPitch=0.0)
+    g.pose(0.95 + g.jitter(0.04), HeadPitch=0.4)
+    g.pose(1.6 + g.jitter(0.04), HeadPitch=0.05)
+
+
+def love_chest(g):
+    for side in ("L", "R"):
+        g.pose(0.5, g.arm(side, ShoulderPitch=0.95, ShoulderRoll=-0.05, ElbowYaw=-1.6,
+                          ElbowRoll=-1.5, Hand=1.0))
+    g.pose(0.5, HeadPitch=0.1, HeadYaw=0.1)
+    g.pose(1.6 + g.jitter(0.1), HeadPitch=0.05, HeadYaw=0.05)
+
+
+def happy_up(g):
+    for side in ("L", "R"):
+        g.pose(0.5, g.arm(side, ShoulderPitch=-0.5, ShoulderRoll=0.45, ElbowYaw=-1.2,
+                          ElbowRoll=-0.5, Hand=1.0))
+    g.pose(0.5, HeadPitch=-0.2)
+    for t, roll in ((1.0, 0.6), (1.5, 0.45)):
+        for side in ("L", "R"):
+            g.pose(t + g.jitter(0.03), g.arm(side, ShoulderRoll=roll))
+
+
+def beckon(g):
+    g.pose(0.45, g.arm("R", ShoulderPitch=0.5, ShoulderRoll=0.1, ElbowYaw=0.3, ElbowRoll=-0.4,
+                       WristYaw=1.4, Hand=1.0))
+    t = 0.45
+    for _ in range(2):
+        t += 0.35 + g.jitter(0.03)
+        g.pose(t, g.arm("R", ElbowRoll=-1.2))
+        t += 0.35 + g.jitter(0.03)
+        g.pose(t, g.arm("R", ElbowRoll=-0.5))
+
+
+def stop_palm(g):
+    g.pose(0.4, g.arm("R", ShoulderPitch=0.15, ShoulderRoll=0.05, ElbowYaw=-1.5, ElbowRoll=-0.6,
+                      WristYaw=-1.2, Hand=1.0), HeadPitch=-0.05)
+    g.pose(1.3 + g.jitter(0.05), g.arm("R", ShoulderPitch=0.1))
+
+
+def great_fists(g):
+    for side in ("L", "R"):
+        g.pose(0.45, g.arm(side, ShoulderPitch=0.5, ShoulderRoll=0.2, ElbowYaw=-0.8,
+                           ElbowRoll=-1.3, Hand=0.0))
+    for t, pitch in ((0.8, 0.3), (1.15, 0.55)):
+        for side in ("L", "R"):
+            g.pose(t + g.jitter(0.03), g.arm(side, ShoulderPitch=pitch))
+    g.pose(0.8, HeadPitch=-0.1)
+
+
+def together_clasp(g):
+    for side in ("L", "R"):
+        g.pose(0.45, g.arm(side, ShoulderPitch=0.6, ShoulderRoll=0.6, ElbowYaw=-0.8,
+                           ElbowRoll=-0.6, Hand=1.0))
+    t = 1.1 + g.jitter(0.05)
+    for side in ("L", "R"):
+        g.pose(t, g.arm(side, ShoulderRoll=-0.15, ElbowRoll=-1.1, Hand=0.6))
+
+
+def look_brow(g):
+    g.pose(0.55, g.arm("R", ShoulderPitch=-0.2, ShoulderRoll=0.1, ElbowYaw=-0.8, ElbowRoll=-1.45,
+                       WristYaw=-1.0, Hand=1.0), HeadYaw=-0.3, HeadPitch=-0.1)
+    g.pose(1.3 + g.jitter(0.05), HeadYaw=0.2)
+    g.pose(1.9 + g.jitter(0.05), HeadYaw=-0.1)
+
+
+def sorry_low(g):
+    for side in ("L", "R"):
+        g.pose(0.5, g.arm(side, ShoulderPitch=1.1, ShoulderRoll=-0.05, ElbowYaw=-1.0,
+                          ElbowRoll=-0.9, Hand=0.5))
+    g.pose(0.5, HeadPitch=0.35)
+    g.pose(1.6 + g.jitter(0.1), HeadPitch=0.3)
+
+
+# Tags of the gestures for what a word says, in the three languages of the linguistic
+# databases: each tag is a base form that the analysis gives for a word ("moi" for
+# "moi", "penser" for "pense"). The databases keep these base forms first.
+ME = ["me", "i", "myself", "je", "moi", "私", "僕"]
+YOU = ["you", "yourself", "tu", "toi", "vous", "あなた", "君"]
+YES = ["yes", "oui", "はい", "うん"]
+NO = ["no", "non", "いいえ"]
+HELLO = ["hello", "hey", "hi", "bonjour", "salut", "coucou", "こんにちは", "やあ"]
+
 GESTURES = [
-    ("Hey_1", ["hello", "hey"], hey_right),
-    ("Hey_2", ["hello", "hey"], hey_left),
-    ("Hello_1", ["hello"], hello_open),
-    ("Yes_1", ["yes"], yes_nod),
-    ("Yes_2", ["yes", "yeah"], yes_beat),
-    ("No_1", ["no"], no_shake),
-    ("No_2", ["no", "oppose"], no_hand),
-    ("Me_1", ["me"], me_chest),
-    ("Me_2", ["me"], me_both),
-    ("You_1", ["you"], you_point),
-    ("You_2", ["you"], you_palm),
+    ("Hey_1", HELLO, hey_right),
+    ("Hey_2", HELLO, hey_left),
+    ("Hello_1", ["hello", "welcome", "bonjour", "bienvenue", "こんにちは", "ようこそ"], hello_open),
+    ("Yes_1", YES, yes_nod),
+    ("Yes_2", YES + ["yeah"], yes_beat),
+    ("No_1", NO, no_shake),
+    ("No_2", NO + ["oppose"], no_hand),
+    ("Me_1", ME, me_chest),
+    ("Me_2", ME, me_both),
+    ("You_1", YOU, you_point),
+    ("You_2", YOU, you_palm),
     ("Two_1", ["two"], two),
     ("Three_1", ["three"], three),
     ("Four_1", ["four"], four),
     ("Five_1", ["five", "hello"], five),
     ("Pick_1", ["pick"], pick),
+    ("Pick_2", ["pick"], weigh),
     ("Oppose_1", ["oppose", "no"], oppose),
+    ("Oppose_2", ["oppose"], nothing_wipe),
     ("Yeah_1", ["yeah"], yeah),
     ("Medidate_1", ["medidate"], meditate),
+    ("We_1", ["we", "us", "ourselves", "nous", "我々"], we_all),
+    ("They_1", ["they", "them", "eux", "彼ら", "彼", "彼女"], they_side),
+    ("Bye_1", ["goodbye", "bye", "adieu", "さようなら", "バイバイ"], hey_right),
+    ("Think_1", ["think", "wonder", "penser", "réfléchir", "croire", "考える", "思う"],
+     lambda g: thinking(g)),
+    ("Big_1", ["big", "large", "huge", "enormous", "grand", "gros", "énorme", "immense", "大きい",
+               "大きな", "巨大"], big_wide),
+    ("Small_1", ["small", "little", "tiny", "petit", "minuscule", "小さい", "小さな"], small_close),
+    ("All_1", ["all", "everything", "everyone", "everybody", "tout", "全部", "全て", "すべて", "皆さん",
+               "みんな", "皆"], all_sweep),
+    ("Many_1", ["many", "lot", "beaucoup", "nombreux", "たくさん", "沢山", "多い"], many_both),
+    ("Nothing_1", ["nothing", "none", "nobody", "rien", "aucun", "zéro", "ゼロ", "無い"],
+     nothing_wipe),
+    ("Explain_1", ["explain", "describe", "show", "expliquer", "décrire", "montrer", "説明",
+                   "教える"], explain_open),
+    ("Maybe_1", ["maybe", "perhaps", "why", "peut-être", "pourquoi", "多分", "たぶん", "なぜ",
+                 "どうして"], shrug),
+    ("Here_1", ["here", "ici", "ここ"], here_down),
+    ("Far_1", ["far", "loin", "遠い"], far_point),
+    ("Thanks_1", ["thank", "thanks", "merci", "remercier", "ありがとう", "感謝"], thanks_bow),
+    ("Love_1", ["love", "adore", "aimer", "adorer", "好き", "愛", "大好き"], love_chest),
+    ("Happy_1", ["happy", "glad", "heureux", "content", "joie", "嬉しい", "楽しい", "幸せ"],
+     happy_up),
+    ("Come_1", ["come", "venir", "来る"], beckon),
+    ("Stop_1", ["stop", "wait", "arrêter", "attendre", "止める", "待つ", "ストップ"], stop_palm),
+    ("Great_1", ["great", "excellent", "wonderful", "amazing", "super", "génial", "bravo", "すごい",
+                 "素晴らしい"], great_fists),
+    ("Together_1", ["together", "ensemble", "一緒"], together_clasp),
+    ("Look_1", ["look", "see", "watch", "regarder", "voir", "見る"], look_brow),
+    ("Sorry_1", ["sorry", "apologize", "désoler", "pardon", "excuser", "ごめん"], sorry_low),
 ]
 
 # ---- body talk -----------------------------------------------------------------------------
@@ -404,7 +639,7 @@ FAMILIES = ["Stand", "Sit", "SitOnPod"]
 def write_descriptor(path, descriptor):
     """One line per key keeps the files readable and their diffs small."""
     lines = ["{",
-             '  "tags": %s,' % json.dumps(descriptor["tags"]),
+             '  "tags": %s,' % json.dumps(descriptor["tags"], ensure_ascii=False),
              '  "duration": %s,' % json.dumps(descriptor["duration"]),
              '  "joints": {']
     joints = list(descriptor["joints"].items())

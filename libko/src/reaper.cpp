@@ -79,24 +79,31 @@ class Reaper {
   std::thread fThread;
 };
 
+// The reaper while it takes destructions; null before it starts and once the process has
+// begun to end (static destruction), when a destruction runs in the dropping thread. Both
+// stay valid through the end of the process: the mutex has no destructor to run.
+std::mutex gReaperMutex;
+Reaper* gReaper = nullptr;
+
+// The process's reaper, started on first use.
+struct ReaperHandle {
+  ReaperHandle() {
+    std::lock_guard lock(gReaperMutex);
+    gReaper = &reaper;
+  }
+  ~ReaperHandle() {
+    std::lock_guard lock(gReaperMutex);
+    gReaper = nullptr;
+  }
+  Reaper reaper;
+};
+
 Reaper& reaper() {
-  static Reaper instance;
-  return instance;
+  static ReaperHandle handle;
+  return handle.reaper;
 }
 
 }  // namespace
-
-bool isFrameworkThread() noexcept {
-  return tlFrameworkDepth > 0;
-}
-
-FrameworkThreadScope::FrameworkThreadScope() noexcept {
-  ++tlFrameworkDepth;
-}
-
-FrameworkThreadScope::~FrameworkThreadScope() {
-  --tlFrameworkDepth;
-}
 
 namespace detail {
 // Called by whatever starts framework threads before it starts them: the reaper is then
@@ -106,9 +113,30 @@ void startReaper() {
 }
 }  // namespace detail
 
+bool isFrameworkThread() noexcept {
+  return tlFrameworkDepth > 0;
+}
+
+FrameworkThreadScope::FrameworkThreadScope() noexcept {
+  detail::startReaper();
+  ++tlFrameworkDepth;
+}
+
+FrameworkThreadScope::~FrameworkThreadScope() {
+  --tlFrameworkDepth;
+}
+
 void reap(std::function<void()> destroy) {
-  if (destroy)
-    reaper().add(std::move(destroy));
+  if (!destroy)
+    return;
+  {
+    std::lock_guard lock(gReaperMutex);
+    if (gReaper) {
+      gReaper->add(std::move(destroy));
+      return;
+    }
+  }
+  destroy();  // the process is ending: no reaper any more
 }
 
 void waitForReaper() {

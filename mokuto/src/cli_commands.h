@@ -11,5 +11,10 @@ void addConfigCommand(CLI::App& app, int& status);
 void addParseCommand(CLI::App& app, int& status);
 // mokuto lookup [--language L | --database FILE] [--json] WORD...
 void addLookupCommand(CLI::App& app, int& status);
+// mokuto analyse [--language L] [--mode M] [--pause MS] [--tags-to-words JSON]
+//                [--structures] [TEXT]
+void addAnalyseCommand(CLI::App& app, int& status);
+// mokuto emotion [--language L] [--json] TEXT
+void addEmotionCommand(CLI::App& app, int& status);
 
 }  // namespace mokuto::cli

@@ -10,6 +10,8 @@ int main(int argc, char** argv) {
   mokuto::cli::addConfigCommand(app, status);
   mokuto::cli::addParseCommand(app, status);
   mokuto::cli::addLookupCommand(app, status);
+  mokuto::cli::addAnalyseCommand(app, status);
+  mokuto::cli::addEmotionCommand(app, status);
   CLI11_PARSE(app, argc, argv);
   return status;
 }

@@ -211,6 +211,15 @@ void ZURobotBodyTalk::setListeningAnimations(PostureFamily postureFamily,
     fArmsListening->setAnimations(names, postureFamily);
 }
 
+std::vector<std::string> ZURobotBodyTalk::getSpeakingAnimations(PostureFamily postureFamily) const {
+  return fArmsSpeaking ? fArmsSpeaking->getAnimations(postureFamily) : std::vector<std::string>{};
+}
+
+std::vector<std::string> ZURobotBodyTalk::getListeningAnimations(
+    PostureFamily postureFamily) const {
+  return fArmsListening ? fArmsListening->getAnimations(postureFamily) : std::vector<std::string>{};
+}
+
 bool ZURobotBodyTalk::areWorkersStopped() const {
   std::lock_guard lock(fMutex);
   return (!fHeadThread || !fHeadThread->isRunning()) && (!fArmsThread || !fArmsThread->isRunning());

@@ -2,6 +2,7 @@
 // resume, the start delays, and the loop of a worker.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <condition_variable>
 #include <cstdlib>
 #include <functional>
@@ -272,6 +273,13 @@ class ScriptedPart : public ZU::ZURobotBodyTalkBodyPart {
     std::unique_lock lock(fMutex);
     return fChanged.wait_for(lock, kBound, [&] { return fThreads.size() >= n; });
   }
+  // Waits until `n` iterations have ended (their afterIteration done).
+  bool waitForEndedIterations(std::size_t n) {
+    std::unique_lock lock(fMutex);
+    return fChanged.wait_for(lock, kBound, [&] {
+      return static_cast<std::size_t>(std::count(fEvents.begin(), fEvents.end(), "after")) >= n;
+    });
+  }
   std::vector<std::string> events() const {
     std::lock_guard lock(fMutex);
     return fEvents;
@@ -291,6 +299,7 @@ class ScriptedPart : public ZU::ZURobotBodyTalkBodyPart {
   void record(const char* event) {
     std::lock_guard lock(fMutex);
     fEvents.push_back(event);
+    fChanged.notify_all();
   }
 
   const std::vector<int> fPauses;
@@ -316,7 +325,7 @@ TEST(BodyTalkThread, APartWithoutPauseIteratesBackToBackInOneRun) {
   worker.setBodyPart(&part);
   EXPECT_EQ(worker.name(), "BodyTalk loop of the Scripted");
   worker.start();
-  ASSERT_TRUE(part.waitForIterations(4));
+  ASSERT_TRUE(part.waitForEndedIterations(4));
   worker.requestStop();
   worker.stop();
   EXPECT_FALSE(worker.isRunning());

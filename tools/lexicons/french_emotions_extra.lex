@@ -1,9 +1,8 @@
 # French negation words and intensifiers that the polarity lexicon lacks, written for
 # this project (mkbdb's lexicon format: the emotion label is the base form of a record
-# of class "unkonwn"). They replace the lexicon's label of the same word.
-ne	unkonwn=negation
-n'	unkonwn=negation
-n	unkonwn=negation
+# of class "unkonwn"). They replace the lexicon's label of the same word. "ne" and "n'"
+# are not negations here: they come with "pas", "jamais", "rien"..., and a negation
+# counted twice would turn the emotion around again.
 pas	unkonwn=negation
 jamais	unkonwn=negation
 rien	unkonwn=negation

@@ -21,3 +21,23 @@ oups	interjection=oups
 hop	interjection=hop
 ouah	interjection=ouah
 waouh	interjection=waouh
+# Elided words without their apostrophe: the analysis cuts "l'homme" into "l", the
+# link "'" and "homme", and "n'" must read as the negation "n".
+j	pronoun/1s=je
+l	determinant/s=le	pronoun_comp/3s=le
+n	adverb/n=ne
+d	preposition=de	determinant/p=un
+qu	sub_conj=que	pronoun=que
+m	pronoun_comp/1s=me
+t	pronoun_comp/2s=te
+s	pronoun_comp/3=se
+c	pronoun/3s=ce
+jusqu	preposition=jusque
+lorsqu	sub_conj=lorsque
+puisqu	sub_conj=puisque
+quoiqu	sub_conj=quoique
+# Strong pronouns, whose base form Lefff gives as "lui"; their own serve as gesture tags.
+moi	pronoun/1s=moi
+toi	pronoun/2s=toi
+soi	pronoun/3=soi
+eux	pronoun/3mp=eux

@@ -270,6 +270,8 @@ LEFFF_CLASSES = {
 LEFFF_CLOSED_RANK = 8
 LEFFF_NEGATIONS = {"clneg", "advneg"}
 COORDINATIONS = {"et", "ou", "and", "or"}
+# The negation words of the analysis' negated groups.
+NEGATIONS = {"ne", "pas", "not"}
 
 
 def lefff_clean(text):
@@ -290,8 +292,9 @@ def french(args):
             if form.startswith("_") or not has_letter(form):
                 continue
             words = form.split(" ")
-            # A fixed phrase around a coordination would hide it from the analysis.
-            if len(words) > 1 and COORDINATIONS & set(w.lower() for w in words):
+            # A fixed phrase around a coordination or a negation ("pas de") would hide
+            # it from the analysis.
+            if len(words) > 1 and (COORDINATIONS | NEGATIONS) & set(w.lower() for w in words):
                 continue
             word_class, rank = LEFFF_CLASSES[category]
             lemma = lefff_clean(parts[2]).rstrip("?")

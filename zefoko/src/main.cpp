@@ -12,6 +12,7 @@ int main(int argc, char** argv) {
   int status = 0;
   zefoko::addSpeakCommand(app, status);
   zefoko::addBodyTalkCommand(app, status);
+  zefoko::addServeCommand(app, status);
   CLI11_PARSE(app, argc, argv);
   return status;
 }

@@ -13,8 +13,10 @@
 // Framework threads are the threads of every ko::EventLoop (periodic tasks run there) and
 // the workers that mark themselves with FrameworkThreadScope. The reaper itself is none.
 //
-// Thread-safe. The reaper starts on first use and, at the end of the process, destroys
-// whatever it still holds before it stops.
+// Thread-safe. The reaper starts with the first framework thread and, at the end of the
+// process, destroys whatever it still holds before it stops; a destruction handed over
+// after that (a framework thread still running while the process's statics go) runs in
+// the dropping thread.
 
 #include <functional>
 #include <memory>

@@ -56,14 +56,23 @@ class ZULingSyntacticAnalyzerBinaryDatabase {
   std::optional<std::uint32_t> find(std::string_view key, std::size_t start,
                                     std::size_t& longestPrefix) const;
 
+  // Like find, but the result is the node of the longest stored prefix (its length in
+  // `length`), or nothing when no prefix is stored.
+  std::optional<std::uint32_t> findLongest(std::string_view key, std::size_t start,
+                                           std::size_t& length) const;
+
   // One (class, features) pair per record of the word, in record order; a word that is
   // not found gives the single pair ("unkonwn", no features).
   std::vector<ZULingClassFeatures> wordClasses(std::string_view word) const;
+  // The same for a node that find or findLongest gave.
+  std::vector<ZULingClassFeatures> wordClassesAt(std::uint32_t node) const;
 
   // False when the class is below 2 or the word is not found; otherwise true. baseForm
   // is cleared, then receives the base form of the first record of that class when
   // that record has one.
   bool lemma(std::string_view word, ZULingWordClass wordClass, std::string& baseForm) const;
+  // The same for a node that find or findLongest gave.
+  bool lemmaAt(std::uint32_t node, ZULingWordClass wordClass, std::string& baseForm) const;
 
   // Frees a body: the file is read whole in one piece into a block whose first 20 bytes
   // hold 3 bytes of padding and the header, so that the body after it is 4-byte aligned
@@ -98,6 +107,10 @@ class ZULingSyntacticAnalyzerBinaryDatabase {
   Record xRecord(const Node& node, std::size_t index) const noexcept;
   std::string_view xFeatures(const Node& node, std::size_t index) const noexcept;
   bool xFail(const std::string& path, const std::string& problem);
+  // The trie walk of find, which also gives the node of the longest stored prefix.
+  std::optional<std::uint32_t> xWalk(std::string_view key, std::size_t start,
+                                     std::size_t& longestPrefix,
+                                     std::optional<std::uint32_t>* longestNode) const;
 };
 
 using ZULingDatabasePtr = std::shared_ptr<const ZULingSyntacticAnalyzerBinaryDatabase>;

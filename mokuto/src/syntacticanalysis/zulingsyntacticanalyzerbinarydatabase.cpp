@@ -72,7 +72,8 @@ struct ZULingSyntacticAnalyzerBinaryDatabase::Record {
   std::uint32_t lemma = 0;
 };
 
-std::uint32_t ZULingSyntacticAnalyzerBinaryDatabase::xWord(std::uint64_t pos) const noexcept {
+inline std::uint32_t ZULingSyntacticAnalyzerBinaryDatabase::xWord(
+    std::uint64_t pos) const noexcept {
   return littleEndian32(xBytes() + pos);
 }
 
@@ -212,53 +213,112 @@ bool ZULingSyntacticAnalyzerBinaryDatabase::load(const std::string& path) {
   return true;
 }
 
-std::optional<std::uint32_t> ZULingSyntacticAnalyzerBinaryDatabase::find(
-    std::string_view key, std::size_t start, std::size_t& longestPrefix) const {
+std::optional<std::uint32_t> ZULingSyntacticAnalyzerBinaryDatabase::xWalk(
+    std::string_view key, std::size_t start, std::size_t& longestPrefix,
+    std::optional<std::uint32_t>* longestNode) const {
   longestPrefix = 0;
   const std::uint8_t* b = xBytes();
   Node node;
   if (start >= key.size() || !xNode(root, node))
     return std::nullopt;
+  // The nodes with records met on the way, checked from the deepest back only once the
+  // walk ends: the longest prefix is the deepest one whose records are sound.
+  constexpr std::size_t kDepth = 16;
+  std::uint32_t passed[kDepth];
+  std::size_t passedLength[kDepth];
+  std::size_t passedCount = 0;
+  const auto settle = [&]() {
+    while (passedCount > 0) {
+      --passedCount;
+      Node candidate;
+      if (xNode(passed[passedCount], candidate) && xRecordsValid(candidate)) {
+        longestPrefix = passedLength[passedCount];
+        if (longestNode != nullptr)
+          *longestNode = passed[passedCount];
+        return;
+      }
+    }
+  };
   std::size_t k = start;
   while (node.childCount > 0 && k < key.size()) {
+    // The children are sorted by their first label byte (signed): a binary search. A
+    // child without a first label byte cannot be walked to.
     const auto wanted = static_cast<std::int8_t>(key[k]);
+    const std::uint64_t children = node.offsets + 4 * std::uint64_t{node.recordCount};
     std::uint32_t taken = 0;
     bool found = false;
-    for (std::size_t c = 0; c < node.childCount; ++c) {
-      const std::uint32_t child = xWord(node.offsets + 4 * (std::uint64_t{node.recordCount} + c));
-      // A child without a first label byte cannot be walked to.
+    std::size_t low = 0;
+    std::size_t high = node.childCount;
+    while (low < high) {
+      const std::size_t middle = (low + high) / 2;
+      const std::uint32_t child = xWord(children + 4 * std::uint64_t{middle});
       if (std::uint64_t{child} + 1 >= size || b[child] == 0)
-        return std::nullopt;
+        break;
       const auto first = static_cast<std::int8_t>(b[child + 1]);
-      if (first > wanted)
-        return std::nullopt;
       if (first == wanted) {
         taken = child;
         found = true;
         break;
       }
+      if (first < wanted)
+        low = middle + 1;
+      else
+        high = middle;
     }
     Node next;
-    if (!found || !xNode(taken, next) || next.labelLength > key.size() - k ||
-        std::memcmp(b + next.label + 1, key.data() + k + 1, next.labelLength - 1u) != 0)
-      return std::nullopt;
+    if (!found || !xNode(taken, next) || next.labelLength > key.size() - k)
+      break;
+    const std::uint8_t* label = b + next.label;
+    const auto* wantedBytes = reinterpret_cast<const std::uint8_t*>(key.data()) + k;
+    std::size_t same = 1;
+    while (same < next.labelLength && label[same] == wantedBytes[same])
+      ++same;
+    if (same != next.labelLength)
+      break;
     k += next.labelLength;
-    if (next.recordCount > 0 && xRecordsValid(next)) {
-      longestPrefix = k - start;
-      if (k == key.size())
+    if (next.recordCount > 0) {
+      if (k == key.size() && xRecordsValid(next)) {
+        longestPrefix = k - start;
+        if (longestNode != nullptr)
+          *longestNode = taken;
         return taken;
+      }
+      if (passedCount == kDepth) {
+        // Deep paths: settle what was passed so far and start again from here.
+        settle();
+        passedCount = 0;
+      }
+      passed[passedCount] = taken;
+      passedLength[passedCount] = k - start;
+      ++passedCount;
     }
     node = next;
+  }
+  if (passedCount > 0) {
+    const std::size_t before = longestPrefix;
+    settle();
+    if (longestPrefix == 0)
+      longestPrefix = before;
   }
   return std::nullopt;
 }
 
-std::vector<ZULingClassFeatures> ZULingSyntacticAnalyzerBinaryDatabase::wordClasses(
-    std::string_view word) const {
-  std::size_t longestPrefix = 0;
+std::optional<std::uint32_t> ZULingSyntacticAnalyzerBinaryDatabase::find(
+    std::string_view key, std::size_t start, std::size_t& longestPrefix) const {
+  return xWalk(key, start, longestPrefix, nullptr);
+}
+
+std::optional<std::uint32_t> ZULingSyntacticAnalyzerBinaryDatabase::findLongest(
+    std::string_view key, std::size_t start, std::size_t& length) const {
+  std::optional<std::uint32_t> node;
+  xWalk(key, start, length, &node);
+  return length > 0 ? node : std::nullopt;
+}
+
+std::vector<ZULingClassFeatures> ZULingSyntacticAnalyzerBinaryDatabase::wordClassesAt(
+    std::uint32_t position) const {
   Node node;
-  const std::optional<std::uint32_t> at = find(word, 0, longestPrefix);
-  if (!at || !xNode(*at, node))
+  if (!xNode(position, node) || node.recordCount == 0 || !xRecordsValid(node))
     return {ZULingClassFeatures{WORD_CLASS_UNKNOWN, {}}};
   std::vector<ZULingClassFeatures> classes;
   classes.reserve(node.recordCount);
@@ -267,15 +327,12 @@ std::vector<ZULingClassFeatures> ZULingSyntacticAnalyzerBinaryDatabase::wordClas
   return classes;
 }
 
-bool ZULingSyntacticAnalyzerBinaryDatabase::lemma(std::string_view word, ZULingWordClass wordClass,
-                                                  std::string& baseForm) const {
+bool ZULingSyntacticAnalyzerBinaryDatabase::lemmaAt(std::uint32_t position,
+                                                    ZULingWordClass wordClass,
+                                                    std::string& baseForm) const {
   baseForm.clear();
-  if (wordClass < 2)
-    return false;
-  std::size_t longestPrefix = 0;
   Node node;
-  const std::optional<std::uint32_t> at = find(word, 0, longestPrefix);
-  if (!at || !xNode(*at, node))
+  if (wordClass < 2 || !xNode(position, node) || node.recordCount == 0 || !xRecordsValid(node))
     return false;
   for (std::size_t r = 0; r < node.recordCount; ++r) {
     const Record record = xRecord(node, r);
@@ -288,6 +345,25 @@ bool ZULingSyntacticAnalyzerBinaryDatabase::lemma(std::string_view word, ZULingW
     break;
   }
   return true;
+}
+
+std::vector<ZULingClassFeatures> ZULingSyntacticAnalyzerBinaryDatabase::wordClasses(
+    std::string_view word) const {
+  std::size_t longestPrefix = 0;
+  const std::optional<std::uint32_t> at = find(word, 0, longestPrefix);
+  if (!at)
+    return {ZULingClassFeatures{WORD_CLASS_UNKNOWN, {}}};
+  return wordClassesAt(*at);
+}
+
+bool ZULingSyntacticAnalyzerBinaryDatabase::lemma(std::string_view word, ZULingWordClass wordClass,
+                                                  std::string& baseForm) const {
+  baseForm.clear();
+  if (wordClass < 2)
+    return false;
+  std::size_t longestPrefix = 0;
+  const std::optional<std::uint32_t> at = find(word, 0, longestPrefix);
+  return at && lemmaAt(*at, wordClass, baseForm);
 }
 
 const ZULingLanguageFile kLingLanguageFiles[12] = {

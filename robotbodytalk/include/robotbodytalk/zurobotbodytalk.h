@@ -96,6 +96,9 @@ class ZURobotBodyTalk {
   // Replace the arms' animation list of a posture family (preloading them, at most 1 s each).
   void setSpeakingAnimations(PostureFamily postureFamily, const std::vector<std::string>& names);
   void setListeningAnimations(PostureFamily postureFamily, const std::vector<std::string>& names);
+  // The arms' animation list of a posture family, in its current (shuffled) order.
+  std::vector<std::string> getSpeakingAnimations(PostureFamily postureFamily) const;
+  std::vector<std::string> getListeningAnimations(PostureFamily postureFamily) const;
 
   // The posture watcher (never null): init()/exit() start and end the watching, and the
   // module's posture callback feeds setPostureFamily().

@@ -1,0 +1,921 @@
+#include "mokuto/zulingsyntacticanalyzer.h"
+
+#include <algorithm>
+#include <array>
+#include <charconv>
+#include <mutex>
+#include <utility>
+
+namespace ZU {
+
+const char* const kLingStructureKindNames[4] = {"nominal", "verb", "and", "or"};
+const char* const kLingGrammaticalFunctionNames[3] = {"subject", "direct object", "complement"};
+const char* const kLingColourNames[3] = {"blue", "green", "black"};
+
+namespace {
+
+using Chunk = ZULingSyntacticAnalyzerChunk;
+using Structure = ZULingSyntacticAnalyzerStructure;
+
+constexpr std::array<std::string_view, 14> kNegationWords = {
+    "ne",      "n",      "pas",     "not",    "shouldn't", "can't", "don't",
+    "doesn't", "didn't", "haven't", "hadn't", "hasn't",    "won't", "wouldn't"};
+
+// Coordinating words, compared with the lowercased chunk text. The Japanese particles
+// also mark case and questions: they coordinate nominal groups only.
+constexpr std::array<std::string_view, 8> kAndWords = {"and",  "et",     "と",     "や",
+                                                       "及び", "および", "並びに", "ならびに"};
+constexpr std::array<std::string_view, 10> kOrWords = {
+    "or", "ou", "か", "または", "又は", "あるいは", "或いは", "もしくは", "若しくは", "それとも"};
+constexpr std::array<std::string_view, 3> kParticles = {"と", "や", "か"};
+constexpr std::array<std::string_view, 4> kItemSeparators = {",", "、", "，", "､"};
+
+template <std::size_t N>
+bool isOneOf(std::string_view word, const std::array<std::string_view, N>& words) {
+  return std::find(words.begin(), words.end(), word) != words.end();
+}
+
+// The first bytes of the coordinating words: most words are none of them at once.
+constexpr std::array<bool, 256> coordinationFirstBytes() {
+  std::array<bool, 256> first{};
+  for (const std::string_view word : kAndWords)
+    first[static_cast<unsigned char>(word[0])] = true;
+  for (const std::string_view word : kOrWords)
+    first[static_cast<unsigned char>(word[0])] = true;
+  return first;
+}
+constexpr std::array<bool, 256> kCoordinationFirstBytes = coordinationFirstBytes();
+
+char lowerByte(char c) noexcept {
+  return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
+}
+
+std::string lowercase(std::string_view text) {
+  std::string lower(text);
+  for (char& c : lower)
+    c = lowerByte(c);
+  return lower;
+}
+
+// One character of UTF-8 text; a byte that does not start a valid sequence is a
+// character of its own.
+struct CodePoint {
+  char32_t value = 0;
+  std::size_t length = 1;
+};
+
+CodePoint decode(std::string_view s, std::size_t p) noexcept {
+  const auto b0 = static_cast<unsigned char>(s[p]);
+  if (b0 < 0x80)
+    return {b0, 1};
+  std::size_t length = 0;
+  char32_t value = 0;
+  if ((b0 & 0xE0) == 0xC0) {
+    length = 2;
+    value = b0 & 0x1Fu;
+  } else if ((b0 & 0xF0) == 0xE0) {
+    length = 3;
+    value = b0 & 0x0Fu;
+  } else if ((b0 & 0xF8) == 0xF0) {
+    length = 4;
+    value = b0 & 0x07u;
+  } else {
+    return {0xFFFD, 1};
+  }
+  if (p + length > s.size())
+    return {0xFFFD, 1};
+  for (std::size_t k = 1; k < length; ++k) {
+    const auto b = static_cast<unsigned char>(s[p + k]);
+    if ((b & 0xC0) != 0x80)
+      return {0xFFFD, 1};
+    value = (value << 6) | (b & 0x3Fu);
+  }
+  return {value, length};
+}
+
+bool isSpace(char32_t c) noexcept {
+  return c == ' ' || (c >= '\t' && c <= '\r') || c == 0xA0 || c == 0x1680 ||
+         (c >= 0x2000 && c <= 0x200B) || c == 0x2028 || c == 0x2029 || c == 0x202F || c == 0x205F ||
+         c == 0x3000;
+}
+
+// Apostrophes and hyphens: inside a word they link its parts, elsewhere they are
+// punctuation.
+bool isLink(char32_t c) noexcept {
+  return c == '\'' || c == '-' || c == 0x2019 || c == 0x2010 || c == 0x2011;
+}
+
+bool isPunctuation(char32_t c) noexcept {
+  if (c < 0x80)
+    return (c >= '!' && c <= '/') || (c >= ':' && c <= '@') || (c >= '[' && c <= '`') ||
+           (c >= '{' && c <= '~');
+  return c == 0xA1 || c == 0xA7 || c == 0xAB || c == 0xB6 || c == 0xB7 || c == 0xBB || c == 0xBF ||
+         (c >= 0x2010 && c <= 0x2027) || (c >= 0x2030 && c <= 0x205E) ||
+         (c >= 0x3001 && c <= 0x3004) || (c >= 0x3008 && c <= 0x3011) ||
+         (c >= 0x3014 && c <= 0x301F) || c == 0x3030 || c == 0x303D || c == 0x30FB ||
+         (c >= 0xFF01 && c <= 0xFF0F) || (c >= 0xFF1A && c <= 0xFF20) ||
+         (c >= 0xFF3B && c <= 0xFF40) || (c >= 0xFF5B && c <= 0xFF65);
+}
+
+bool isWordCharacter(char32_t c) noexcept {
+  return !isSpace(c) && !isPunctuation(c) && !isLink(c);
+}
+
+bool isDigit(char c) noexcept {
+  return c >= '0' && c <= '9';
+}
+
+bool isAsciiAlnum(char32_t c) noexcept {
+  return (c >= '0' && c <= '9') || (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z');
+}
+
+// The scripts whose unknown runs stay one chunk where words are not spaced.
+int unknownRunScript(char32_t c) noexcept {
+  if (isAsciiAlnum(c))
+    return 1;
+  if ((c >= 0x30A1 && c <= 0x30FA) || (c >= 0x30FC && c <= 0x30FE))
+    return 2;  // katakana and the prolonged sound mark
+  if ((c >= 0xFF10 && c <= 0xFF19) || (c >= 0xFF21 && c <= 0xFF3A) || (c >= 0xFF41 && c <= 0xFF5A))
+    return 3;  // full-width letters and digits
+  return 0;
+}
+
+// Cuts plain text (between the speech-engine tags) into chunks.
+//
+// At each word position the longest stored word starting there is taken. Where words
+// are spaced (the database's flag set, or no database), a stored word counts only when
+// it ends where the written word ends or with an apostrophe or hyphen (an elided "l'",
+// "n'", "qu'", which becomes the word and a link); otherwise the written word, up to the
+// next space, punctuation or link, is one unknown word. Numbers follow the digit rule.
+// Where words are not spaced (flag 0), the stored word is taken wherever it ends, and
+// unknown text is cut by character, except runs of latin letters and digits, of katakana
+// or of full-width letters, which stay whole.
+class Cutter {
+ public:
+  Cutter(const ZULingSyntacticAnalyzerBinaryDatabase* database, std::string_view text,
+         std::string_view lower, std::vector<Chunk>& chunks)
+      : fDatabase(database),
+        fText(text),
+        fLower(lower),
+        fChunks(chunks),
+        fSpaced(database == nullptr || database->flag != 0) {}
+
+  void cut(std::size_t begin, std::size_t end) {
+    bool afterWord = false;
+    std::size_t p = begin;
+    while (p < end) {
+      const CodePoint cp = decode(fText.substr(0, end), p);
+      if (isSpace(cp.value)) {
+        std::size_t q = p + cp.length;
+        while (q < end) {
+          const CodePoint next = decode(fText.substr(0, end), q);
+          if (!isSpace(next.value))
+            break;
+          q += next.length;
+        }
+        xPush(p, q, WORD_CLASS_INTERSPACE);
+        afterWord = false;
+        p = q;
+      } else if (isLink(cp.value) && afterWord && xWordStartsAt(p + cp.length, end)) {
+        xPush(p, p + cp.length, WORD_CLASS_LINK_BETWEEN_WORDS);
+        afterWord = false;
+        p += cp.length;
+      } else if (isPunctuation(cp.value) || isLink(cp.value)) {
+        // A repeated mark ("...", "!!!") is one chunk.
+        std::size_t q = p + cp.length;
+        while (q + cp.length <= end && fText.compare(q, cp.length, fText, p, cp.length) == 0)
+          q += cp.length;
+        xPush(p, q, WORD_CLASS_PUNCTUATION);
+        afterWord = false;
+        p = q;
+      } else {
+        p = fSpaced ? xSpacedWord(p, end, afterWord) : xUnspacedWord(p, end, cp);
+        if (!fSpaced)
+          afterWord = true;
+      }
+    }
+  }
+
+  void pushTag(std::size_t begin, std::size_t end) {
+    Chunk chunk;
+    chunk.text.reserve(end - begin + 2);
+    chunk.text += ' ';
+    chunk.text.append(fText, begin, end - begin);
+    chunk.text += ' ';
+    chunk.classes.push_back({WORD_CLASS_BOOKMARK, {}});
+    fChunks.push_back(std::move(chunk));
+  }
+
+ private:
+  bool xWordStartsAt(std::size_t p, std::size_t end) const {
+    return p < end && isWordCharacter(decode(fText.substr(0, end), p).value);
+  }
+
+  // The length of the longest stored word at p, and its node.
+  std::size_t xLongestStored(std::size_t p, std::size_t end,
+                             std::optional<std::uint32_t>& node) const {
+    std::size_t longest = 0;
+    if (fDatabase != nullptr)
+      node = fDatabase->findLongest(fLower.substr(0, end), p, longest);
+    return longest;
+  }
+
+  // The node of exactly these bytes, when they are a stored word.
+  std::optional<std::uint32_t> xStored(std::size_t begin, std::size_t end) const {
+    std::size_t longest = 0;
+    if (fDatabase == nullptr)
+      return std::nullopt;
+    return fDatabase->find(fLower.substr(begin, end - begin), 0, longest);
+  }
+
+  // Returns the position after what was taken; afterWord tells whether that ends with
+  // a word.
+  std::size_t xSpacedWord(std::size_t p, std::size_t end, bool& afterWord) {
+    afterWord = true;
+    if (isDigit(fText[p])) {
+      // Digits, with single spaces, commas or full stops between digits: "1 000",
+      // "3,5", "1,000.50".
+      std::size_t q = p;
+      while (q < end && isDigit(fText[q]))
+        ++q;
+      while (q + 1 < end && (fText[q] == ' ' || fText[q] == ',' || fText[q] == '.') &&
+             isDigit(fText[q + 1])) {
+        ++q;
+        while (q < end && isDigit(fText[q]))
+          ++q;
+      }
+      xPushWord(p, q, xStored(p, q));
+      return q;
+    }
+    std::optional<std::uint32_t> node;
+    const std::size_t stored = xLongestStored(p, end, node);
+    if (stored > 0) {
+      const std::size_t m = p + stored;
+      const char last = fLower[m - 1];
+      if ((last == '\'' || last == '-') && stored > 1) {
+        xPushWord(p, m - 1, xStored(p, m - 1));
+        xPush(m - 1, m, WORD_CLASS_LINK_BETWEEN_WORDS);
+        afterWord = false;
+        return m;
+      }
+      if (!xWordStartsAt(m, end)) {
+        xPushWord(p, m, node);
+        return m;
+      }
+    }
+    std::size_t q = p;
+    while (q < end) {
+      const CodePoint cp = decode(fText.substr(0, end), q);
+      if (!isWordCharacter(cp.value))
+        break;
+      q += cp.length;
+    }
+    // A stored word can be shorter than the longest stored prefix ("peut" of "peut-êtres").
+    xPushWord(p, q, stored > q - p ? xStored(p, q) : std::nullopt);
+    return q;
+  }
+
+  std::size_t xUnspacedWord(std::size_t p, std::size_t end, CodePoint cp) {
+    std::optional<std::uint32_t> node;
+    const std::size_t stored = xLongestStored(p, end, node);
+    if (stored > 0 &&
+        (p + stored == end || (static_cast<unsigned char>(fText[p + stored]) & 0xC0) != 0x80)) {
+      xPushWord(p, p + stored, node);
+      return p + stored;
+    }
+    std::size_t q = p + cp.length;
+    if (const int script = unknownRunScript(cp.value); script != 0) {
+      while (q < end) {
+        const CodePoint next = decode(fText.substr(0, end), q);
+        if (unknownRunScript(next.value) != script)
+          break;
+        q += next.length;
+      }
+    }
+    // Not stored: a stored word would have been the longest prefix.
+    xPushWord(p, q, std::nullopt);
+    return q;
+  }
+
+  void xPush(std::size_t begin, std::size_t end, ZULingWordClass wordClass) {
+    Chunk chunk;
+    chunk.text.assign(fText, begin, end - begin);
+    chunk.length = static_cast<std::int32_t>(end - begin);
+    chunk.classes.push_back({wordClass, {}});
+    fChunks.push_back(std::move(chunk));
+  }
+
+  void xPushWord(std::size_t begin, std::size_t end, std::optional<std::uint32_t> node) {
+    Chunk chunk;
+    chunk.text.assign(fText, begin, end - begin);
+    chunk.length = static_cast<std::int32_t>(end - begin);
+    if (node)
+      chunk.classes = fDatabase->wordClassesAt(*node);
+    else
+      chunk.classes.push_back({WORD_CLASS_UNKNOWN, {}});
+    chunk.node = node;
+    if (fText[begin] >= 'A' && fText[begin] <= 'Z') {
+      if (chunk.classes.size() == 1 && chunk.classes.front().wordClass == WORD_CLASS_UNKNOWN)
+        chunk.classes.front() = {WORD_CLASS_PROPER_NOUN, {}};
+      else
+        chunk.classes.push_back({WORD_CLASS_PROPER_NOUN, {}});
+    }
+    fChunks.push_back(std::move(chunk));
+  }
+
+  const ZULingSyntacticAnalyzerBinaryDatabase* fDatabase;
+  std::string_view fText;
+  std::string_view fLower;
+  std::vector<Chunk>& fChunks;
+  bool fSpaced;
+};
+
+// ---- structures --------------------------------------------------------------------
+
+// What a word does in its group, from its classes and its neighbours.
+enum class Role : std::uint8_t {
+  Noun,
+  Pronoun,
+  Determiner,
+  Adjective,
+  Adverb,
+  Verb,
+  Auxiliary,
+  Clitic,
+  Preposition,
+  Conjunction,
+  Subordinator,
+  Interjection,
+};
+
+Role roleOfClass(ZULingWordClass wordClass) noexcept {
+  switch (wordClass) {
+    case WORD_CLASS_ADJECTIVE:
+      return Role::Adjective;
+    case WORD_CLASS_ADVERB:
+      return Role::Adverb;
+    case WORD_CLASS_CONJUNCTIVE:
+      return Role::Conjunction;
+    case WORD_CLASS_SUB_CONJ:
+      return Role::Subordinator;
+    case WORD_CLASS_DETERMINANT:
+      return Role::Determiner;
+    case WORD_CLASS_INTERJECTION:
+      return Role::Interjection;
+    case WORD_CLASS_PREPOSITION:
+      return Role::Preposition;
+    case WORD_CLASS_PRONOUN:
+      return Role::Pronoun;
+    case WORD_CLASS_VERB:
+      return Role::Verb;
+    case WORD_CLASS_AUXILIARY:
+      return Role::Auxiliary;
+    case WORD_CLASS_PRONOUN_COMP:
+      return Role::Clitic;
+    default:
+      return Role::Noun;
+  }
+}
+
+bool isVerbal(Role role) noexcept {
+  return role == Role::Verb || role == Role::Auxiliary || role == Role::Clitic;
+}
+
+enum class Coordination : std::uint8_t { None, And, Or };
+
+// A word or a separator of the structure analysis; spaces, links and speech-engine tags
+// are left out, so they never part a group.
+struct Token {
+  enum Type : std::uint8_t { Word, Comma, Break };
+  Type type = Break;
+  std::size_t chunk = 0;
+  Role role = Role::Noun;
+  Coordination coordination = Coordination::None;
+  bool particle = false;
+  // The word lowercased, in the builder's buffer.
+  std::string_view lower;
+  std::uint32_t records = 0;  // bit per word class the word has
+  bool infinitive = false;    // a verb record of the infinitive
+
+  bool has(ZULingWordClass wordClass) const noexcept { return (records >> wordClass) & 1u; }
+};
+
+struct Group {
+  std::size_t firstToken = 0;
+  std::size_t lastToken = 0;
+  ZULingStructureKind kind = STRUCTURE_NOMINAL;
+  Role lastRole = Role::Noun;
+  bool used = false;
+};
+
+class StructureBuilder {
+ public:
+  StructureBuilder(const std::vector<Chunk>& chunks, bool spaced)
+      : fChunks(chunks), fSpaced(spaced) {}
+
+  std::vector<Structure> build() {
+    xTokens();
+    if (fSpaced)
+      xSpacedRoles();
+    else
+      xUnspacedRoles();
+    xGroups();
+    // Both lists are in text order.
+    std::vector<Structure> coordinations = xCoordinations();
+    std::vector<Structure> structures;
+    structures.reserve(fGroups.size());
+    auto next = coordinations.begin();
+    for (const Group& group : fGroups) {
+      if (group.used)
+        continue;
+      Structure structure = xGroupStructure(group);
+      for (; next != coordinations.end() && next->first < structure.first; ++next)
+        structures.push_back(std::move(*next));
+      structures.push_back(std::move(structure));
+    }
+    for (; next != coordinations.end(); ++next)
+      structures.push_back(std::move(*next));
+    return structures;
+  }
+
+ private:
+  static constexpr std::size_t kNone = static_cast<std::size_t>(-1);
+
+  void xTokens() {
+    std::size_t bytes = 0;
+    for (const Chunk& chunk : fChunks)
+      bytes += chunk.text.size();
+    fLower.reserve(bytes);
+    for (std::size_t c = 0; c < fChunks.size(); ++c) {
+      const Chunk& chunk = fChunks[c];
+      const ZULingWordClass wordClass = chunk.wordClass();
+      if (wordClass == WORD_CLASS_PUNCTUATION) {
+        Token token;
+        token.type = chunk.text.size() <= 3 && isOneOf(chunk.text, kItemSeparators) ? Token::Comma
+                                                                                    : Token::Break;
+        token.chunk = c;
+        fTokens.push_back(std::move(token));
+        continue;
+      }
+      if (wordClass < WORD_CLASS_UNKNOWN)
+        continue;
+      Token token;
+      token.type = Token::Word;
+      token.chunk = c;
+      const std::size_t from = fLower.size();
+      for (const char b : chunk.text)
+        fLower += lowerByte(b);
+      token.lower = std::string_view(fLower).substr(from);
+      token.role = roleOfClass(wordClass);
+      for (const ZULingClassFeatures& record : chunk.classes) {
+        if (record.wordClass >= 0 && record.wordClass < 32)
+          token.records |= 1u << record.wordClass;
+        if (record.wordClass == WORD_CLASS_VERB && record.features.find('W') != std::string::npos)
+          token.infinitive = true;
+      }
+      if (kCoordinationFirstBytes[static_cast<unsigned char>(token.lower[0])]) {
+        if (isOneOf(token.lower, kAndWords))
+          token.coordination = Coordination::And;
+        else if (isOneOf(token.lower, kOrWords))
+          token.coordination = Coordination::Or;
+        token.particle = isOneOf(token.lower, kParticles);
+      }
+      if (token.coordination != Coordination::None)
+        token.role = Role::Conjunction;
+      else if (lingIsNegationWord(chunk.text) && !isVerbal(token.role))
+        token.role = Role::Adverb;
+      fTokens.push_back(std::move(token));
+    }
+  }
+
+  bool xIsWord(std::size_t t) const { return t < fTokens.size() && fTokens[t].type == Token::Word; }
+
+  // Where words are spaced: the first class is the word's guess, which its neighbours
+  // correct. After a comma or a coordinating word, a word that can be read as the word
+  // before the separator is read so ("speak, listen and move", "pommes et prunes"). A
+  // word read as a noun or preposition after a subject, an auxiliary or an object
+  // pronoun (adverbs between), or after "to", is a verb when it can be one ("I like
+  // apples"); after a determiner, an adjective or a preposition, a verb that can be a
+  // noun is one ("les pommes", "the walk"), unless an infinitive follows a preposition
+  // ("de manger"); a determiner that can be an object pronoun before a verb is one ("je
+  // le mange").
+  void xSpacedRoles() {
+    enum class List : std::uint8_t { None, Nominal, Verbal };
+    const auto listOf = [](Role role) {
+      if (role == Role::Verb || role == Role::Auxiliary)
+        return List::Verbal;
+      if (role == Role::Noun || role == Role::Pronoun || role == Role::Adjective ||
+          role == Role::Determiner)
+        return List::Nominal;
+      return List::None;
+    };
+    bool verbContext = false;
+    List list = List::None;
+    Role previous = Role::Conjunction;
+    Role lastContent = Role::Conjunction;
+    std::string_view previousWord;
+    for (std::size_t t = 0; t < fTokens.size(); ++t) {
+      Token& token = fTokens[t];
+      if (token.type != Token::Word) {
+        verbContext = false;
+        list = token.type == Token::Comma ? listOf(lastContent) : List::None;
+        previousWord = {};
+        continue;
+      }
+      if (token.coordination != Coordination::None) {
+        verbContext = false;
+        list = listOf(lastContent);
+        previous = token.role;
+        previousWord = token.lower;
+        continue;
+      }
+      Role role = token.role;
+      const bool nounContext = t > 0 && xIsWord(t - 1) &&
+                               (previous == Role::Determiner || previous == Role::Adjective ||
+                                (previous == Role::Preposition && previousWord != "to"));
+      const bool canBeVerb = token.has(WORD_CLASS_VERB);
+      const bool canBeNoun = token.has(WORD_CLASS_NOUN);
+      if (list == List::Verbal && canBeVerb &&
+          (role == Role::Noun || role == Role::Preposition || role == Role::Adjective)) {
+        role = Role::Verb;
+      } else if (list == List::Nominal && canBeNoun &&
+                 (role == Role::Verb || role == Role::Auxiliary)) {
+        role = Role::Noun;
+      } else if ((role == Role::Verb || role == Role::Auxiliary) && canBeNoun && !verbContext &&
+                 nounContext && !(previous == Role::Preposition && token.infinitive)) {
+        role = Role::Noun;
+      } else if ((role == Role::Noun || role == Role::Preposition) && canBeVerb &&
+                 (verbContext || previousWord == "to")) {
+        role = Role::Verb;
+      }
+      if (role == Role::Determiner && token.has(WORD_CLASS_PRONOUN_COMP) && xIsWord(t + 1)) {
+        const Token& next = fTokens[t + 1];
+        if ((next.has(WORD_CLASS_VERB) || next.has(WORD_CLASS_AUXILIARY)) &&
+            !next.has(WORD_CLASS_NOUN) && !next.has(WORD_CLASS_ADJECTIVE))
+          role = Role::Clitic;
+      }
+      token.role = role;
+      verbContext = role == Role::Pronoun || role == Role::Auxiliary || role == Role::Clitic ||
+                    (verbContext && role == Role::Adverb);
+      if (role != Role::Adverb && role != Role::Determiner)
+        list = List::None;
+      if (listOf(role) != List::None)
+        lastContent = role;
+      previous = role;
+      previousWord = token.lower;
+    }
+  }
+
+  // Where words are not spaced (Japanese): after a verb or an auxiliary, a word that
+  // can be an auxiliary is one ("食べ" + "ない").
+  void xUnspacedRoles() {
+    for (std::size_t t = 1; t < fTokens.size(); ++t) {
+      Token& token = fTokens[t];
+      if (token.type != Token::Word || !xIsWord(t - 1))
+        continue;
+      const Role previous = fTokens[t - 1].role;
+      if ((previous == Role::Verb || previous == Role::Auxiliary) &&
+          token.has(WORD_CLASS_AUXILIARY) && token.role != Role::Verb &&
+          token.coordination == Coordination::None)
+        token.role = Role::Auxiliary;
+    }
+  }
+
+  Role xNextWordRole(std::size_t t) const {
+    return xIsWord(t + 1) ? fTokens[t + 1].role : Role::Conjunction;
+  }
+
+  // Groups: runs of nominal words (determiners, adjectives, nouns, pronouns) and runs of
+  // verbal words (verbs, auxiliaries, object pronouns, adverbs), with an adverb joining
+  // the nominal group of the adjective or noun it stands before. Prepositions,
+  // conjunctions, commas and other punctuation part groups; an interjection is a group
+  // of its own.
+  void xGroups() {
+    fGroupOfToken.assign(fTokens.size(), kNone);
+    std::size_t current = kNone;
+    const auto start = [&](std::size_t t, ZULingStructureKind kind) {
+      fGroups.push_back({t, t, kind, fTokens[t].role, false});
+      current = fGroups.size() - 1;
+      fGroupOfToken[t] = current;
+    };
+    const auto extend = [&](std::size_t t) {
+      fGroups[current].lastToken = t;
+      fGroups[current].lastRole = fTokens[t].role;
+      fGroupOfToken[t] = current;
+    };
+    const auto currentKind = [&]() {
+      return current == kNone ? STRUCTURE_AND : fGroups[current].kind;
+    };
+    for (std::size_t t = 0; t < fTokens.size(); ++t) {
+      const Token& token = fTokens[t];
+      if (token.type != Token::Word) {
+        current = kNone;
+        continue;
+      }
+      switch (token.role) {
+        case Role::Subordinator:
+          // "食べ" + "て" + "いる": inside a verb group where words are not spaced.
+          if (!fSpaced && currentKind() == STRUCTURE_VERB && isVerbal(xNextWordRole(t))) {
+            extend(t);
+            break;
+          }
+          current = kNone;
+          break;
+        case Role::Preposition:
+        case Role::Conjunction:
+          current = kNone;
+          break;
+        case Role::Interjection:
+          start(t, STRUCTURE_NOMINAL);
+          current = kNone;
+          break;
+        case Role::Verb:
+        case Role::Auxiliary:
+        case Role::Clitic:
+          if (currentKind() == STRUCTURE_VERB)
+            extend(t);
+          else
+            start(t, STRUCTURE_VERB);
+          break;
+        case Role::Adverb: {
+          const Role next = xNextWordRole(t);
+          if (currentKind() == STRUCTURE_VERB)
+            extend(t);
+          else if (next == Role::Adjective || next == Role::Adverb || next == Role::Determiner ||
+                   next == Role::Noun)
+            currentKind() == STRUCTURE_NOMINAL ? extend(t) : start(t, STRUCTURE_NOMINAL);
+          else
+            start(t, STRUCTURE_VERB);
+          break;
+        }
+        default: {
+          // Nominal words. Where words are spaced, a determiner or a pronoun after a
+          // noun or pronoun, or a word after a pronoun, begins another group.
+          bool same = currentKind() == STRUCTURE_NOMINAL;
+          if (same && fSpaced) {
+            const Role last = fGroups[current].lastRole;
+            if (((last == Role::Noun || last == Role::Pronoun) &&
+                 (token.role == Role::Determiner || token.role == Role::Pronoun)) ||
+                last == Role::Pronoun)
+              same = false;
+          }
+          same ? extend(t) : start(t, STRUCTURE_NOMINAL);
+          break;
+        }
+      }
+    }
+  }
+
+  std::size_t xGroupStartingAt(std::size_t t) const {
+    if (t >= fTokens.size() || fGroupOfToken[t] == kNone)
+      return kNone;
+    const std::size_t g = fGroupOfToken[t];
+    return fGroups[g].firstToken == t && !fGroups[g].used ? g : kNone;
+  }
+
+  std::size_t xGroupEndingAt(std::size_t t) const {
+    if (t >= fTokens.size() || fGroupOfToken[t] == kNone)
+      return kNone;
+    const std::size_t g = fGroupOfToken[t];
+    return fGroups[g].lastToken == t && !fGroups[g].used ? g : kNone;
+  }
+
+  bool xIsPreposition(std::size_t t) const {
+    return fSpaced && xIsWord(t) && fTokens[t].role == Role::Preposition;
+  }
+
+  struct Item {
+    std::size_t firstToken;
+    std::size_t group;
+  };
+
+  // The item that begins at token t: a group, with a preposition before it where words
+  // are spaced ("in Paris, in London and in Tokyo").
+  bool xItemAt(std::size_t t, Item& item) const {
+    const std::size_t from = xIsPreposition(t) ? t + 1 : t;
+    const std::size_t g = xGroupStartingAt(from);
+    if (g == kNone)
+      return false;
+    item = {t, g};
+    return true;
+  }
+
+  // The item that ends at token t.
+  bool xItemBefore(std::size_t t, Item& item) const {
+    const std::size_t g = xGroupEndingAt(t);
+    if (g == kNone)
+      return false;
+    const std::size_t first = fGroups[g].firstToken;
+    item = {first > 0 && xIsPreposition(first - 1) ? first - 1 : first, g};
+    return true;
+  }
+
+  // Coordinations: around each "and" or "or" word, the item after it (more items after
+  // further same words) and the items before it, separated by commas or by the same
+  // word ("apples, pears and plums", "A と B と C"); all items are groups of one kind,
+  // nominal for the Japanese particles. Items begin with a preposition only when the
+  // last one does; otherwise a preposition ends the list. A pronoun after the word that begins a
+  // clause
+  // ("I like tea and he likes coffee") coordinates nothing.
+  std::vector<Structure> xCoordinations() {
+    std::vector<Structure> structures;
+    std::vector<bool> consumed(fTokens.size(), false);
+    for (std::size_t c = 0; c < fTokens.size(); ++c) {
+      const Token& word = fTokens[c];
+      if (word.type != Token::Word || word.coordination == Coordination::None || consumed[c])
+        continue;
+      std::vector<Item> after;
+      Item item{};
+      if (!xItemAt(c + 1, item))
+        continue;
+      const ZULingStructureKind kind = fGroups[item.group].kind;
+      if (word.particle && kind != STRUCTURE_NOMINAL)
+        continue;
+      after.push_back(item);
+      std::vector<std::size_t> words{c};
+      for (std::size_t k = fGroups[item.group].lastToken + 1;
+           xIsWord(k) && fTokens[k].coordination == word.coordination && xItemAt(k + 1, item) &&
+           fGroups[item.group].kind == kind;
+           k = fGroups[item.group].lastToken + 1) {
+        words.push_back(k);
+        after.push_back(item);
+      }
+      std::vector<Item> before;
+      std::size_t end = c;
+      if (end > 0 && fTokens[end - 1].type == Token::Comma && fSpaced)
+        --end;  // "apples, pears, and plums"
+      const bool prepositions = after.front().firstToken != fGroups[after.front().group].firstToken;
+      while (end > 0 && xItemBefore(end - 1, item) && fGroups[item.group].kind == kind) {
+        if (item.firstToken != fGroups[item.group].firstToken && !prepositions) {
+          // "for example apples, pears and plums": the preposition leads the list.
+          item.firstToken = fGroups[item.group].firstToken;
+          before.push_back(item);
+          break;
+        }
+        before.push_back(item);
+        if (item.firstToken == 0)
+          break;
+        const std::size_t separator = item.firstToken - 1;
+        const Token& s = fTokens[separator];
+        if (s.type == Token::Comma) {
+          end = separator;
+        } else if (s.type == Token::Word && s.coordination == word.coordination &&
+                   !consumed[separator]) {
+          words.push_back(separator);
+          end = separator;
+        } else {
+          break;
+        }
+      }
+      if (before.empty())
+        continue;
+      if (fSpaced && xStartsClause(after.front(), before.back()))
+        continue;
+      for (std::size_t w : words)
+        consumed[w] = true;
+      Structure structure;
+      structure.kind = word.coordination == Coordination::And ? STRUCTURE_AND : STRUCTURE_OR;
+      structure.first = fTokens[before.back().firstToken].chunk;
+      structure.last = fTokens[fGroups[after.back().group].lastToken].chunk;
+      std::reverse(before.begin(), before.end());
+      before.insert(before.end(), after.begin(), after.end());
+      for (const Item& i : before) {
+        fGroups[i.group].used = true;
+        structure.children.push_back(xGroupStructure(fGroups[i.group]));
+      }
+      structure.itemCount = static_cast<std::int32_t>(before.size());
+      structure.notNegated = xNotNegated(structure.first, structure.last);
+      structures.push_back(std::move(structure));
+    }
+    return structures;
+  }
+
+  // A lone pronoun after the coordinating word, followed by a verb, while the first
+  // item follows a verb: two clauses, not a list.
+  bool xStartsClause(const Item& right, const Item& firstLeft) const {
+    const Group& group = fGroups[right.group];
+    if (group.firstToken != group.lastToken || fTokens[group.firstToken].role != Role::Pronoun)
+      return false;
+    const std::size_t next = group.lastToken + 1;
+    if (next >= fTokens.size() || fGroupOfToken[next] == kNone ||
+        fGroups[fGroupOfToken[next]].kind != STRUCTURE_VERB)
+      return false;
+    const std::size_t previous = firstLeft.firstToken;
+    return previous > 0 && fGroupOfToken[previous - 1] != kNone &&
+           fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB;
+  }
+
+  Structure xGroupStructure(const Group& group) const {
+    Structure structure;
+    structure.kind = group.kind;
+    structure.first = fTokens[group.firstToken].chunk;
+    structure.last = fTokens[group.lastToken].chunk;
+    structure.notNegated = xNotNegated(structure.first, structure.last);
+    return structure;
+  }
+
+  bool xNotNegated(std::size_t first, std::size_t last) const {
+    for (std::size_t c = first; c <= last; ++c) {
+      if (lingIsNegationWord(fChunks[c].text))
+        return false;
+    }
+    return true;
+  }
+
+  const std::vector<Chunk>& fChunks;
+  bool fSpaced;
+  std::string fLower;
+  std::vector<Token> fTokens;
+  std::vector<Group> fGroups;
+  std::vector<std::size_t> fGroupOfToken;
+};
+
+}  // namespace
+
+bool lingIsNegationWord(std::string_view chunkText) noexcept {
+  // Most chunks are none of them at once.
+  if (chunkText.empty() || chunkText.size() > 9)
+    return false;
+  switch (chunkText[0]) {
+    case 'n':
+    case 'p':
+    case 's':
+    case 'c':
+    case 'd':
+    case 'h':
+    case 'w':
+      return isOneOf(chunkText, kNegationWords);
+    default:
+      return false;
+  }
+}
+
+ZULingSpeechTag lingSpeechTag(const ZULingSyntacticAnalyzerChunk& chunk) noexcept {
+  ZULingSpeechTag tag;
+  const std::string_view text = chunk.text;
+  if (chunk.wordClass() != WORD_CLASS_BOOKMARK || text.size() < 4)
+    return tag;
+  // " \name=value\ "
+  const std::string_view inner = text.substr(2, text.size() - 4);
+  const std::size_t equals = inner.find('=');
+  tag.name = inner.substr(0, equals);
+  if (equals == std::string_view::npos)
+    return tag;
+  const std::string_view value = inner.substr(equals + 1);
+  std::int64_t number = 0;
+  const auto [end, error] = std::from_chars(value.data(), value.data() + value.size(), number);
+  if (error != std::errc() || end != value.data() + value.size() || value.empty() || number < 0)
+    return tag;
+  if (tag.name == "mrk" || tag.name == "mrkpause")
+    tag.kind = ZULingSpeechTag::Bookmark;
+  else if (tag.name == "pau")
+    tag.kind = ZULingSpeechTag::Pause;
+  tag.value = number;
+  return tag;
+}
+
+ZULingSyntacticAnalyzer::ZULingSyntacticAnalyzer(std::shared_ptr<const ZULingLanguageMap> languages)
+    : fDatabase(std::move(languages)) {}
+
+void ZULingSyntacticAnalyzer::setLanguage(const std::string& language) {
+  fDatabase.setLanguage(language);
+}
+
+ZULingSyntacticAnalysis ZULingSyntacticAnalyzer::analyse(std::string_view text) const {
+  ZULingSyntacticAnalysis analysis;
+  const std::string lower = lowercase(text);
+  const std::lock_guard<std::mutex> lock(ZULingDatabaseCache::mutex());
+  analysis.database = fDatabase.database();
+  analysis.chunks.reserve(text.size() / 3 + 4);
+  Cutter cutter(analysis.database.get(), text, lower, analysis.chunks);
+
+  // Speech-engine tags: from a backslash to the next one, with no space between.
+  std::size_t plainFrom = 0;
+  std::size_t pos = 0;
+  while (pos < text.size()) {
+    const std::size_t s = text.find('\\', pos);
+    if (s == std::string_view::npos)
+      break;
+    std::size_t e = s + 1;
+    while (e < text.size() && text[e] != '\\' && text[e] != ' ')
+      ++e;
+    if (e == text.size()) {
+      pos = s + 1;
+      continue;
+    }
+    if (text[e] == ' ') {
+      pos = e;
+      continue;
+    }
+    cutter.cut(plainFrom, s);
+    cutter.pushTag(s, e + 1);
+    plainFrom = pos = e + 1;
+  }
+  cutter.cut(plainFrom, text.size());
+
+  const bool spaced = analysis.database == nullptr || analysis.database->flag != 0;
+  analysis.structures = StructureBuilder(analysis.chunks, spaced).build();
+  return analysis;
+}
+
+}  // namespace ZU

@@ -1,0 +1,473 @@
+// The syntactic analysis and the automatic tags: the tokeniser, the structures, the
+// look-back and the anticipation of the tags, the write-back, and the emotion of a text,
+// on small databases that mkbdb builds; plus a few sentences on the real databases.
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <atomic>
+#include <filesystem>
+#include <fstream>
+#include <set>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "ko/path.hpp"
+#include "mkbdb/writer.h"
+#include "mokuto/zulingsyntacticanalyzer.h"
+#include "mokuto/zulingsyntacticanalyzertagger.h"
+#include "mokuto/zumokutoparser.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+using namespace ZU;
+
+constexpr const char* kEnglish =
+    "i\tpronoun/1s=i\n"
+    "he\tpronoun/3ms=he\n"
+    "like\tpreposition=like\tverb/WP=like\n"
+    "likes\tverb/P3s=like\n"
+    "apples\tnoun/p\n"
+    "pears\tnoun/p\n"
+    "plums\tnoun/p\n"
+    "tea\tnoun/s\n"
+    "coffee\tnoun/s\n"
+    "and\tconjunctive\n"
+    "or\tconjunctive\n"
+    "in\tpreposition\n"
+    "of\tpreposition\n"
+    "for\tpreposition\n"
+    "don't\tauxiliary/n=do\n"
+    "the\tdeterminant\n"
+    "big\tadjective=big\n"
+    "thinking\tverb/G=think\tnoun/s=thinking\n"
+    "hello\tinterjection=hello\n"
+    "the\tdeterminant\n"
+    "aujourd'hui\tadverb\n"
+    "peut-être\tadverb\n"
+    "je\tpronoun/1s=je\n"
+    "ne\tadverb/n=ne\n"
+    "n\tadverb/n=ne\n"
+    "n'\tadverb/n=ne\n"
+    "l\tdeterminant/s=le\n"
+    "l'\tdeterminant/s=le\n"
+    "homme\tnoun/ms=homme\n"
+    "mange\tverb/P3s=manger\n"
+    "pas\tadverb/n=pas\n"
+    "les\tdeterminant/p=le\tpronoun_comp/3p=le\n"
+    "pommes\tverb/PS2s=pommer\tnoun/fp=pomme\n"
+    "poires\tnoun/fp=poire\n"
+    "et\tconjunctive\n";
+
+constexpr const char* kJapanese =
+    "りんご\tnoun=りんご\n"
+    "バナナ\tnoun=バナナ\n"
+    "みかん\tnoun=みかん\n"
+    "と\tpreposition=と\tconjunctive=と\n"
+    "が\tpreposition=が\n"
+    "好き\tadjective=好き\n"
+    "です\tauxiliary=です\n"
+    "食べ\tverb=食べる\n"
+    "ない\tadjective=ない\tauxiliary/n=ない\n";
+
+constexpr const char* kEmotions =
+    "happy\tunkonwn=positive\n"
+    "great\tunkonwn=very positive\n"
+    "sad\tunkonwn=negative\n"
+    "awful\tunkonwn=very negative\n"
+    "very\tunkonwn=strong adverb\n"
+    "not\tunkonwn=negation\n"
+    "don't\tunkonwn=negation\n";
+
+class AnalysisTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    static std::atomic<int> counter{0};
+    dir_ = fs::temp_directory_path() /
+           ("analysis-" + std::to_string(::getpid()) + "-" + std::to_string(counter++));
+    fs::create_directories(dir_);
+    auto languages = std::make_shared<ZULingLanguageMap>();
+    (*languages)["English"] = write("en.bdb", kEnglish, 1);
+    (*languages)["Unspaced"] = write("en0.bdb", kEnglish, 0);
+    (*languages)["Japanese"] = write("ja.bdb", kJapanese, 0);
+    (*languages)["EnglishEmotions"] = write("emotions.bdb", kEmotions, 1);
+    languages_ = languages;
+    config_.msPauseBeforeSpeech = 0;
+    tagging_ = std::make_unique<ZULingAutomaticTagging>(languages_);
+  }
+  void TearDown() override { fs::remove_all(dir_); }
+
+  std::string write(const std::string& name, const std::string& lexiconText, std::uint8_t flag) {
+    mkbdb::Lexicon lexicon;
+    std::istringstream in(lexiconText);
+    mkbdb::readLexicon(in, name, lexicon);
+    mkbdb::Options options;
+    options.flag = flag;
+    mkbdb::Report report;
+    const std::string path = (dir_ / name).string();
+    std::ofstream(path, std::ios::binary) << mkbdb::build(lexicon, options, report);
+    return path;
+  }
+
+  ZULingSyntacticAnalysis analyse(const std::string& text,
+                                  const std::string& language = "English") {
+    ZULingSyntacticAnalyzer analyzer(languages_);
+    analyzer.setLanguage(language);
+    return analyzer.analyse(text);
+  }
+
+  // Parses the text and adds its automatic tags, as the compiler stage does.
+  std::shared_ptr<MKTaskInstruction> compile(const std::string& text,
+                                             const std::string& language = "English", MKID id = 1) {
+    auto job = std::make_shared<MKTaskInstruction>(id, text, config_, Standing);
+    ZUMokutoParser().parse(job, text, language == "Japanese");
+    tagging_->process(*job, language);
+    return job;
+  }
+
+  static std::vector<std::string> autoTags(const MKTaskInstruction& job) {
+    std::vector<std::string> tags;
+    for (const auto& action : job.actions) {
+      if (action->type == AUTO_START_TAG)
+        tags.push_back(static_cast<const MKAnimationAction&>(*action).tag);
+    }
+    return tags;
+  }
+
+  fs::path dir_;
+  std::shared_ptr<const ZULingLanguageMap> languages_;
+  MokutoConfig config_;
+  std::unique_ptr<ZULingAutomaticTagging> tagging_;
+};
+
+// "kind[words]", "!" for a negated structure, the item count after "and" and "or".
+std::string describe(const ZULingSyntacticAnalysis& analysis) {
+  std::string out;
+  for (const auto& s : analysis.structures) {
+    out += out.empty() ? "" : " ";
+    out += kLingStructureKindNames[s.kind];
+    if (s.kind >= STRUCTURE_AND)
+      out += std::to_string(s.itemCount);
+    out += s.notNegated ? "[" : "![";
+    std::string words;
+    for (std::size_t c = s.first; c <= s.last; ++c) {
+      if (analysis.chunks[c].isWord())
+        words += (words.empty() ? "" : " ") + analysis.chunks[c].text;
+    }
+    out += words + "]";
+  }
+  return out;
+}
+
+TEST_F(AnalysisTest, TheTokeniserCutsTagsSpacesLinksPunctuationAndWords) {
+  using Chunks = std::vector<std::pair<std::string, ZULingWordClass>>;
+  struct Case {
+    std::string language;
+    std::string text;
+    Chunks chunks;
+  };
+  const std::vector<Case> cases = {
+      {"English",
+       "Hello \\mrk=1\\ the\\pau=300\\",
+       {{"Hello", 10}, {" ", 1}, {" \\mrk=1\\ ", 0}, {" ", 1}, {"the", 9}, {" \\pau=300\\ ", 0}}},
+      // A backslash before a space, or never closed, is no tag.
+      {"English",
+       "a \\ b \\mrk=1",
+       {{"a", 4},
+        {" ", 1},
+        {"\\", 3},
+        {" ", 1},
+        {"b", 4},
+        {" ", 1},
+        {"\\", 3},
+        {"mrk", 4},
+        {"=", 3},
+        {"1", 4}}},
+      // Stored words with links, elisions, a written word longer than a stored prefix.
+      {"English",
+       "don't aujourd'hui peut-être l'homme theme",
+       {{"don't", 15},
+        {" ", 1},
+        {"aujourd'hui", 6},
+        {" ", 1},
+        {"peut-être", 6},
+        {" ", 1},
+        {"l", 9},
+        {"'", 2},
+        {"homme", 11},
+        {" ", 1},
+        {"theme", 4}}},
+      {"English",
+       "pear-shaped n'a",
+       {{"pear", 4}, {"-", 2}, {"shaped", 4}, {" ", 1}, {"n", 6}, {"'", 2}, {"a", 4}}},
+      // The digit rule and repeated marks.
+      {"English",
+       "1 000,50 or 3.5!!! (2)",
+       {{"1 000,50", 4},
+        {" ", 1},
+        {"or", 7},
+        {" ", 1},
+        {"3.5", 4},
+        {"!!!", 3},
+        {" ", 1},
+        {"(", 3},
+        {"2", 4},
+        {")", 3}}},
+      // Capitals: a known word keeps its class first, an unknown one is a proper noun.
+      {"English", "The Paris", {{"The", 9}, {" ", 1}, {"Paris", 17}}},
+      // Unspaced: the longest stored word wherever it ends; unknown runs of katakana or
+      // latin letters stay whole, other unknown characters go one by one.
+      {"Japanese",
+       "りんごとペッパーが好き。Pepper犬",
+       {{"りんご", 11},
+        {"と", 12},
+        {"ペッパー", 4},
+        {"が", 12},
+        {"好き", 5},
+        {"。", 3},
+        {"Pepper", 17},
+        {"犬", 4}}},
+      {"Unspaced", "ithe theme", {{"i", 13}, {"the", 9}, {" ", 1}, {"the", 9}, {"me", 4}}},
+      // Without a database every word is unknown.
+      {"Klingon", "Hello world", {{"Hello", 17}, {" ", 1}, {"world", 4}}},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.language + ": " + c.text);
+    const ZULingSyntacticAnalysis analysis = analyse(c.text, c.language);
+    Chunks chunks;
+    for (const auto& chunk : analysis.chunks)
+      chunks.emplace_back(chunk.text, chunk.wordClass());
+    EXPECT_EQ(chunks, c.chunks);
+  }
+  // A proper noun is appended to a known word's classes.
+  const auto the = analyse("The").chunks.at(0).classes;
+  EXPECT_EQ(the, (std::vector<ZULingClassFeatures>{{WORD_CLASS_DETERMINANT, ""},
+                                                   {WORD_CLASS_PROPER_NOUN, ""}}));
+}
+
+TEST_F(AnalysisTest, StructuresGroupWordsAndFindCoordinations) {
+  const std::vector<std::pair<std::string, std::string>> cases = {
+      {"I like apples, pears and plums", "nominal[I] verb[like] and3[apples pears and plums]"},
+      {"apples, pears, and plums", "and3[apples pears and plums]"},
+      {"apples and pears and plums", "and3[apples and pears and plums]"},
+      {"tea or coffee", "or2[tea or coffee]"},
+      {"I don't like tea", "nominal[I] verb![don't like] nominal[tea]"},
+      {"I like tea and he likes coffee",
+       "nominal[I] verb[like] nominal[tea] nominal[he] verb[likes] nominal[coffee]"},
+      {"in Paris, in London and in Tokyo", "and3[in Paris in London and in Tokyo]"},
+      {"a, b, c, d, e and f", "and6[a b c d e and f]"},
+      {"the big apples, hello", "nominal[the big apples] nominal[hello]"},
+      {"and plums, or", "nominal[plums]"},
+      {"je ne mange pas les pommes et les poires",
+       "nominal[je] verb![ne mange pas] and2[les pommes et les poires]"},
+  };
+  for (const auto& [text, expected] : cases)
+    EXPECT_EQ(describe(analyse(text)), expected) << text;
+  EXPECT_EQ(describe(analyse("りんご、バナナとみかんが好きです", "Japanese")),
+            "and3[りんご バナナ と みかん] nominal[好き] verb[です]");
+  EXPECT_EQ(describe(analyse("食べない", "Japanese")), "verb[食べ ない]");
+  EXPECT_TRUE(lingIsNegationWord("wouldn't"));
+  EXPECT_FALSE(lingIsNegationWord("Not"));
+}
+
+TEST_F(AnalysisTest, StructuresProposeTheirTags) {
+  const std::vector<std::pair<std::string, std::vector<std::string>>> cases = {
+      {"apples and pears", {"two"}},         {"apples, pears and plums", {"three"}},
+      {"a, b, c and d", {"four"}},           {"a, b, c, d and e", {"five"}},
+      {"a, b, c, d, e and f", {}},           {"tea or coffee", {"pick"}},
+      {"I don't like tea", {"i", "oppose"}}, {"hello, the big thinking", {"hello", "big", "think"}},
+  };
+  // With the flag, tags that go back to the same word start come in reverse order.
+  for (const auto& [text, tags] : cases) {
+    auto proposed = autoTags(*compile(text));
+    std::reverse(proposed.begin(), proposed.end());
+    EXPECT_EQ(proposed, tags) << text;
+  }
+}
+
+// A caller's gesture or blocking sound keeps automatic tags away for 1300 ms of speech
+// after its bookmark; other actions do not.
+TEST_F(AnalysisTest, TheLookBackDropsTagsNearTheCallersGestures) {
+  EXPECT_THAT(autoTags(*compile("^start(a) I like apples, pears and plums")), ::testing::IsEmpty());
+  EXPECT_THAT(autoTags(*compile("^start(a) I like many different kinds of fruit, for example "
+                                "apples, pears and plums")),
+              ::testing::ElementsAre("three"));
+  const std::vector<std::pair<std::string, bool>> instructions = {
+      {"^startTag(t)", false},    {"^start(a)", false},
+      {"^runTag(t)", false},      {"^run(a)", false},
+      {"^wait(a)", false},        {"^waitTag(t)", false},
+      {"^waitSound(s/n)", false}, {"^runSound(s/n)", false},
+      {"^stop(a)", true},         {"^stopTag(t)", true},
+      {"^mode(random)", true},    {"^startSound(s/n)", true},
+      {"^stopSound(s/n)", true},  {"^call(M.m())", true},
+      {"^pCall(M.m())", true},    {"$x=1", true},
+      {"^foo(x)", true},          {"\\mrk=9\\", true},
+  };
+  for (const auto& [instruction, tagged] : instructions) {
+    const auto job = compile(instruction + " apples, pears and plums");
+    EXPECT_EQ(autoTags(*job).size(), tagged ? 1u : 0u) << instruction;
+  }
+  // A pause counts its milliseconds.
+  EXPECT_THAT(autoTags(*compile("^start(a) \\pau=1300\\ apples and pears")),
+              ::testing::ElementsAre("two"));
+}
+
+TEST_F(AnalysisTest, BookmarksStandBeforeTheirWordOrAheadWithTheFlag) {
+  const std::string text = "I like many kinds of fruit: apples, pears and plums";
+  // Without the flag, right before the enumeration; with it, 1300 ms of speech earlier,
+  // at the start of a word.
+  const auto unspaced = compile(text, "Unspaced");
+  EXPECT_THAT(unspaced->text, ::testing::HasSubstr("fruit:  \\mrk=2\\ apples,"));
+  const auto spaced = compile(text);
+  EXPECT_THAT(spaced->text, ::testing::HasSubstr("like  \\mrk=3\\ many kinds of fruit: apples,"));
+  // A pause long enough is split where the 1300 ms end.
+  const auto split = compile("Hello. \\pau=1000\\ I like apples, pears and plums");
+  EXPECT_THAT(split->text,
+              ::testing::HasSubstr(".  \\pau=260\\  \\mrk=4\\  \\pau=740\\  I like apples,"));
+  EXPECT_THAT(autoTags(*split), ::testing::ElementsAre("hello", "i", "like", "three"));
+  // Going back past the start stops at the first chunk.
+  EXPECT_EQ(compile("apples and pears")->text, " \\mrk=1\\ apples and pears");
+}
+
+TEST_F(AnalysisTest, ActionsFollowTheirBookmarksAfterInsertion) {
+  const auto job = compile("^stop(a) apples, pears and plums ^start(b)", "Unspaced");
+  EXPECT_EQ(job->text, " \\mrk=1\\   \\mrk=3\\ apples, pears and plums  \\mrk=2\\ ");
+  std::vector<std::uint32_t> ids;
+  for (const auto& action : job->actions)
+    ids.push_back(action->id);
+  EXPECT_THAT(ids, ::testing::ElementsAre(1, 3, 2));
+  EXPECT_EQ(job->currentAction, 0u);
+  EXPECT_EQ(job->actions[1]->text, "AUTO_START_TAG(three)");
+}
+
+TEST_F(AnalysisTest, ThePauseBeforeSpeechComesOncePerTextId) {
+  config_.msPauseBeforeSpeech = 500;
+  EXPECT_EQ(compile("tea", "English", 7)->text, " \\pau=500\\ tea");
+  EXPECT_EQ(compile("tea", "English", 7)->text, "tea");
+  EXPECT_EQ(compile("tea", "English", 8)->text, " \\pau=500\\ tea");
+  config_.msPauseBeforeSpeech = 0;
+  EXPECT_EQ(compile("tea", "English", 9)->text, "tea");
+  config_.msPauseBeforeSpeech = 500;
+  EXPECT_EQ(compile("tea", "English", 9)->text, " \\pau=500\\ tea");
+}
+
+TEST_F(AnalysisTest, ConfigurationWordsChooseAmongTheirTags) {
+  config_.wordsToTags["tea"] = {"drink", "cup"};
+  std::set<std::string> seen;
+  for (int k = 0; k < 64; ++k) {
+    const auto tags = autoTags(*compile("Tea"));
+    ASSERT_EQ(tags.size(), 1u);
+    seen.insert(tags[0]);
+  }
+  EXPECT_EQ(seen, (std::set<std::string>{"drink", "cup"}));
+  // Without a database: only the configuration's words and the parsed actions.
+  const auto job = compile("^run(x) I like tea, pears and plums", "Klingon");
+  EXPECT_EQ(job->actions.size(), 1u);
+  EXPECT_THAT(autoTags(*compile("I like tea and pears", "Klingon")), ::testing::ElementsAre("two"));
+  config_.wordsToTags["i"] = {"me"};
+  EXPECT_THAT(autoTags(*compile("I like coffee", "Klingon")), ::testing::ElementsAre("me"));
+}
+
+TEST_F(AnalysisTest, OnlyContextualModeTagsAndJapaneseKeepsItsComma) {
+  config_.bodyLanguageMode = BODY_LANGUAGE_MODE_RANDOM;
+  const auto random = compile("apples and pears");
+  EXPECT_TRUE(random->actions.empty());
+  EXPECT_EQ(random->text, "apples and pears");
+  config_.bodyLanguageMode = BODY_LANGUAGE_MODE_CONTEXTUAL;
+  EXPECT_EQ(compile("\\mrk=1\\ \\pau=300\\", "Japanese")->text, " \\mrk=1\\  , \\pau=300\\ ");
+  EXPECT_EQ(compile("\\mrk=1\\ \\pau=300\\", "English")->text, " \\mrk=1\\   \\pau=300\\ ");
+}
+
+TEST_F(AnalysisTest, EmotionFollowsItsLabels) {
+  using Labels = std::vector<std::string>;
+  const std::vector<std::pair<Labels, std::int32_t>> cases = {
+      {{"positive", "negation"}, -1},
+      {{"very negative"}, -2},
+      {{"negative", "strong adverb"}, -2},
+      {{"strong adverb", "positive"}, 2},
+      {{"positive", "negative"}, 0},
+      {{}, 0},
+      {{"very positive", "negative"}, 2},
+      {{"positive", "very negative", "negation"}, 1},
+      {{"very positive", "negation", "negation"}, 2},
+      {{"negative", "negative", "positive"}, 0},
+      {{"very positive", "strong adverb", "negation"}, -1},
+  };
+  for (const auto& [labels, expected] : cases)
+    EXPECT_EQ(lingEmotionOfLabels(labels), expected) << ::testing::PrintToString(labels);
+
+  ZULingEmotionEstimator estimator(languages_);
+  std::vector<ZULingEmotionWord> words;
+  EXPECT_EQ(estimator.getEmotion("English", "I am NOT very happy", &words), -1);
+  EXPECT_EQ(words, (std::vector<ZULingEmotionWord>{
+                       {"NOT", "negation"}, {"very", "strong adverb"}, {"happy", "positive"}}));
+  EXPECT_EQ(estimator.getEmotion("English", "awful"), -2);
+  EXPECT_EQ(estimator.getEmotion("French", "awful"), 0);
+  EXPECT_EQ(estimator.getEmotion("", "awful"), 0);
+}
+
+// On the databases of the build: sensible structures and tags in the three languages,
+// and every word tag of the starter library kept as a base form.
+class RealDatabases : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    languages_ = std::make_shared<ZULingLanguageMap>(makeLingLanguageMap());
+    for (const char* language : {"English", "French", "Japanese"}) {
+      if (!fs::exists(languages_->at(language)))
+        GTEST_SKIP() << "no linguistic databases in this build";
+    }
+  }
+  std::shared_ptr<const ZULingLanguageMap> languages_;
+};
+
+TEST_F(RealDatabases, SentencesOfTheThreeLanguages) {
+  struct Case {
+    std::string language;
+    std::string text;
+    std::string structures;
+  };
+  const std::vector<Case> cases = {
+      {"English", "I like apples, pears and plums, but I don't like tea or coffee.",
+       "nominal[I] verb[like] and3[apples pears and plums] nominal[I] verb![don't like] "
+       "or2[tea or coffee]"},
+      {"French", "J'aime les pommes, les poires et les prunes, mais je ne bois pas de thé.",
+       "nominal[J] verb[aime] and3[les pommes les poires et les prunes] nominal[je] "
+       "verb![ne bois pas] nominal[de thé]"},
+      {"Japanese", "りんごとバナナが好きです。", "and2[りんご と バナナ] nominal[好き] verb[です]"},
+  };
+  for (const Case& c : cases) {
+    ZULingSyntacticAnalyzer analyzer(languages_);
+    analyzer.setLanguage(c.language);
+    EXPECT_EQ(describe(analyzer.analyse(c.text)), c.structures) << c.text;
+  }
+}
+
+TEST_F(RealDatabases, TheLibrarysWordTagsAreBaseForms) {
+  const std::set<std::string> structureTags = {"two",  "three",  "four",    "five",
+                                               "pick", "oppose", "medidate"};
+  const std::string library = ko::path::findData("zefoko", "behaviors/animations/Stand/Gestures");
+  ASSERT_FALSE(library.empty());
+  std::vector<ZULingDatabasePtr> databases;
+  for (const char* language : {"English", "French", "Japanese"}) {
+    ZULingDatabaseUser user(languages_);
+    user.setLanguage(language);
+    ASSERT_TRUE(user.database()) << language;
+    databases.push_back(user.database());
+  }
+  for (const std::string& tag : mkbdb::readBehaviorTags(library)) {
+    if (structureTags.count(tag) != 0)
+      continue;
+    // Some language gives the tag itself as the base form of the tag's word.
+    bool kept = false;
+    for (const auto& database : databases) {
+      std::string baseForm;
+      const auto classes = database->wordClasses(tag);
+      kept = kept || (database->lemma(tag, classes.front().wordClass, baseForm) && baseForm == tag);
+    }
+    EXPECT_TRUE(kept) << tag;
+  }
+}
+
+}  // namespace

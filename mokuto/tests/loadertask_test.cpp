@@ -1,0 +1,749 @@
+// The loader stage and the animation index: on the simulated robot with a library of its
+// own and the process's body talk, and against a stand-in behaviour manager for the
+// failures and the abort of an update.
+
+#include "loadertask.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <functional>
+#include <future>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <set>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "ko/log.hpp"
+#include "ko/session.hpp"
+#include "ko_test_helpers.hpp"
+#include "mokuto/mktaskinstruction.h"
+#include "mokuto/zumokutoparser.h"
+#include "robotbodytalk/zurobotbodytalk.h"
+#include "robotsim/robot.h"
+#include "support/scratch_folder.h"
+#include "support/timeline_waiter.h"
+#include "zu/zubroker.h"
+#include "zu/zuerror.h"
+#include "zu/zumodule.h"
+#include "zu/zuproxy.h"
+#include "zu/zuvalue.h"
+
+namespace {
+
+using testing::Contains;
+using testing::ElementsAre;
+using testing::IsEmpty;
+using testing::Not;
+using ZU::LoaderTask;
+using TagMap = LoaderTask::TagMap;
+using Paths = std::set<std::string>;
+using Counts = std::map<std::string, std::int32_t>;
+
+constexpr const char* kCategory = "mokuto.loader";
+
+constexpr const char* kHeyStand = "animations/Stand/Gestures/Hey_1";
+constexpr const char* kHey2Stand = "animations/Stand/Gestures/Hey_2";
+constexpr const char* kWave = "animations/Stand/Gestures/Wave_1";
+constexpr const char* kHeySit = "animations/Sit/Gestures/Hey_1";
+constexpr const char* kYesChair = "animations/SitOnPod/Gestures/Yes_1";
+constexpr const char* kListening = "animations/Stand/BodyTalk/Listening_2";
+constexpr const char* kSpeaking = "animations/Stand/BodyTalk/Speaking_3";
+constexpr const char* kThinking = "animations/Stand/BodyTalk/Thinking_1";
+constexpr const char* kSpeakingSit = "animations/Sit/BodyTalk/Speaking_1";
+constexpr const char* kExtraSpeaking = "extra/Stand/BodyTalk/Speaking_9";
+
+struct Behavior {
+  const char* path;
+  std::vector<std::string> tags;
+};
+const std::vector<Behavior> kLibrary = {
+    {kHeyStand, {"hello", "hey"}},
+    {kHey2Stand, {"hello"}},
+    {kWave, {"wave"}},
+    {kHeySit, {"hello"}},
+    {kYesChair, {"yes"}},
+    {"animations/Crouch/Foo", {"crouch"}},
+    {kListening, {}},
+    {kSpeaking, {}},
+    {kThinking, {"thinking"}},
+    {kSpeakingSit, {}},
+    {kExtraSpeaking, {"extra"}},
+};
+
+// A short move of the head, with those tags.
+std::string descriptor(const std::vector<std::string>& tags) {
+  std::ostringstream out;
+  out << "{\"tags\": [";
+  for (std::size_t i = 0; i < tags.size(); ++i)
+    out << (i ? ", " : "") << '"' << tags[i] << '"';
+  out << "], \"duration\": 0.3, \"joints\": {\"HeadYaw\": {\"times\": [0.3], \"keys\": "
+         "[[0.1, [3, -0.1, 0.0], [3, 0.0, 0.0]]]}}}";
+  return out.str();
+}
+
+// The job of an annotated text as the compiler leaves it; "auto:<tag>" stands for one
+// automatic tag.
+std::shared_ptr<ZU::MKTaskInstruction> job(const std::string& text, ZU::PostureFamily family,
+                                           ZU::MokutoConfig config = {}) {
+  auto made = std::make_shared<ZU::MKTaskInstruction>(1, text, std::move(config), family);
+  if (text.rfind("auto:", 0) == 0) {
+    auto action = std::make_shared<ZU::MKAnimationAction>(ZU::AUTO_START_TAG);
+    action->tag = text.substr(5);
+    action->text = "AUTO_START_TAG(" + action->tag + ")";
+    made->addAction(action);
+  } else {
+    ZU::ZUMokutoParser().parse(made, text, false);
+  }
+  return made;
+}
+
+std::string animationOf(const ZU::MKTaskInstruction& job, std::size_t k) {
+  const auto* action = dynamic_cast<const ZU::MKAnimationAction*>(job.actions.at(k).get());
+  return action ? action->animation : "";
+}
+
+std::size_t loaderLines(ko::log::ScopedCapture& log) {
+  std::size_t count = 0;
+  for (const auto& record : log->records())
+    count += record.category == kCategory;
+  return count;
+}
+
+// The value inside any dynamic wrappers.
+const ko::AnyValue& plain(const ko::AnyValue& v) {
+  return v.kind() == ko::Kind::Dynamic ? plain(v.asDynamic()) : v;
+}
+
+// Stands where the service's module stands: the behaviour manager's events refresh the
+// package "animations/". Holds the loader weakly: a delivery may outlive the test.
+class ModuleStandIn : public ZU::ZUModule {
+ public:
+  ModuleStandIn(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name,
+                std::weak_ptr<LoaderTask> loader)
+      : ZU::ZUModule(broker, name), fLoader(std::move(loader)) {
+    beginMethod("_updateRepresentations", "ModuleStandIn", "Refreshes the animations.");
+    describeParameter("memoryKey", "The event.");
+    describeParameter("value", "The behaviours added or removed.");
+    describeParameter("message", "Unused.");
+    bindMethod(&ModuleStandIn::_updateRepresentations);
+  }
+  void _updateRepresentations(const std::string&, const ZU::ZUValue&, const std::string&) {
+    if (const auto loader = fLoader.lock())
+      loader->updateRepresentations("animations/");
+  }
+
+ private:
+  std::weak_ptr<LoaderTask> fLoader;
+};
+
+// ---- on the simulated robot -----------------------------------------------------------
+
+class LoaderOnRobot : public testing::Test {
+ protected:
+  LoaderOnRobot() {
+    for (const auto& behavior : kLibrary)
+      library.write(std::string(behavior.path) + "/behavior.json", descriptor(behavior.tags));
+    robotsim::RobotOptions options;
+    options.speech.backend = robotsim::ZUTextToSpeechOptions::Backend::Timing;
+    options.behaviorsRoot = library.path().string();
+    robot.emplace(options);
+    bodyTalk = std::make_shared<ZU::ZURobotBodyTalkInstance>(robot->broker());
+    loader = std::make_shared<LoaderTask>(robot->broker(), bodyTalk);
+  }
+  ~LoaderOnRobot() override {
+    loader.reset();
+    bodyTalk.reset();
+    robot.reset();
+  }
+
+  ko::AnyObject service(const std::string& name) const { return robot->broker()->service(name); }
+  // How many times the behaviour manager preloaded that behaviour.
+  std::size_t preloadsOf(const std::string& behavior) const {
+    std::size_t count = 0;
+    for (const auto& entry : robot->timeline()->entries("ZUBehaviorManager", "preloadBehavior"))
+      count += plain(plain(entry.arguments).asList().at(0)).asString() == behavior;
+    return count;
+  }
+
+  robotsim::simtest::ScratchFolder library;
+  std::optional<robotsim::Robot> robot;
+  std::shared_ptr<ZU::ZURobotBodyTalkInstance> bodyTalk;
+  std::shared_ptr<LoaderTask> loader;
+};
+
+TEST_F(LoaderOnRobot, IndexesThePackagesPostureFoldersUnderTheirTags) {
+  loader->updateRepresentations("animations/");
+  EXPECT_EQ(loader->getInstalledTags(ZU::Standing), (TagMap{{"hello", {kHeyStand, kHey2Stand}},
+                                                            {"hey", {kHeyStand}},
+                                                            {"thinking", {kThinking}},
+                                                            {"wave", {kWave}}}));
+  EXPECT_EQ(loader->getInstalledTags(ZU::Sitting), (TagMap{{"hello", {kHeySit}}}));
+  EXPECT_EQ(loader->getInstalledTags(ZU::SittingOnChair), (TagMap{{"yes", {kYesChair}}}));
+  EXPECT_THAT(loader->getInstalledTags(ZU::Unknown), IsEmpty());
+
+  TagMap merged{{"stale", {"x"}}};
+  loader->getMergedTags(merged);
+  EXPECT_EQ(merged, (TagMap{{"hello", {kHeyStand, kHey2Stand, kHeySit}},
+                            {"hey", {kHeyStand}},
+                            {"thinking", {kThinking}},
+                            {"wave", {kWave}},
+                            {"yes", {kYesChair}}}));
+}
+
+TEST_F(LoaderOnRobot, HandsOnlyTheBodyTalkFolderOfAnimationsToTheBodyTalk) {
+  ZU::ZURobotBodyTalk& talk = *bodyTalk->bodyTalk;
+  loader->updateRepresentations("animations/");
+  EXPECT_THAT(talk.getSpeakingAnimations(ZU::Standing), ElementsAre(kSpeaking));
+  EXPECT_THAT(talk.getListeningAnimations(ZU::Standing), ElementsAre(kListening));
+  EXPECT_THAT(talk.getSpeakingAnimations(ZU::Sitting), ElementsAre(kSpeakingSit));
+  EXPECT_THAT(talk.getListeningAnimations(ZU::Sitting), IsEmpty());
+  EXPECT_THAT(talk.getSpeakingAnimations(ZU::SittingOnChair), IsEmpty());
+
+  // Another package's body talk folder is indexed under its tags only.
+  loader->updateRepresentations("extra/");
+  EXPECT_EQ(loader->getInstalledTags(ZU::Standing).at("extra"), Paths{kExtraSpeaking});
+  EXPECT_THAT(talk.getSpeakingAnimations(ZU::Standing), ElementsAre(kSpeaking));
+  EXPECT_THAT(talk.getListeningAnimations(ZU::Standing), ElementsAre(kListening));
+}
+
+TEST_F(LoaderOnRobot, ARebuildForgetsAnUninstalledBehaviourAndTheTagsOnlyItCarried) {
+  loader->updateRepresentations("extra/");
+  loader->updateRepresentations("animations/");
+  ASSERT_TRUE(service("ZUBehaviorManager")->call<bool>("removeBehavior", std::string(kHeyStand)));
+  loader->updateRepresentations("animations/");
+
+  const TagMap standing = loader->getInstalledTags(ZU::Standing);
+  EXPECT_EQ(standing.count("hey"), 0u);
+  EXPECT_EQ(standing.at("hello"), Paths{kHey2Stand});
+  EXPECT_EQ(standing.at("extra"), Paths{kExtraSpeaking});
+}
+
+TEST_F(LoaderOnRobot, FollowsTheBehaviourManagersEventsWhileSubscribed) {
+  const auto standIn =
+      ZU::ZUModule::createModule<ModuleStandIn>(robot->broker(), LoaderTask::kModuleName, loader);
+  loader->subscribeToEvents();
+  const auto manager = service("ZUBehaviorManager");
+  const std::string added = "animations/Sit/Gestures/New_1";
+  manager->call<void>("installBehavior", added, descriptor({"new"}));
+  EXPECT_TRUE(ko::test::eventually(
+      [this] { return loader->getInstalledTags(ZU::Sitting).count("new") == 1; }));
+  manager->call<bool>("removeBehavior", added);
+  EXPECT_TRUE(ko::test::eventually(
+      [this] { return loader->getInstalledTags(ZU::Sitting).count("new") == 0; }));
+
+  loader->unsubscribeToEvents();
+  for (const char* event : {LoaderTask::kBehaviorsAddedEvent, LoaderTask::kBehaviorsRemovedEvent}) {
+    EXPECT_THAT(
+        service("ZUMemory")->call<std::vector<std::string>>("getSubscribers", std::string(event)),
+        Not(Contains(LoaderTask::kModuleName)));
+  }
+  standIn->exit();
+}
+
+// One action through the stage: what it becomes, what is preloaded, what is logged.
+struct StageCase {
+  const char* name;
+  std::string text;
+  ZU::PostureFamily family;
+  TagMap configured;  // the job's table for its posture family
+  ZU::MKTaskActionType type;
+  std::string actionText;
+  std::string animation;
+  Counts preloads;
+  ko::log::Level level;  // Silent: the stage logs nothing
+  std::string line;      // the whole line, or a part of it for another service's error
+  bool exact = true;
+};
+
+TEST_F(LoaderOnRobot, PreparesEachKindOfAction) {
+  using namespace ZU;
+  using ko::log::Error;
+  using ko::log::Silent;
+  using ko::log::Warning;
+  const std::vector<StageCase> cases = {
+      {"a full path is preloaded",
+       "^start(animations/Stand/Gestures/Hey_1)",
+       Standing,
+       {},
+       START,
+       "^start(animations/Stand/Gestures/Hey_1)",
+       kHeyStand,
+       {{kHeyStand, 0}},
+       Silent,
+       ""},
+      {"a short name is resolved, not preloaded",
+       "^start(Wave_1)",
+       Standing,
+       {},
+       START,
+       "^start(Wave_1)",
+       kWave,
+       {},
+       Warning,
+       "Animation name badly formatted given \"Wave_1\" instead of "
+       "\"animations/Stand/Gestures/Wave_1\"."},
+      {"a run is not preloaded",
+       "^run(animations/Stand/Gestures/Wave_1)",
+       Standing,
+       {},
+       RUN,
+       "^run(animations/Stand/Gestures/Wave_1)",
+       kWave,
+       {},
+       Silent,
+       ""},
+      {"an animation not installed",
+       "^stop(Nowhere_1)",
+       Standing,
+       {},
+       UNKNOWN,
+       "ANIMATION_NOT_FOUND ^stop(Nowhere_1)",
+       "Nowhere_1",
+       {},
+       Error,
+       "Animation \"Nowhere_1\" not found. Instruction skipped."},
+      {"a tag of the posture",
+       "^startTag(hey)",
+       Standing,
+       {},
+       START_TAG,
+       "^startTag(hey)",
+       kHeyStand,
+       {{kHeyStand, 0}},
+       Silent,
+       ""},
+      {"a stop tag is preloaded too",
+       "^stopTag(yes)",
+       SittingOnChair,
+       {},
+       STOP_TAG,
+       "^stopTag(yes)",
+       kYesChair,
+       {{kYesChair, 0}},
+       Silent,
+       ""},
+      {"a tag of another posture",
+       "^waitTag(hey)",
+       Sitting,
+       {},
+       UNKNOWN,
+       "NO_ANIMATION_FOR_CURRENT_POSTURE ^waitTag(hey)",
+       "",
+       {},
+       Warning,
+       "Tag \"hey\" not found for the Sitting posture. Instruction skipped."},
+      {"a tag in an unknown posture",
+       "^runTag(hello)",
+       Unknown,
+       {},
+       UNKNOWN,
+       "NO_ANIMATION_FOR_CURRENT_POSTURE ^runTag(hello)",
+       "",
+       {},
+       Warning,
+       "^runTag(hello) action can't be done because the robot is in an unknown posture."},
+      {"an automatic tag in an unknown posture",
+       "auto:hello",
+       Unknown,
+       {},
+       UNKNOWN,
+       "NO_ANIMATION_FOR_CURRENT_POSTURE AUTO_START_TAG(hello)",
+       "",
+       {},
+       Warning,
+       "AUTO_START_TAG(hello) action can't be done because the robot is in an unknown posture."},
+      {"an automatic tag without animation",
+       "auto:nothing",
+       Standing,
+       {},
+       UNKNOWN,
+       "AUTO_START_TAG(nothing)",
+       "",
+       {},
+       Silent,
+       ""},
+      {"a configured tag hides the installed ones",
+       "^startTag(hello)",
+       Standing,
+       {{"hello", {kWave}}},
+       START_TAG,
+       "^startTag(hello)",
+       kWave,
+       {{kWave, 0}},
+       Silent,
+       ""},
+      {"a configured tag without animations",
+       "^startTag(hey)",
+       Standing,
+       {{"hey", {}}},
+       UNKNOWN,
+       "NO_ANIMATION_FOR_CURRENT_POSTURE ^startTag(hey)",
+       "",
+       {},
+       Warning,
+       "Tag \"hey\" not found for the Standing posture. Instruction skipped."},
+      {"a sound set",
+       "^startSound(bells/ding)",
+       Standing,
+       {},
+       START_SOUND,
+       "^startSound(bells/ding)",
+       "",
+       {},
+       Silent,
+       ""},
+      {"a missing sound set",
+       "^runSound(nosuch/ding)",
+       Standing,
+       {},
+       UNKNOWN,
+       "SOUND_SET_NOT_FOUND ^runSound(nosuch/ding)",
+       "",
+       {},
+       Error,
+       "nosuch",
+       false},
+      {"a sound stop is not checked",
+       "^stopSound(nosuch/ding)",
+       Standing,
+       {},
+       STOP_SOUND,
+       "^stopSound(nosuch/ding)",
+       "",
+       {},
+       Silent,
+       ""},
+      {"a missing service",
+       "^call(NoSuchService.f())",
+       Standing,
+       {},
+       UNKNOWN,
+       "MODULE_NOT_FOUND ^call(NoSuchService.f())",
+       "",
+       {},
+       Error,
+       "NoSuchService",
+       false},
+      {"a service",
+       "^pCall(ZUMemory.getData(\"k\"))",
+       Standing,
+       {},
+       PCALL,
+       "^pCall(ZUMemory.getData(\"k\"))",
+       "",
+       {},
+       Silent,
+       ""},
+      {"a mode is left alone",
+       "^mode(random)",
+       Standing,
+       {},
+       MODE,
+       "^mode(random)",
+       "",
+       {},
+       Silent,
+       ""},
+  };
+  loader->updateRepresentations("animations/");
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.name);
+    MokutoConfig config;
+    config.tagsToAnimations[static_cast<std::size_t>(c.family)] = c.configured;
+    const auto made = job(c.text, c.family, config);
+    ASSERT_EQ(made->actions.size(), 1u);
+    ko::log::ScopedCapture log;
+    loader->process(*made);
+
+    const MKTaskAction& action = *made->actions[0];
+    EXPECT_EQ(action.type, c.type);
+    EXPECT_EQ(action.text, c.actionText);
+    EXPECT_EQ(animationOf(*made, 0), c.animation);
+    EXPECT_EQ(loader->getPreloadCounts(), c.preloads);
+    if (const auto* call = dynamic_cast<const MKCallAction*>(&action); call && c.type != UNKNOWN) {
+      ASSERT_TRUE(call->proxy);
+      EXPECT_TRUE(call->proxy->isValid());
+    }
+    EXPECT_EQ(loaderLines(log), c.level == Silent ? 0u : 1u);
+    if (c.level != Silent) {
+      EXPECT_TRUE(c.exact ? log->contains(kCategory, c.level, c.line)
+                          : log->containsPart(kCategory, c.level, c.line));
+    }
+  }
+}
+
+TEST_F(LoaderOnRobot, ATagDrawsAmongAllItsAnimations) {
+  loader->updateRepresentations("animations/");
+  std::set<std::string> drawn;
+  for (int i = 0; i < 64; ++i) {
+    const auto made = job("^startTag(hello)", ZU::Standing);
+    loader->process(*made);
+    drawn.insert(animationOf(*made, 0));
+  }
+  EXPECT_EQ(drawn, (Paths{kHeyStand, kHey2Stand}));
+}
+
+TEST_F(LoaderOnRobot, TwoStartsOfOneAnimationPreloadItOnceThenOnceAfterTheFirstStop) {
+  const std::string twice = std::string("^start(") + kHeyStand + ") a ^start(" + kHeyStand + ") b";
+  loader->process(*job(twice, ZU::Standing));
+  EXPECT_EQ(preloadsOf(kHeyStand), 1u);
+  EXPECT_EQ(loader->getPreloadCounts(), (Counts{{kHeyStand, 1}}));
+
+  robotsim::simtest::TimelineWaiter waiter(*robot->timeline());
+  loader->onBehaviorStopped(kHeyStand);
+  EXPECT_EQ(loader->getPreloadCounts(), (Counts{{kHeyStand, 0}}));
+  EXPECT_TRUE(waiter.waitFor("ZUBehaviorManager", "preloadBehavior"));
+  EXPECT_EQ(preloadsOf(kHeyStand), 2u);
+
+  loader->onBehaviorStopped(kWave);  // not started by the text
+  loader->onBehaviorStopped(kHeyStand);
+  EXPECT_THAT(loader->getPreloadCounts(), IsEmpty());
+  loader->onBehaviorStopped(kHeyStand);
+  EXPECT_THAT(loader->getPreloadCounts(), IsEmpty());
+}
+
+TEST_F(LoaderOnRobot, TheBehaviourAtTheEndIsPreloadedWhenThereIsOneAndNotCounted) {
+  ZU::MokutoConfig config;
+  loader->process(*job("Hello.", ZU::Standing, config));
+  EXPECT_THAT(robot->timeline()->entries("ZUBehaviorManager", "preloadBehavior"), IsEmpty());
+
+  config.behaviorAtEndOfMokuto = kWave;
+  loader->process(*job("Hello.", ZU::Standing, config));
+  EXPECT_EQ(preloadsOf(kWave), 1u);
+  EXPECT_THAT(loader->getPreloadCounts(), IsEmpty());
+
+  ko::log::ScopedCapture log;
+  config.behaviorAtEndOfMokuto = "Nowhere_1";
+  loader->process(*job("Hello.", ZU::Standing, config));
+  EXPECT_TRUE(
+      log->containsPart(kCategory, ko::log::Error, "Could not preload behavior Nowhere_1: "));
+}
+
+// ---- against stand-in services ----------------------------------------------------------
+
+// A behaviour manager whose library the test sets: its calls are recorded, the paths in
+// `failing` make the tag query and the preload fail, and a hook runs in each tag query.
+class FakeBehaviorManager : public ZU::ZUModule {
+ public:
+  using Hook = std::function<void(const std::string&)>;
+
+  FakeBehaviorManager(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
+      : ZU::ZUModule(broker, name) {
+    beginMethod("getInstalledBehaviors", "FakeBehaviorManager", "The library.");
+    describeReturn("behaviors", "Their paths.");
+    bindMethod(&FakeBehaviorManager::getInstalledBehaviors);
+    beginMethod("getBehaviorTags", "FakeBehaviorManager", "The tags of a behaviour.");
+    describeParameter("behavior", "Its path.");
+    describeReturn("tags", "Its tags.");
+    bindMethod(&FakeBehaviorManager::getBehaviorTags);
+    beginMethod("resolveBehaviorName", "FakeBehaviorManager", "The path itself when installed.");
+    describeParameter("name", "A path.");
+    describeReturn("behavior", "The path, or empty.");
+    bindMethod(&FakeBehaviorManager::resolveBehaviorName);
+    beginMethod("preloadBehavior", "FakeBehaviorManager", "Records the preload.");
+    describeParameter("behavior", "Its path.");
+    describeReturn("loaded", "True.");
+    bindMethod(&FakeBehaviorManager::preloadBehavior);
+  }
+
+  std::vector<std::string> getInstalledBehaviors() {
+    std::lock_guard lock(fMutex);
+    if (failList)
+      ZU_THROW_ERROR(getName(), "getInstalledBehaviors", "the library is out of reach");
+    std::vector<std::string> paths;
+    for (const auto& [path, tags] : library)
+      paths.push_back(path);
+    return paths;
+  }
+  std::vector<std::string> getBehaviorTags(const std::string& behavior) {
+    Hook hook;
+    {
+      std::lock_guard lock(fMutex);
+      tagQueries.push_back(behavior);
+      hook = tagHook;
+    }
+    if (hook)
+      hook(behavior);
+    std::lock_guard lock(fMutex);
+    if (failing.count(behavior))
+      ZU_THROW_ERROR(getName(), "getBehaviorTags", behavior + " has no readable tags");
+    return library.at(behavior);
+  }
+  std::string resolveBehaviorName(const std::string& name) {
+    std::lock_guard lock(fMutex);
+    return library.count(name) ? name : "";
+  }
+  bool preloadBehavior(const std::string& behavior) {
+    std::lock_guard lock(fMutex);
+    if (failing.count(behavior))
+      ZU_THROW_ERROR(getName(), "preloadBehavior", behavior + " cannot be loaded");
+    return true;
+  }
+
+  // Set by the test while no call runs, except the hook (under the lock).
+  std::mutex fMutex;
+  std::map<std::string, std::vector<std::string>> library;
+  std::set<std::string> failing;
+  bool failList = false;
+  Hook tagHook;
+  std::vector<std::string> tagQueries;
+};
+
+class LoaderOnStandIns : public testing::Test {
+ protected:
+  LoaderOnStandIns()
+      : broker(ZU::ZUBroker::create(std::make_shared<ko::Session>())),
+        manager(ZU::ZUModule::createModule<FakeBehaviorManager>(broker, "ZUBehaviorManager")),
+        loader(std::make_shared<LoaderTask>(broker, nullptr)) {}
+  ~LoaderOnStandIns() override {
+    loader.reset();
+    manager->exit();
+  }
+
+  void setLibrary(std::map<std::string, std::vector<std::string>> library) {
+    std::lock_guard lock(manager->fMutex);
+    manager->library = std::move(library);
+  }
+  std::vector<std::string> tagQueries() {
+    std::lock_guard lock(manager->fMutex);
+    return manager->tagQueries;
+  }
+
+  std::shared_ptr<ZU::ZUBroker> broker;
+  std::shared_ptr<FakeBehaviorManager> manager;
+  std::shared_ptr<LoaderTask> loader;
+};
+
+TEST_F(LoaderOnStandIns, IndexesOnlyPathsBelowAPostureFolderOfThePackage) {
+  setLibrary({{"animations/", {"root"}},
+              {"animations", {"bare"}},
+              {"animationsX/Stand/A", {"lookalike"}},
+              {"animations/Standing/B", {"standing"}},
+              {"animations/Stand/Bad", {"bad"}},
+              {"animations/Stand/Good", {"good"}}});
+  {
+    std::lock_guard lock(manager->fMutex);
+    manager->failing.insert("animations/Stand/Bad");
+  }
+  ko::log::ScopedCapture log;
+  loader->updateRepresentations("animations/");
+  EXPECT_THAT(tagQueries(), ElementsAre("animations/Stand/Bad", "animations/Stand/Good"));
+  EXPECT_EQ(loader->getInstalledTags(ZU::Standing), (TagMap{{"good", {"animations/Stand/Good"}}}));
+  TagMap merged;
+  loader->getMergedTags(merged);
+  EXPECT_EQ(merged.size(), 1u);
+  EXPECT_TRUE(log->containsPart(kCategory, ko::log::Error,
+                                "Error caught when calling behaviorManager.getBehaviorTags(): "));
+}
+
+TEST_F(LoaderOnStandIns, AFailedListLeavesThePackageEmpty) {
+  setLibrary({{"animations/Stand/A", {"a"}}, {"other/Sit/B", {"b"}}});
+  loader->updateRepresentations("animations/");
+  loader->updateRepresentations("other/");
+  {
+    std::lock_guard lock(manager->fMutex);
+    manager->failList = true;
+  }
+  ko::log::ScopedCapture log;
+  loader->updateRepresentations("animations/");
+  EXPECT_THAT(loader->getInstalledTags(ZU::Standing), IsEmpty());
+  EXPECT_EQ(loader->getInstalledTags(ZU::Sitting), (TagMap{{"b", {"other/Sit/B"}}}));
+  EXPECT_TRUE(
+      log->containsPart(kCategory, ko::log::Warning,
+                        "Error caught when calling behaviorManager.getInstalledBehaviors(): "));
+}
+
+TEST_F(LoaderOnStandIns, AbortUpdateEndsTheUpdateInProgressAndWaitsForIt) {
+  setLibrary({{"animations/Stand/A", {"a"}},
+              {"animations/Stand/B", {"b"}},
+              {"animations/Stand/C", {"c"}}});
+  loader->updateRepresentations("animations/");
+  ASSERT_EQ(loader->getInstalledTags(ZU::Standing).size(), 3u);
+
+  // The update's first tag query holds it until the abort has been asked for.
+  const auto entered = std::make_shared<ko::test::Gate>();
+  const std::weak_ptr<LoaderTask> weak = loader;
+  {
+    std::lock_guard lock(manager->fMutex);
+    manager->tagHook = [entered, weak](const std::string&) {
+      entered->open();
+      ko::test::eventually([weak] {
+        const auto held = weak.lock();
+        return !held || held->isUpdateAborted();
+      });
+    };
+  }
+  {
+    std::lock_guard lock(manager->fMutex);
+    manager->tagQueries.clear();
+  }
+  auto update = std::async(std::launch::async,
+                           [held = loader] { held->updateRepresentations("animations/"); });
+  ASSERT_TRUE(entered->wait());
+  auto abort = std::async(std::launch::async, [held = loader] { held->abortUpdate(); });
+  ASSERT_EQ(abort.wait_for(ko::test::kBound), std::future_status::ready);
+  ASSERT_EQ(update.wait_for(ko::test::kBound), std::future_status::ready);
+
+  EXPECT_THAT(tagQueries(), ElementsAre("animations/Stand/A"));
+  EXPECT_EQ(loader->getInstalledTags(ZU::Standing), (TagMap{{"a", {"animations/Stand/A"}}}));
+}
+
+TEST_F(LoaderOnStandIns, APreloadThatFailsIsLoggedAndLeavesTheActionValid) {
+  setLibrary({{"animations/Stand/A", {}}});
+  {
+    std::lock_guard lock(manager->fMutex);
+    manager->failing.insert("animations/Stand/A");
+  }
+  ko::log::ScopedCapture log;
+  const auto made = job("^start(animations/Stand/A)", ZU::Standing);
+  loader->process(*made);
+  EXPECT_EQ(made->actions[0]->type, ZU::START);
+  EXPECT_EQ(loader->getPreloadCounts(), (Counts{{"animations/Stand/A", 0}}));
+  EXPECT_TRUE(log->containsPart(kCategory, ko::log::Error,
+                                "Could not preload behavior animations/Stand/A: "));
+}
+
+TEST(LoaderWithoutServices, EveryFailingCallIsLoggedAndMarksOnlyItsAction) {
+  const auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
+  LoaderTask loader(broker, nullptr);
+  ko::log::ScopedCapture log;
+
+  loader.subscribeToEvents();
+  loader.unsubscribeToEvents();
+  loader.updateRepresentations("animations/");
+  ZU::MokutoConfig config;
+  config.behaviorAtEndOfMokuto = "animations/Stand/End";
+  const auto made =
+      job("^start(a) ^startSound(bells/ding) ^startTag(hey) ^mode(random)", ZU::Standing, config);
+  loader.process(*made);
+
+  std::vector<std::string> texts;
+  for (const auto& action : made->actions)
+    texts.push_back(action->text);
+  EXPECT_THAT(
+      texts,
+      ElementsAre("ANIMATION_NOT_FOUND ^start(a)", "SOUND_SET_NOT_FOUND ^startSound(bells/ding)",
+                  "NO_ANIMATION_FOR_CURRENT_POSTURE ^startTag(hey)", "^mode(random)"));
+  const auto lines = [&log](ko::log::Level level, const std::string& part) {
+    std::size_t count = 0;
+    for (const auto& record : log->records()) {
+      count += record.category == kCategory && record.level == level &&
+               record.message.rfind(part, 0) == 0;
+    }
+    return count;
+  };
+  EXPECT_EQ(lines(ko::log::Error, "ZUMemory.subscribeToEvent has thrown an exception: "), 1u);
+  EXPECT_EQ(lines(ko::log::Error, "ZUMemory.unsubscribeToEvent has thrown an exception: "), 2u);
+  EXPECT_EQ(lines(ko::log::Warning,
+                  "Error caught when calling behaviorManager.getInstalledBehaviors(): "),
+            1u);
+  EXPECT_EQ(lines(ko::log::Error, "Could not preload behavior animations/Stand/End: "), 1u);
+}
+
+}  // namespace
