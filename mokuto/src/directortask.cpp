@@ -466,13 +466,20 @@ void DirectorTask::xOnBookmark(const ZUValue& value) {
   }
   if (number == 0)
     return;
-  xBookmarkReached(number, false);
+  // The text of the posted say, taken under the speech lock; its job's mutex after it.
+  std::shared_ptr<Text> text = xCurrentText();
+  speech.unlock();
+  xBookmarkReached(text, number, false);
 }
 
 void DirectorTask::xBookmarkReached(std::int32_t id, bool blocking) {
+  xBookmarkReached(xCurrentText(), id, blocking);
+}
+
+void DirectorTask::xBookmarkReached(const std::shared_ptr<Text>& text, std::int32_t id,
+                                    bool blocking) {
   if (id <= 0)
     return;
-  const std::shared_ptr<Text> text = xCurrentText();
   MKTaskInstruction& job = *text->instruction;
   std::unique_lock lock(job.mutex);
   const auto bookmark = static_cast<std::uint32_t>(id);

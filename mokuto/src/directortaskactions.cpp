@@ -77,7 +77,11 @@ void DirectorTask::xDoAction(Text& text, const std::shared_ptr<MKTaskAction>& ac
           return xStartAnimation(text, *animation);
         case RUN_TAG:
         case RUN: {
-          animation->type = animation->type == RUN ? START : START_TAG;
+          {
+            // The job's printed form (the diagnosis) reads the type under the job's mutex.
+            std::lock_guard lock(job.mutex);
+            animation->type = animation->type == RUN ? START : START_TAG;
+          }
           xStartAnimation(text, *animation);
           AnimationLock lock(animationsMutex);
           return xWaitAnimation(lock, animation->animation, animation->type, -1);

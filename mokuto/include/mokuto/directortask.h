@@ -15,10 +15,10 @@
 //
 // Locks, in the order they may be taken: the text register's mutex (the module's, around
 // `stop`); `animationsMutex`; the job's `mutex`; the speech lock (`ttsMutex`, shared by the
-// notifications, exclusive only while no notification can go on to the job's mutex);
-// `soundsMutex` alone. The director takes the register's mutex (isMKIDStopped) only while it
-// holds none of its own. A blocking "mrkpause" caller waits on its action's condition until
-// the action has been executed, skipped or dropped by a stop; nothing else ends its wait.
+// notifications, which leave it before they take a job's mutex); `soundsMutex` alone. The director
+// takes the register's mutex (isMKIDStopped) only while it holds none of its own. A blocking
+// "mrkpause" caller waits on its action's condition until the action has been executed, skipped or
+// dropped by a stop; nothing else ends its wait.
 
 #include <condition_variable>
 #include <cstddef>
@@ -138,6 +138,7 @@ class DirectorTask {
 
   std::shared_ptr<Text> xCurrentText() const;
   void xSetCurrentText(std::shared_ptr<Text> text);
+  void xBookmarkReached(const std::shared_ptr<Text>& text, std::int32_t id, bool blocking);
   // Marks every action from the current one as dropped; with the job's mutex held.
   void xDropRemainingActions(Text& text);
   void xReport(Text& text, std::size_t index);
