@@ -4,6 +4,7 @@
 #include <utility>
 
 #include "ko/log.hpp"
+#include "robotsim/speechscript.h"
 #include "zu/zuserviceproxies.h"
 
 namespace mokutotest {
@@ -68,6 +69,8 @@ void ScriptedSpeech::say(const std::string& text) {
   fChanged.wait(lock, [&] {
     return fExiting || fFinished.count(id) != 0 || (task && task->isStopRequested());
   });
+  fEnded.insert(id);
+  fChanged.notify_all();
 }
 
 void ScriptedSpeech::setParameter(const std::string& name, float value) {
@@ -130,6 +133,16 @@ void ScriptedSpeech::finish(int id) {
   fChanged.notify_all();
 }
 
+bool ScriptedSpeech::waitForEnd(int id, std::chrono::milliseconds bound) const {
+  std::unique_lock lock(fMutex);
+  return fChanged.wait_for(lock, bound, [&] { return fEnded.count(id) != 0; });
+}
+
+bool ScriptedSpeech::hasEnded(int id) const {
+  std::lock_guard lock(fMutex);
+  return fEnded.count(id) != 0;
+}
+
 std::size_t ScriptedSpeech::sayCount() const {
   std::lock_guard lock(fMutex);
   return fSays.size();
@@ -149,6 +162,26 @@ bool ScriptedSpeech::waitForCall(const std::string& call, std::chrono::milliseco
     }
     return false;
   });
+}
+
+bool speakThrough(ScriptedSpeech& speech, const ScriptedSpeech::Say& say) {
+  speech.raiseStatus(say.id, "started");
+  const robotsim::SpeechScript script = robotsim::parseSpeechText(say.text);
+  bool returned = true;
+  for (const auto& mark : script.marks) {
+    if (speech.hasEnded(say.id))
+      break;
+    if (mark.blocking) {
+      returned = speech.mrkpause(mark.number)
+                         .wait(static_cast<int>(std::chrono::milliseconds(kBound).count())) !=
+                     ko::FutureState::Timeout &&
+                 returned;
+    } else {
+      speech.raiseBookmark(ZU::ZUValue(mark.number));
+    }
+  }
+  speech.finish(say.id);
+  return returned;
 }
 
 }  // namespace mokutotest

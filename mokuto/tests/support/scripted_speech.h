@@ -60,6 +60,9 @@ class ScriptedSpeech : public ZU::ZUModule {
   ko::Future<void> mrkpause(int bookmark);
   // Ends the say `id` as spoken to its end.
   void finish(int id);
+  // Whether the say `id` has returned, after waiting at most `bound`.
+  bool waitForEnd(int id, std::chrono::milliseconds bound = kBound) const;
+  bool hasEnded(int id) const;
   std::size_t sayCount() const;
 
   // Every call, in order: "say(<id>)", "stop(<id>)", "setParameter(<name>, <value>)",
@@ -78,8 +81,14 @@ class ScriptedSpeech : public ZU::ZUModule {
   std::vector<Say> fSays;
   std::vector<std::string> fCalls;
   std::set<int> fFinished;  // finished or stopped, maybe before they began
+  std::set<int> fEnded;     // returned
   bool fExiting = false;
   int fNextDirectId = 1 << 30;
 };
+
+// Plays the speech engine's part for a posted say, as the real engine would: "started",
+// then each bookmark of the text in order (the "mrkpause" ones through blocking calls,
+// waited for), then the end. Answers false when a blocking call did not return in the bound.
+bool speakThrough(ScriptedSpeech& speech, const ScriptedSpeech::Say& say);
 
 }  // namespace mokutotest
