@@ -4,7 +4,6 @@
 #include <utility>
 
 #include "ko/log.hpp"
-#include "robotsim/speechscript.h"
 #include "zu/zuserviceproxies.h"
 
 namespace mokutotest {
@@ -162,26 +161,6 @@ bool ScriptedSpeech::waitForCall(const std::string& call, std::chrono::milliseco
     }
     return false;
   });
-}
-
-bool speakThrough(ScriptedSpeech& speech, const ScriptedSpeech::Say& say) {
-  speech.raiseStatus(say.id, "started");
-  const robotsim::SpeechScript script = robotsim::parseSpeechText(say.text);
-  bool returned = true;
-  for (const auto& mark : script.marks) {
-    if (speech.hasEnded(say.id))
-      break;
-    if (mark.blocking) {
-      returned = speech.mrkpause(mark.number)
-                         .wait(static_cast<int>(std::chrono::milliseconds(kBound).count())) !=
-                     ko::FutureState::Timeout &&
-                 returned;
-    } else {
-      speech.raiseBookmark(ZU::ZUValue(mark.number));
-    }
-  }
-  speech.finish(say.id);
-  return returned;
 }
 
 }  // namespace mokutotest

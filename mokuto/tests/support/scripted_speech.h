@@ -86,9 +86,4 @@ class ScriptedSpeech : public ZU::ZUModule {
   int fNextDirectId = 1 << 30;
 };
 
-// Plays the speech engine's part for a posted say, as the real engine would: "started",
-// then each bookmark of the text in order (the "mrkpause" ones through blocking calls,
-// waited for), then the end. Answers false when a blocking call did not return in the bound.
-bool speakThrough(ScriptedSpeech& speech, const ScriptedSpeech::Say& say);
-
 }  // namespace mokutotest
