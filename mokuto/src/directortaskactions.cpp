@@ -317,10 +317,12 @@ void DirectorTask::xWaitAnimation(AnimationLock& lock, const std::string& path,
     }
     return false;
   };
+  // Each notification begins a fresh wait: the limit counts from the last change of the table.
   if (limitMs >= 0) {
-    const auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(limitMs);
     while (running()) {
-      if (animationsCondition.wait_until(lock, deadline) == std::cv_status::timeout && running()) {
+      if (animationsCondition.wait_for(lock, std::chrono::milliseconds(limitMs)) ==
+              std::cv_status::timeout &&
+          running()) {
         KO_LOG_ERROR(kCategory) << "Behavior " << path << " did not stop before " << limitMs
                                 << "ms, timeout expired.";
         xRemoveRunningAnimation(lock, path);
@@ -330,11 +332,9 @@ void DirectorTask::xWaitAnimation(AnimationLock& lock, const std::string& path,
     return;
   }
   while (running()) {
-    const auto deadline = std::chrono::steady_clock::now() + kNotificationCheck;
-    while (running() && animationsCondition.wait_until(lock, deadline) != std::cv_status::timeout) {
-    }
-    if (!running())
-      return;
+    if (animationsCondition.wait_for(lock, kNotificationCheck) != std::cv_status::timeout ||
+        !running())
+      continue;
     bool stillRunning = false;
     try {
       stillRunning = live(behaviorManager, "isBehaviorRunning").isBehaviorRunning(path);
