@@ -200,7 +200,7 @@ void FakeMemory::unsubscribeToEvent(const std::string& name, const std::string& 
 FakeRobot::FakeRobot(int robotType)
     : session(std::make_shared<ko::Session>()),
       broker(ZU::ZUBroker::create(session, "BodyTalkTestBroker",
-                                            std::make_shared<ZU::ZUBrokerManager>())) {
+                                  std::make_shared<ZU::ZUBrokerManager>())) {
   using ZU::ZUModule;
   memory = ZUModule::createModule<FakeMemory>(broker, "ZUMemory");
   motion = ZUModule::createModule<FakeMotion>(broker, "ZUMotion");
