@@ -345,6 +345,8 @@ void ZUMokuto::xSay(const std::shared_ptr<MKTaskInstruction>& instruction) {
       std::lock_guard lock(compilerMutex);
       if (!textRegister.isMKIDStopped(id)) {
         xEnterStage(ZUMokutoStage::Compiler, id);
+        // The diagnosis may print the job of any registered text meanwhile.
+        std::lock_guard jobLock(instruction->mutex);
         compiler->process(instruction);
       }
     }
@@ -352,6 +354,7 @@ void ZUMokuto::xSay(const std::shared_ptr<MKTaskInstruction>& instruction) {
       std::lock_guard lock(loaderMutex);
       if (!textRegister.isMKIDStopped(id)) {
         xEnterStage(ZUMokutoStage::Loader, id);
+        std::lock_guard jobLock(instruction->mutex);
         loader->process(*instruction);
       }
     }
@@ -370,6 +373,11 @@ void ZUMokuto::xSay(const std::shared_ptr<MKTaskInstruction>& instruction) {
       timeChecker->stopOfMokuto(id);
   } catch (const std::exception& e) {
     KO_LOG_ERROR(kMain) << "say() method detects an exception: " << e.what();
+    if (registered)
+      xFreeMKID(*registered);
+    throw;
+  } catch (...) {
+    // Not an error of the service's own making; the text must not stay registered.
     if (registered)
       xFreeMKID(*registered);
     throw;
@@ -392,6 +400,8 @@ std::shared_ptr<MKTaskInstruction> ZUMokuto::prepare(const std::string& text,
       std::lock_guard lock(compilerMutex);
       if (!textRegister.isMKIDStopped(id)) {
         xEnterStage(ZUMokutoStage::Compiler, id);
+        // The diagnosis may print the job of any registered text meanwhile.
+        std::lock_guard jobLock(instruction->mutex);
         compiler->process(instruction);
       }
     }
@@ -399,6 +409,7 @@ std::shared_ptr<MKTaskInstruction> ZUMokuto::prepare(const std::string& text,
       std::lock_guard lock(loaderMutex);
       if (!textRegister.isMKIDStopped(id)) {
         xEnterStage(ZUMokutoStage::Loader, id);
+        std::lock_guard jobLock(instruction->mutex);
         loader->process(*instruction);
       }
     }

@@ -225,9 +225,17 @@ std::vector<ZUMokuto::DiagnosisLine> ZUMokuto::xDiagnosis() {
     lines.push_back({Info, std::string("is TextToSpeech running: ") +
                                trueFalse(director->isTextToSpeechRunning())});
   }
-  std::lock_guard lock(textRegister.textsMutex);
-  const std::size_t running = textRegister.runningTexts.size();
-  const std::size_t toStop = textRegister.textsToStop.size();
+  // A snapshot of the register: a job may be held by its loader stage for as long as a
+  // preload lasts, and the register must not wait on it meanwhile.
+  std::vector<std::shared_ptr<MKTaskInstruction>> texts;
+  std::size_t toStop = 0;
+  {
+    std::lock_guard lock(textRegister.textsMutex);
+    for (const auto& entry : textRegister.runningTexts)
+      texts.push_back(entry.second);
+    toStop = textRegister.textsToStop.size();
+  }
+  const std::size_t running = texts.size();
   lines.push_back({Info, "number of texts in the stack: " + std::to_string(running)});
   if (toStop <= running)
     lines.push_back({Info, "number of texts asked to stop: " + std::to_string(toStop)});
@@ -238,7 +246,7 @@ std::vector<ZUMokuto::DiagnosisLine> ZUMokuto::xDiagnosis() {
     return lines;
   lines.push_back({Info, running == 1 ? "print the text:" : "print the texts:"});
   std::size_t k = 0;
-  for (const auto& [id, instruction] : textRegister.runningTexts) {
+  for (const auto& instruction : texts) {
     ++k;
     std::ostringstream text;
     text << "Text number " << k << ": ";

@@ -3,10 +3,11 @@
 // configuration, and the actions that the speech's bookmarks trigger.
 //
 // A job is created by the say pipeline in the caller's thread and shared by the stages
-// that work on it in turn. The compiler stage fills it (addAction takes no lock: no
-// other stage sees the job yet); the loader and the director read it afterwards. The
-// director and its bookmark callbacks, which run in the framework's threads, guard
-// `currentAction` and the actions' progress with `mutex`.
+// that work on it in turn. The compiler stage fills it and the loader prepares its
+// actions, each with `mutex` held by the pipeline (the diagnosis prints the jobs of the
+// registered texts under it); the director and its bookmark callbacks, which run in the
+// framework's threads, guard `currentAction` and the actions' progress with `mutex`.
+// addAction itself takes no lock.
 
 #include <cstddef>
 #include <cstdint>
