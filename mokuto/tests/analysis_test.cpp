@@ -493,6 +493,11 @@ TEST_F(RealDatabases, SentencesOfTheThreeLanguages) {
        "nominal[J] verb[aime] and3[les pommes les poires et les prunes] nominal[je] "
        "verb![ne bois pas] nominal[de thé]"},
       {"Japanese", "りんごとバナナが好きです。", "and2[りんご と バナナ] nominal[好き] verb[です]"},
+      // A subject after "and" that follows a prepositional group begins a clause.
+      {"English", "I was born in Paris and I was happy",
+       "nominal[I] verb[was born] nominal[Paris] nominal[I] verb[was] nominal[happy]"},
+      {"French", "je suis né à Paris et il faisait froid",
+       "nominal[je] verb[suis né] nominal[Paris] nominal[il] verb[faisait] nominal[froid]"},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

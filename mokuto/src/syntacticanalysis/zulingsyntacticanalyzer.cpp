@@ -715,8 +715,7 @@ class StructureBuilder {
   // word ("apples, pears and plums", "A と B と C"); all items are groups of one kind,
   // nominal groups ending in a noun or pronoun for the Japanese particles. Items begin with a
   // preposition only when the last one does; otherwise a preposition ends the list. A pronoun after
-  // the word that begins a clause
-  // ("I like tea and he likes coffee") coordinates nothing.
+  // the word that begins a clause ("I like tea and he likes coffee") coordinates nothing.
   std::vector<Structure> xCoordinations() {
     std::vector<Structure> structures;
     std::vector<bool> consumed(fTokens.size(), false);
@@ -800,7 +799,8 @@ class StructureBuilder {
   }
 
   // A lone pronoun after the coordinating word, followed by a verb, while the first
-  // item follows a verb: two clauses, not a list.
+  // item follows a verb or a preposition: two clauses, not a list ("I like tea and he
+  // likes coffee", "I was born in Paris and I was happy").
   bool xStartsClause(const Item& right, const Item& firstLeft) const {
     const Group& group = fGroups[right.group];
     if (group.firstToken != group.lastToken || fTokens[group.firstToken].role != Role::Pronoun)
@@ -810,7 +810,11 @@ class StructureBuilder {
         fGroups[fGroupOfToken[next]].kind != STRUCTURE_VERB)
       return false;
     const std::size_t previous = firstLeft.firstToken;
-    return previous > 0 && fGroupOfToken[previous - 1] != kNone &&
+    if (previous == 0)
+      return false;
+    if (xIsPreposition(previous - 1))
+      return true;
+    return fGroupOfToken[previous - 1] != kNone &&
            fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB;
   }
 
