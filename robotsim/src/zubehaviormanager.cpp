@@ -66,8 +66,9 @@ ZUBehaviorManager::ZUBehaviorManager(const std::shared_ptr<ZU::ZUBroker>& broker
 
 ZUBehaviorManager::~ZUBehaviorManager() {
   xShutdown();
-  // Left by an exit from a subscriber. (A module made without ko::makeShared could even
-  // die on that thread; it cannot wait for itself.)
+  // Left by an exit from a subscriber. Only a module made without ko::makeShared could die
+  // on that thread, and would then be used freed once the thread goes on: modules are
+  // made with ko::makeShared (ZUModule::createModule) for that reason.
   if (fDeliveryThread.joinable()) {
     if (fDeliveryThread.get_id() == std::this_thread::get_id())
       fDeliveryThread.detach();

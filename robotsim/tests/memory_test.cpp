@@ -325,6 +325,31 @@ TEST(MemoryLifetime, NoCallbackRunsOnceTheUnsubscribeHasReturned) {
   }
 }
 
+TEST(MemoryLifetime, ACallbackMayEndItsOwnSubscription) {
+  auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
+  auto memoryModule = ZU::ZUModule::createModule<ZUMemory>(broker, "ZUMemory");
+  ZU::ZUMemoryProxy memory(broker);
+  std::atomic<int> ticks{0};
+  ko::test::Counter flushes;
+  auto subscriber = ZU::ZUModule::createModule<HookedModule>(
+      broker, "Self", [&](const HookedModule&, const std::string& key) {
+        if (key == "tick") {
+          ++ticks;
+          memory.unsubscribeToEvent("tick", "Self");
+        } else {
+          flushes.increment();
+        }
+      });
+  memory.subscribeToEvent("tick", "Self", "onEvent");
+  memory.subscribeToEvent("flush", "Self", "onEvent");
+  for (int i = 0; i < 3; ++i)
+    memory.raiseEvent("tick", ZU::ZUValue(i));
+  memory.raiseEvent("flush", ZU::ZUValue(0));
+  // Deliveries to a module come in raised order: the ticks were all handled first.
+  ASSERT_TRUE(flushes.waitFor(1));
+  EXPECT_EQ(ticks.load(), 1);
+}
+
 TEST_F(MemoryTest, RaisesAreOnTheTimeline) {
   memory.raiseEvent("ZUMokuto/EndOfMokuto", ZU::ZUValue(3));
   const auto entries = timeline->entries("ZUMemory", "raiseEvent");

@@ -12,7 +12,9 @@
 // still queued is dropped: its future finishes with "Promise broken". A stop from outside
 // joins the threads; a stop from one of the loop's threads lets them leave once the
 // caller's job returns, so a loop may be stopped, or its owner destroyed, in one of its
-// own jobs. A job must not stop its loop while another job waits for it.
+// own jobs. Since a stop waits for the running jobs, it must not be called from a thread
+// that one of them waits for: a job stopping its own loop while another job waits for
+// it, or a callback that a job of the loop is blocked on.
 
 #include <chrono>
 #include <cstddef>

@@ -39,7 +39,8 @@ class FrameworkThreadScope {
 // Runs `destroy` on the reaper thread, in the order handed over.
 void reap(std::function<void()> destroy);
 // Waits until every destruction handed to the reaper before the call has run. Must not be
-// called from a destructor that the reaper runs.
+// called from a destructor that the reaper runs, nor from a framework thread (one of those
+// destructions may be stopping the loop that runs the caller).
 void waitForReaper();
 
 // The deleter of ko::makeShared.

@@ -114,7 +114,8 @@ struct ZUMethodInfo {
 // The threads that serve a module (its event loop, its workers) are stopped and joined by
 // its exit() or by its destructor, never by themselves, and never hold the broker: they
 // find services through findService(). exit() may be called from any thread, a posted
-// call of the module's own included, and more than once.
+// call of the module's own included, and more than once, unless a service's own header
+// narrows this (the speech engine's does).
 class ZUModuleCore : public ko::DynamicObject, public std::enable_shared_from_this<ZUModuleCore> {
  public:
   ZUModuleCore(const std::shared_ptr<ZUBroker>& broker, std::string name);

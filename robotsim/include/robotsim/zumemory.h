@@ -18,7 +18,8 @@
 //
 // exit() stops the delivery loop, waiting for the callbacks in progress (unless called
 // from one of them), and unregisters; events raised afterwards are kept but not
-// delivered. The destructor does the same stop; both may be called from any thread.
+// delivered, from any thread. The destructor does the same stop, on any thread but the
+// module's own (the framework sees to it, see ko/reaper.hpp).
 
 #include <condition_variable>
 #include <cstdint>
