@@ -83,8 +83,8 @@ std::shared_ptr<Proxy> lookUp(const std::shared_ptr<ko::Session>& session,
 }  // namespace
 
 LoaderTask::LoaderTask(const std::shared_ptr<ZUBroker>& broker,
-                       std::shared_ptr<ZURobotBodyTalkInstance> bodyTalk)
-    : fSession(broker ? broker->session() : nullptr), fBodyTalk(std::move(bodyTalk)) {}
+                       std::shared_ptr<ZURobotBodyTalkInstance> bodyTalkInstance)
+    : session(broker ? broker->session() : nullptr), bodyTalk(std::move(bodyTalkInstance)) {}
 
 LoaderTask::~LoaderTask() {
   abortUpdate();
@@ -92,25 +92,25 @@ LoaderTask::~LoaderTask() {
 
 std::shared_ptr<ZUBehaviorManagerProxy> LoaderTask::xBehaviorManager() {
   std::lock_guard lock(fServicesMutex);
-  return lookUp(fSession, fBehaviorManager);
+  return lookUp(session, behaviorManager);
 }
 
 std::shared_ptr<ZUAudioPlayerProxy> LoaderTask::xAudioPlayer() {
   std::lock_guard lock(fServicesMutex);
-  return lookUp(fSession, fAudioPlayer);
+  return lookUp(session, audioPlayer);
 }
 
 std::shared_ptr<ZUMemoryProxy> LoaderTask::xMemory() {
   std::lock_guard lock(fServicesMutex);
-  return lookUp(fSession, fMemory);
+  return lookUp(session, memory);
 }
 
 // ---- the stage --------------------------------------------------------------------------
 
 void LoaderTask::process(MKTaskInstruction& instruction) {
   {
-    std::lock_guard lock(fPreloadMutex);
-    fPreloadCounts.clear();
+    std::lock_guard lock(preloadMutex);
+    preloadCounts.clear();
   }
   const PostureFamily family = instruction.postureFamily;
   for (const auto& held : instruction.actions) {
@@ -159,10 +159,10 @@ void LoaderTask::process(MKTaskInstruction& instruction) {
             action.markAsError("NO_ANIMATION_FOR_CURRENT_POSTURE");
             break;
           }
-          std::lock_guard lock(fTagsMutex);
+          std::lock_guard lock(tagsMutex);
           const auto index = static_cast<std::size_t>(family);
           const TagMap& configured = instruction.config.tagsToAnimations[index];
-          const TagMap& installed = fInstalledTags[index];
+          const TagMap& installed = installedTags[index];
           const std::set<std::string>* candidates = nullptr;
           if (const auto it = configured.find(tagAction.tag); it != configured.end()) {
             candidates = &it->second;
@@ -201,9 +201,9 @@ void LoaderTask::process(MKTaskInstruction& instruction) {
         case PCALL: {
           MKCallAction& call = recordOf<MKCallAction>(action);
           try {
-            if (!fSession)
+            if (!session)
               ZU_THROW_ERROR("ZUProxy", "ZUProxy", "Broker is invalid");
-            ko::AnyObject service = fSession->service(call.module, "").value(kCallLookupTimeoutMs);
+            ko::AnyObject service = session->service(call.module, "").value(kCallLookupTimeoutMs);
             call.proxy = std::make_shared<ZUProxy>(std::move(service), call.module);
           } catch (const std::exception& e) {
             KO_LOG_ERROR(kCategory) << e.what();
@@ -233,45 +233,45 @@ void LoaderTask::xLoadAnimation(const std::string& name) {
 }
 
 void LoaderTask::xRegisterPreload(const std::string& name) {
-  std::lock_guard lock(fPreloadMutex);
-  const auto it = fPreloadCounts.find(name);
-  if (it == fPreloadCounts.end()) {
+  std::lock_guard lock(preloadMutex);
+  const auto it = preloadCounts.find(name);
+  if (it == preloadCounts.end()) {
     xLoadAnimation(name);
-    fPreloadCounts.emplace(name, 0);
+    preloadCounts.emplace(name, 0);
   } else {
     ++it->second;
   }
 }
 
 void LoaderTask::onBehaviorStopped(const std::string& name) {
-  std::lock_guard lock(fPreloadMutex);
-  const auto it = fPreloadCounts.find(name);
-  if (it == fPreloadCounts.end())
+  std::lock_guard lock(preloadMutex);
+  const auto it = preloadCounts.find(name);
+  if (it == preloadCounts.end())
     return;
   if (it->second < 1) {
-    fPreloadCounts.erase(it);
+    preloadCounts.erase(it);
     return;
   }
   --it->second;
   try {
-    preloadABehaviorAsync(xBehaviorManager(), name);
+    xBehaviorManager()->post_preloadBehavior(name);
   } catch (const std::exception& e) {
     KO_LOG_ERROR(kCategory) << "Could not preload behavior " << name << ": " << e.what();
   }
 }
 
 std::map<std::string, std::int32_t> LoaderTask::getPreloadCounts() const {
-  std::lock_guard lock(fPreloadMutex);
-  return fPreloadCounts;
+  std::lock_guard lock(preloadMutex);
+  return preloadCounts;
 }
 
 // ---- the index --------------------------------------------------------------------------
 
 void LoaderTask::updateRepresentations(const std::string& package) {
-  std::lock_guard lock(fTagsMutex);
-  fUpdateAborted.store(false);
+  std::lock_guard lock(tagsMutex);
+  updateAborted.store(false);
   xRemovePackageAnimations(package);
-  if (fUpdateAborted.load())
+  if (updateAborted.load())
     return;
 
   std::vector<std::string> paths;
@@ -295,7 +295,7 @@ void LoaderTask::updateRepresentations(const std::string& package) {
         }
       }
     }
-    if (fUpdateAborted.load())
+    if (updateAborted.load())
       return;
   }
 
@@ -304,7 +304,7 @@ void LoaderTask::updateRepresentations(const std::string& package) {
 }
 
 void LoaderTask::xRemovePackageAnimations(const std::string& package) {
-  for (auto& tags : fInstalledTags) {
+  for (auto& tags : installedTags) {
     for (auto tag = tags.begin(); tag != tags.end();) {
       std::set<std::string>& paths = tag->second;
       // The paths that begin with the package follow one another from the package on.
@@ -324,7 +324,7 @@ void LoaderTask::xUpdateAnAnimation(BodyTalkLists& speaking, BodyTalkLists& list
   const auto index = static_cast<std::size_t>(family);
   try {
     for (auto& tag : xBehaviorManager()->getBehaviorTags(path))
-      fInstalledTags[index][std::move(tag)].insert(path);
+      installedTags[index][std::move(tag)].insert(path);
   } catch (const std::exception& e) {
     KO_LOG_ERROR(kCategory) << "Error caught when calling behaviorManager.getBehaviorTags(): "
                             << e.what();
@@ -338,33 +338,33 @@ void LoaderTask::xUpdateAnAnimation(BodyTalkLists& speaking, BodyTalkLists& list
 }
 
 void LoaderTask::xHandToBodyTalk(const BodyTalkLists& speaking, const BodyTalkLists& listening) {
-  ZURobotBodyTalk* const bodyTalk = fBodyTalk ? fBodyTalk->bodyTalk : nullptr;
-  if (!bodyTalk)
+  ZURobotBodyTalk* const controller = bodyTalk ? bodyTalk->bodyTalk : nullptr;
+  if (!controller)
     return;
   // Speaking for Standing, Sitting, SittingOnChair, then listening for the same; the
   // abort is tested after each call but the last.
   for (PostureFamily family = Standing; family < Unknown; ++family) {
-    bodyTalk->setSpeakingAnimations(family, speaking[static_cast<std::size_t>(family)]);
-    if (fUpdateAborted.load())
+    controller->setSpeakingAnimations(family, speaking[static_cast<std::size_t>(family)]);
+    if (updateAborted.load())
       return;
   }
   for (PostureFamily family = Standing; family < Unknown; ++family) {
-    bodyTalk->setListeningAnimations(family, listening[static_cast<std::size_t>(family)]);
-    if (family != SittingOnChair && fUpdateAborted.load())
+    controller->setListeningAnimations(family, listening[static_cast<std::size_t>(family)]);
+    if (family != SittingOnChair && updateAborted.load())
       return;
   }
 }
 
 void LoaderTask::abortUpdate() {
-  fUpdateAborted.store(true);
-  std::lock_guard lock(fTagsMutex);
+  updateAborted.store(true);
+  std::lock_guard lock(tagsMutex);
 }
 
 void LoaderTask::getMergedTags(TagMap& out) const {
-  std::lock_guard lock(fTagsMutex);
-  out = fInstalledTags[Standing];
-  for (std::size_t family = Sitting; family < fInstalledTags.size(); ++family) {
-    for (const auto& [tag, paths] : fInstalledTags[family])
+  std::lock_guard lock(tagsMutex);
+  out = installedTags[Standing];
+  for (std::size_t family = Sitting; family < installedTags.size(); ++family) {
+    for (const auto& [tag, paths] : installedTags[family])
       out[tag].insert(paths.begin(), paths.end());
   }
 }
@@ -372,15 +372,15 @@ void LoaderTask::getMergedTags(TagMap& out) const {
 LoaderTask::TagMap LoaderTask::getInstalledTags(PostureFamily family) const {
   if (family < Standing || family > Unknown)
     return {};
-  std::lock_guard lock(fTagsMutex);
-  return fInstalledTags[static_cast<std::size_t>(family)];
+  std::lock_guard lock(tagsMutex);
+  return installedTags[static_cast<std::size_t>(family)];
 }
 
 void LoaderTask::subscribeToEvents() {
   try {
-    const auto memory = xMemory();
-    memory->subscribeToEvent(kBehaviorsAddedEvent, kModuleName, kUpdateCallback);
-    memory->subscribeToEvent(kBehaviorsRemovedEvent, kModuleName, kUpdateCallback);
+    const auto proxy = xMemory();
+    proxy->subscribeToEvent(kBehaviorsAddedEvent, kModuleName, kUpdateCallback);
+    proxy->subscribeToEvent(kBehaviorsRemovedEvent, kModuleName, kUpdateCallback);
   } catch (const std::exception& e) {
     KO_LOG_ERROR(kCategory) << "ZUMemory.subscribeToEvent has thrown an exception: " << e.what();
   }

@@ -93,7 +93,7 @@ class LoaderTask {
   // Abandons an update in progress; returns once no update runs.
   void abortUpdate();
   // Whether an abort came since the last update began.
-  bool isUpdateAborted() const noexcept { return fUpdateAborted.load(); }
+  bool isUpdateAborted() const noexcept { return updateAborted.load(); }
   // The maps of all posture families merged into `out` (union of the sets per tag).
   void getMergedTags(TagMap& out) const;
   // A copy of one posture family's map; empty for a value outside the enumeration.
@@ -113,7 +113,7 @@ class LoaderTask {
   // Counts one expected start; the first one preloads.
   void xRegisterPreload(const std::string& name);
 
-  // With fTagsMutex held.
+  // With tagsMutex held.
   void xRemovePackageAnimations(const std::string& package);
   void xUpdateAnAnimation(BodyTalkLists& speaking, BodyTalkLists& listening, PostureFamily family,
                           const std::string& path, std::size_t offset);
@@ -126,20 +126,20 @@ class LoaderTask {
   std::shared_ptr<ZUAudioPlayerProxy> xAudioPlayer();
   std::shared_ptr<ZUMemoryProxy> xMemory();
 
-  const std::shared_ptr<ko::Session> fSession;
-  const std::shared_ptr<ZURobotBodyTalkInstance> fBodyTalk;
+  const std::shared_ptr<ko::Session> session;
+  const std::shared_ptr<ZURobotBodyTalkInstance> bodyTalk;
 
   std::mutex fServicesMutex;  // the three proxies
-  std::shared_ptr<ZUBehaviorManagerProxy> fBehaviorManager;
-  std::shared_ptr<ZUAudioPlayerProxy> fAudioPlayer;
-  std::shared_ptr<ZUMemoryProxy> fMemory;
+  std::shared_ptr<ZUBehaviorManagerProxy> behaviorManager;
+  std::shared_ptr<ZUAudioPlayerProxy> audioPlayer;
+  std::shared_ptr<ZUMemoryProxy> memory;
 
-  mutable std::mutex fPreloadMutex;
-  std::map<std::string, std::int32_t> fPreloadCounts;
+  mutable std::mutex preloadMutex;
+  std::map<std::string, std::int32_t> preloadCounts;
 
-  mutable std::mutex fTagsMutex;
-  std::array<TagMap, 4> fInstalledTags;
-  std::atomic<bool> fUpdateAborted{false};
+  mutable std::mutex tagsMutex;
+  std::array<TagMap, 4> installedTags;
+  std::atomic<bool> updateAborted{false};
 };
 
 }  // namespace ZU
