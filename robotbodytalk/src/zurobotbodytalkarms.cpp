@@ -111,9 +111,10 @@ void ZURobotBodyTalkArms::doOneIteration() {
         AnimationSet& set;
         ~Clear() { set.currentBehavior.clear(); }
       } clear{set};
-      fBehaviorManager->startBehavior(name);
+      // The limit counts from the start request, however long the start takes.
       const auto deadline =
           std::chrono::steady_clock::now() + fTime.durationOf(kAnimationLimitSeconds);
+      fBehaviorManager->startBehavior(name);
       if (!set.stopped.wait_until(lock, deadline, [&set] { return set.stopSignalled; })) {
         KO_LOG_ERROR(kCategory) << "Error: the bodytalk animation \"" << name
                                 << "\" makes too much time to stop";
