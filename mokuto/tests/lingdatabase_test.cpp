@@ -230,6 +230,11 @@ TEST_F(LingDatabaseTest, DamagedFilesAreRefusedOrAnswerNotFound) {
     EXPECT_EQ(db.wordClasses("ab"),
               (std::vector<ZULingClassFeatures>{{ZU::WORD_CLASS_UNKNOWN, ""}}));
   }
+  // Bytes after the body the header announces are not read.
+  ZULingSyntacticAnalyzerBinaryDatabase longer;
+  ASSERT_TRUE(longer.load(write("longer.bdb", good + "tail")));
+  std::size_t longestPrefix = 0;
+  EXPECT_TRUE(longer.find("ab", 0, longestPrefix).has_value());
 }
 
 TEST_F(LingDatabaseTest, TruncatedAndOutOfDateFilesAreRefused) {

@@ -182,7 +182,8 @@ bool ZULingSyntacticAnalyzerBinaryDatabase::load(const std::string& path) {
   const std::uint32_t tailSize = littleEndian32(header + 12);
   const std::uint64_t bodySize = std::uint64_t{rootOffset} + tailSize;
   const auto fileSize = static_cast<std::uint64_t>(status.st_size);
-  if (bodySize > UINT32_MAX || bodySize != fileSize - kBodyStart)
+  // Bytes after the body are not read.
+  if (bodySize > UINT32_MAX || bodySize > fileSize - kBodyStart)
     return xFail(path, "its header announces a body of " + std::to_string(bodySize) +
                            " bytes, the file holds " + std::to_string(fileSize - kBodyStart));
   if (rootOffset >= bodySize)
@@ -197,7 +198,7 @@ bool ZULingSyntacticAnalyzerBinaryDatabase::load(const std::string& path) {
   }
   std::unique_ptr<std::uint32_t[], BodyDeleter> owned(block + kLead);
   auto* fileStart = reinterpret_cast<char*>(owned.get()) - kBodyStart;
-  if (readFully(file.get(), fileStart, fileSize) != fileSize)
+  if (readFully(file.get(), fileStart, kBodyStart + bodySize) != kBodyStart + bodySize)
     return xFail(path, "its body could not be read whole");
 
   body = std::move(owned);
