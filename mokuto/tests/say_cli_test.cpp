@@ -270,7 +270,10 @@ TEST_F(MokutoCommand, CtrlCStopsTheTextAndStillGivesTheSummary) {
   EXPECT_EQ(WIFEXITED(raw) ? WEXITSTATUS(raw) : -1, 130) << out;
   EXPECT_NE(out.find("^runSound(bells/ding, 50)  stopped"), std::string::npos) << out;
   EXPECT_NE(out.find("Text 1 stopped after"), std::string::npos) << out;
-  EXPECT_NE(out.find(", 2 stopped"), std::string::npos) << out;
+  // The "^wait" is stopped too when the stop comes before the director has begun it.
+  EXPECT_TRUE(out.find(", 2 stopped") != std::string::npos ||
+              out.find(", 3 stopped") != std::string::npos)
+      << out;
 }
 
 TEST_F(MokutoCommand, ReadsTheTextFromStandardInput) {
