@@ -16,10 +16,10 @@
 // subscription). So it waits for a callback of that subscription running in another
 // thread: do not call it while holding a lock that the callback takes.
 //
-// exit() stops the delivery loop, waiting for the callbacks in progress (unless called
-// from one of them), and unregisters; events raised afterwards are kept but not
-// delivered, from any thread. The destructor does the same stop, on any thread but the
-// module's own (the framework sees to it, see ko/reaper.hpp).
+// exit(), from any thread, stops the delivery loop, waiting for the callbacks in progress
+// (unless called from one of them), and unregisters; events raised afterwards are kept
+// but not delivered. The destructor does the same stop, on any thread but the module's
+// own (the framework sees to it, see ko/reaper.hpp).
 
 #include <condition_variable>
 #include <cstdint>
