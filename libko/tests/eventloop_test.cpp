@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <chrono>
 #include <cstdlib>
 #include <stdexcept>
 #include <thread>
@@ -129,8 +130,9 @@ TEST(EventLoopStop, NoStopReturnsWhileAnotherJobRuns) {
     Gate longJobStarted;
     loop->post([&] {
       longJobStarted.open();
-      for (int i = 0; i < 200; ++i)
-        std::this_thread::yield();
+      // Long enough for the stops to begin meanwhile; a sleep rather than yields, which a
+      // loaded machine turns into a time slice each.
+      std::this_thread::sleep_for(std::chrono::milliseconds(1));
       longJobEnded = true;
     });
     ASSERT_TRUE(longJobStarted.wait());
