@@ -327,6 +327,24 @@ void ZUMokuto::xFreeMKID(MKID id) {
   textRegister.freeMKID(id);
 }
 
+void ZUMokuto::xCompileAndLoad(const std::shared_ptr<MKTaskInstruction>& instruction, MKID id) {
+  {
+    std::lock_guard lock(compilerMutex);
+    if (!textRegister.isMKIDStopped(id)) {
+      xEnterStage(ZUMokutoStage::Compiler, id);
+      // The diagnosis may print the job of any registered text meanwhile.
+      std::lock_guard jobLock(instruction->mutex);
+      compiler->process(instruction);
+    }
+  }
+  std::lock_guard lock(loaderMutex);
+  if (!textRegister.isMKIDStopped(id)) {
+    xEnterStage(ZUMokutoStage::Loader, id);
+    std::lock_guard jobLock(instruction->mutex);
+    loader->process(*instruction);
+  }
+}
+
 void ZUMokuto::xSay(const std::shared_ptr<MKTaskInstruction>& instruction) {
   if (!compiler || !loader || !director || !bodyTalk) {
     KO_LOG_ERROR(kMain) << kNotInitialized;
@@ -341,23 +359,7 @@ void ZUMokuto::xSay(const std::shared_ptr<MKTaskInstruction>& instruction) {
     const auto& timeChecker = director->getTimeChecker();
     if (timeChecker && timeChecker->enabled())
       timeChecker->startOfMokuto(id);
-    {
-      std::lock_guard lock(compilerMutex);
-      if (!textRegister.isMKIDStopped(id)) {
-        xEnterStage(ZUMokutoStage::Compiler, id);
-        // The diagnosis may print the job of any registered text meanwhile.
-        std::lock_guard jobLock(instruction->mutex);
-        compiler->process(instruction);
-      }
-    }
-    {
-      std::lock_guard lock(loaderMutex);
-      if (!textRegister.isMKIDStopped(id)) {
-        xEnterStage(ZUMokutoStage::Loader, id);
-        std::lock_guard jobLock(instruction->mutex);
-        loader->process(*instruction);
-      }
-    }
+    xCompileAndLoad(instruction, id);
     {
       std::lock_guard lock(directorMutex);
       if (!textRegister.isMKIDStopped(id)) {
@@ -396,23 +398,7 @@ std::shared_ptr<MKTaskInstruction> ZUMokuto::prepare(const std::string& text,
   const MKID id = xNewMKID(instruction);
   try {
     instruction->postureFamily = bodyTalk->bodyTalk->getPostureFamily();
-    {
-      std::lock_guard lock(compilerMutex);
-      if (!textRegister.isMKIDStopped(id)) {
-        xEnterStage(ZUMokutoStage::Compiler, id);
-        // The diagnosis may print the job of any registered text meanwhile.
-        std::lock_guard jobLock(instruction->mutex);
-        compiler->process(instruction);
-      }
-    }
-    {
-      std::lock_guard lock(loaderMutex);
-      if (!textRegister.isMKIDStopped(id)) {
-        xEnterStage(ZUMokutoStage::Loader, id);
-        std::lock_guard jobLock(instruction->mutex);
-        loader->process(*instruction);
-      }
-    }
+    xCompileAndLoad(instruction, id);
   } catch (...) {
     xFreeMKID(id);
     throw;

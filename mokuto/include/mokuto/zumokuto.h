@@ -145,6 +145,9 @@ class ZUMokuto : public ZUModule {
   std::vector<DiagnosisLine> xDiagnosis();
   void xBindMethods();
   void xEnterStage(ZUMokutoStage stage, MKID id) const;
+  // The compiler and loader stages of a registered text, each under its stage lock and
+  // skipped once the text is stopped.
+  void xCompileAndLoad(const std::shared_ptr<MKTaskInstruction>& instruction, MKID id);
 
   const ZUMokutoOptions fOptions;
 
