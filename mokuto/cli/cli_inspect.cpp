@@ -23,7 +23,7 @@ struct InspectOptions {
   std::string tag;
 };
 
-Json methodsToJson(const ZU::ZUMokuto& service) {
+Json methodsToJson(ServiceHandle& service) {
   Json methods = Json::array();
   for (const auto& info : service.getMethodInfos()) {
     Json parameters = Json::array();
@@ -52,10 +52,10 @@ int withService(const char* command, const InspectOptions& o, Body&& body) {
     EmbeddedServiceOptions options;
     options.speech = "timing";
     options.posture = o.posture;
-    EmbeddedService embedded(options);
+    const std::unique_ptr<ServiceHandle> embedded = openService(options);
     for (const auto& package : o.packages)
-      embedded.service().declareAnimationsPackage(package);
-    body(embedded.service());
+      embedded->declareAnimationsPackage(package);
+    body(*embedded);
   } catch (const ServiceError& e) {
     std::cerr << "mokuto " << command << ": the service cannot start: " << e.what() << std::endl;
     return 1;
@@ -71,7 +71,7 @@ int withService(const char* command, const InspectOptions& o, Body&& body) {
 
 CLI::App* addInspectCommand(CLI::App& app, int& status, const char* name, const char* help,
                             bool withLibraryOptions,
-                            void (*run)(ZU::ZUMokuto&, const InspectOptions&)) {
+                            void (*run)(ServiceHandle&, const InspectOptions&)) {
   auto o = std::make_shared<InspectOptions>();
   CLI::App* command = app.add_subcommand(name, help);
   if (withLibraryOptions) {
@@ -87,7 +87,7 @@ CLI::App* addInspectCommand(CLI::App& app, int& status, const char* name, const 
   if (std::string(name) == "animations")
     command->add_option("tag", o->tag, "The tag")->required();
   command->callback([o, name, run, &status] {
-    status = withService(name, *o, [&o, run](ZU::ZUMokuto& service) { run(service, *o); });
+    status = withService(name, *o, [&o, run](ServiceHandle& service) { run(service, *o); });
   });
   return command;
 }
@@ -98,30 +98,30 @@ void addInspectCommands(CLI::App& app, int& status) {
   addInspectCommand(app, status, "methods",
                     "Print the service's published methods as JSON, in binding order, the "
                     "built-in ones included",
-                    false, [](ZU::ZUMokuto& service, const InspectOptions&) {
+                    false, [](ServiceHandle& service, const InspectOptions&) {
                       std::cout << dumpJson(methodsToJson(service)) << std::endl;
                     });
   addInspectCommand(app, status, "tags",
                     "Print the tags that the service knows, one a line (as _getTagList)", true,
-                    [](ZU::ZUMokuto& service, const InspectOptions&) {
+                    [](ServiceHandle& service, const InspectOptions&) {
                       for (const auto& tag : service._getTagList())
                         std::cout << tag << '\n';
                     });
   addInspectCommand(app, status, "animations",
                     "Print the animations bound to a tag, one a line (as _getAnimationsByTag)",
-                    true, [](ZU::ZUMokuto& service, const InspectOptions& o) {
+                    true, [](ServiceHandle& service, const InspectOptions& o) {
                       for (const auto& animation : service._getAnimationsByTag(o.tag))
                         std::cout << animation << '\n';
                     });
   addInspectCommand(app, status, "diagnosis",
                     "Print the service's diagnosis lines (as _diagnosis logs them)", true,
-                    [](ZU::ZUMokuto& service, const InspectOptions&) {
+                    [](ServiceHandle& service, const InspectOptions&) {
                       for (const auto& line : service.diagnosisLines())
                         std::cout << line << '\n';
                     });
   addInspectCommand(
       app, status, "page", "Print the service's tag page (HTML, as httpGet answers it)", true,
-      [](ZU::ZUMokuto& service, const InspectOptions&) { std::cout << service.tagPage(); });
+      [](ServiceHandle& service, const InspectOptions&) { std::cout << service.tagPage(); });
 }
 
 }  // namespace mokuto::cli

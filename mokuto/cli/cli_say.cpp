@@ -225,12 +225,14 @@ int say(SayOptions& o) {
     serviceOptions.language = o.language;
     serviceOptions.posture = o.posture;
     serviceOptions.recordAudio = !o.wav.empty();
+    if (const std::string why = remoteRefusal(serviceOptions, o.dryRun, !o.wav.empty());
+        !why.empty())
+      return usage(why);
     // Blocked before the robot's threads start, so that they all inherit the mask and the
     // watcher below alone takes the signals.
     const InterruptMask interruptMask;
-    EmbeddedService embedded(serviceOptions);
-    ZU::ZUMokuto& service = embedded.service();
-    robotsim::Robot& robot = embedded.robot();
+    const std::unique_ptr<ServiceHandle> embedded = openService(serviceOptions);
+    ServiceHandle& service = *embedded;
 
     try {
       if (!o.mode.empty())
@@ -251,19 +253,20 @@ int say(SayOptions& o) {
     const ZU::ZUValue noConfiguration;
 
     if (o.dryRun) {
-      robot.timeline()->clear();
+      service.timeline()->clear();
       const auto job = service.prepare(*o.text, configuration ? *configuration : noConfiguration);
       std::cout << dumpJson(preparedJobToJson(*job)) << std::endl;
       if (timelineFile.is_open())
-        robot.timeline()->writeJsonLines(timelineFile);
+        service.timeline()->writeJsonLines(timelineFile);
     } else {
-      const auto recorder = SayTimeline::create(robot.timeline(), o.quiet ? nullptr : &std::cout);
+      const auto recorder =
+          SayTimeline::create(service.timeline(), o.quiet ? nullptr : &std::cout);
       service.setDirectorObserver(recorder);
-      embedded.setStageObserver([recorder](ZU::ZUMokutoStage stage, ZU::MKID id) {
+      service.setStageObserver([recorder](ZU::ZUMokutoStage stage, ZU::MKID id) {
         if (stage == ZU::ZUMokutoStage::Compiler)
           recorder->accepted(id);
       });
-      robot.timeline()->clear();
+      service.timeline()->clear();
       recorder->begin(*o.text);
       bool interrupted = false;
       {
@@ -276,13 +279,14 @@ int say(SayOptions& o) {
       }
       if (interrupted)
         status = kInterrupted;
+      service.settle(recorder->id());
       ZU::MKID id = 0;
       const SaySummary summary = recorder->end(&id);
-      embedded.setStageObserver(nullptr);
+      service.setStageObserver(nullptr);
       service.setDirectorObserver(nullptr);
       SayTimeline::printSummary(std::cout, id, summary);
       if (!o.wav.empty()) {
-        robot.speech()->saveRecording(o.wav);
+        service.saveRecording(o.wav);
         std::cout << "Audio written to " << o.wav << std::endl;
       }
       if (timelineFile.is_open()) {

@@ -98,6 +98,11 @@ void SayTimeline::accepted(ZU::MKID id) {
   fTimeline->record(kService, "say", ko::AnyValue::List{id, std::move(text)});
 }
 
+ZU::MKID SayTimeline::id() const {
+  std::lock_guard lock(fMutex);
+  return fId;
+}
+
 void SayTimeline::onAction(const ZU::DirectorActionReport& report) {
   std::size_t index = 0;
   {

@@ -51,6 +51,8 @@ class SayTimeline : public ZU::DirectorObserver, public std::enable_shared_from_
   void begin(const std::string& text);
   // The service has taken the text up as `id`: the "say" entry.
   void accepted(ZU::MKID id);
+  // The text's identifier once accepted, else 0.
+  ZU::MKID id() const;
   void onAction(const ZU::DirectorActionReport& report) override;
   // The service's say has returned: the "end" entry, with the summary as its result.
   // `id` (when given) receives the text's identifier.

@@ -2,10 +2,12 @@
 #include <CLI/CLI.hpp>
 
 #include "cli_commands.h"
+#include "cli_service.h"
 
 int main(int argc, char** argv) {
   CLI::App app{"mokuto: speech animation for a humanoid robot"};
   app.require_subcommand(1);
+  mokuto::cli::addConnectOptions(app);
   int status = 0;
   mokuto::cli::addConfigCommand(app, status);
   mokuto::cli::addParseCommand(app, status);

@@ -13,6 +13,7 @@ int main(int argc, char** argv) {
   zefoko::addSpeakCommand(app, status);
   zefoko::addBodyTalkCommand(app, status);
   zefoko::addServeCommand(app, status);
+  zefoko::addKeysCommand(app, status);
   CLI11_PARSE(app, argc, argv);
   return status;
 }
