@@ -295,8 +295,9 @@ class Builder {
       return emit(AnyValue::integer(static_cast<std::int64_t>(v), 8, true));
     return emit(AnyValue::integer(static_cast<std::int64_t>(v), 8, false));
   }
+  // The int64 format may carry a value of any sign.
   bool visit_negative_integer(std::int64_t v) {
-    return emit(AnyValue::integer(v, v >= kInt32Min ? 4 : 8, true));
+    return emit(AnyValue::integer(v, v >= kInt32Min && v <= kInt32Max ? 4 : 8, true));
   }
   bool visit_float32(float v) { return emit(AnyValue::floating(v, 4)); }
   bool visit_float64(double v) { return emit(AnyValue::floating(v, 8)); }

@@ -294,3 +294,61 @@ TEST_F(RemoteTest, ConnectedProcessesPublishTheirServicesAgainWhenTheListeningOn
 
 }  // namespace
 }  // namespace ko
+
+namespace ko {
+namespace {
+
+TEST(RemoteSecurity, OnlyLoopbackAndIpcEndpointsGoWithoutKeys) {
+  const struct {
+    const char* endpoint;
+    bool local;
+  } cases[] = {
+      {"ipc:///tmp/robot", true},          {"tcp://127.0.0.1:5555", true},
+      {"tcp://127.1.2.3:*", true},         {"tcp://localhost:5555", true},
+      {"tcp://[::1]:5555", true},          {"tcp://0.0.0.0:5555", false},
+      {"tcp://*:5555", false},             {"tcp://192.168.1.20:5555", false},
+      {"tcp://127.0.0.1.example:1", false}, {"tcp://robot.local:5555", false},
+  };
+  for (const auto& c : cases)
+    EXPECT_EQ(remote::isLocalEndpoint(c.endpoint), c.local) << c.endpoint;
+  Session session;
+  EXPECT_THROW(session.listen("tcp://*:0"), Error);
+  EXPECT_THROW(session.connect("tcp://192.0.2.1:5555"), Error);
+}
+
+TEST(RemoteSecurity, CurveLinksOnlyTheClientsWhoseKeysAreAllowed) {
+  log::ScopedCapture capture(log::Warning);
+  const auto server = remote::makeKeyPair();
+  const auto allowed = remote::makeKeyPair();
+  const auto stranger = remote::makeKeyPair();
+  RemoteOptions serving;
+  serving.curve.secretKey = server.secretKey;
+  serving.curve.clientKeys = {allowed.publicKey};
+  Session hub;
+  const std::string at = hub.listen("tcp://127.0.0.1:*", serving);
+  DynamicObjectBuilder answer;
+  answer.advertiseMethod("value", [] { return 42; });
+  hub.registerService("Answer", answer.object());
+
+  const auto client = [&](const remote::KeyPair& keys) {
+    RemoteOptions o;
+    o.curve.secretKey = keys.secretKey;
+    o.curve.serverKey = server.publicKey;
+    auto s = std::make_shared<Session>();
+    s->connect(at, o);
+    return s;
+  };
+  const auto friendly = client(allowed);
+  ASSERT_TRUE(friendly->waitForLink(10s));
+  EXPECT_EQ(friendly->service("Answer").value(10000)->call<int>("value"), 42);
+  const auto unknown = client(stranger);
+  EXPECT_TRUE(test::eventually(
+      [&] { return capture->containsPart("ko.remote", log::Warning, "Refused a connection"); }));
+  EXPECT_FALSE(unknown->isLinked());
+  unknown->closeLink();
+  friendly->closeLink();
+  hub.closeLink();
+}
+
+}  // namespace
+}  // namespace ko

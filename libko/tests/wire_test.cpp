@@ -65,6 +65,14 @@ TEST(Wire, EveryKindComesBackExactly) {
   }
 }
 
+TEST(Wire, AnIntegerIsTypedByItsValueNotByItsFormat) {
+  // A positive value in the int64 format; a small one in the uint64 format.
+  EXPECT_EQ(decodeValue(std::string("\xd3\x00\xe0\x60\x00\x00\x00\x00\x97", 9)).signature(),
+            "l");
+  EXPECT_EQ(decodeValue(std::string("\xcf\x00\x00\x00\x00\x00\x00\x00\x05", 9)).signature(),
+            "i");
+}
+
 TEST(Wire, ObjectsDoNotTravel) {
   EXPECT_THROW(encodeValue(AnyValue::pointerTo(AnyValue(1))), Error);
 }
