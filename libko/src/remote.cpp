@@ -4,6 +4,7 @@
 #include <zmq.h>
 
 #include <algorithm>
+#include <chrono>
 #include <cctype>
 #include <fstream>
 #include <set>
@@ -100,13 +101,26 @@ namespace detail {
 
 // ---- ServingPool -----------------------------------------------------------------------
 
+// A job that finds no idle thread gets a new one at once while the pool has fewer than
+// kCoreThreads; beyond, the supervisor adds a thread whenever the oldest job has waited
+// kStall: cheap calls in numbers share a few threads, and a call that blocks never keeps the
+// next from running for more than kStall.
+constexpr std::size_t kCoreThreads = 8;
+constexpr auto kStall = std::chrono::milliseconds(2);
+
 struct ServingPool::State {
+  struct Job {
+    std::function<void()> run;
+    std::chrono::steady_clock::time_point queued;
+  };
   std::string name;
   std::size_t maxThreads = 1;
   std::mutex mutex;
   std::condition_variable wake;
-  std::deque<std::function<void()>> jobs;
+  std::condition_variable supervise;
+  std::deque<Job> jobs;
   std::vector<std::thread> threads;
+  std::thread supervisor;
   std::size_t idle = 0;
   bool stopping = false;
   bool warnedFull = false;
@@ -122,7 +136,7 @@ void servingThread(const std::shared_ptr<ServingPool::State>& s) {
     --s->idle;
     if (s->stopping)
       return;
-    std::function<void()> job = std::move(s->jobs.front());
+    std::function<void()> job = std::move(s->jobs.front().run);
     s->jobs.pop_front();
     lock.unlock();
     try {
@@ -134,6 +148,35 @@ void servingThread(const std::shared_ptr<ServingPool::State>& s) {
     }
     job = nullptr;  // what it holds goes outside the lock
     lock.lock();
+  }
+}
+
+// With the state's mutex held.
+void addThread(const std::shared_ptr<ServingPool::State>& s) {
+  if (s->threads.size() < s->maxThreads) {
+    s->threads.emplace_back([s] { servingThread(s); });
+  } else if (!s->warnedFull) {
+    s->warnedFull = true;
+    KO_LOG_WARNING("ko.remote") << s->name << ": all " << s->maxThreads
+                                << " serving threads are busy; calls wait for one";
+  }
+}
+
+void supervisorThread(const std::shared_ptr<ServingPool::State>& s) {
+  std::unique_lock lock(s->mutex);
+  while (!s->stopping) {
+    if (s->jobs.size() <= s->idle) {
+      s->supervise.wait(lock);
+      continue;
+    }
+    const auto due = s->jobs.front().queued + kStall;
+    if (std::chrono::steady_clock::now() >= due) {
+      addThread(s);
+      s->wake.notify_one();
+      s->supervise.wait_for(lock, kStall);  // the new thread takes the job meanwhile
+    } else {
+      s->supervise.wait_until(lock, due);
+    }
   }
 }
 }  // namespace
@@ -152,16 +195,14 @@ void ServingPool::post(std::function<void()> job) {
   std::lock_guard lock(state_->mutex);
   if (state_->stopping)
     return;
-  state_->jobs.push_back(std::move(job));
-  // Every job waiting beyond the idle threads gets a thread of its own: a job that blocks
-  // never keeps the next from running.
+  state_->jobs.push_back({std::move(job), std::chrono::steady_clock::now()});
   if (state_->jobs.size() > state_->idle) {
-    if (state_->threads.size() < state_->maxThreads) {
-      state_->threads.emplace_back([s = state_] { servingThread(s); });
-    } else if (!state_->warnedFull) {
-      state_->warnedFull = true;
-      KO_LOG_WARNING("ko.remote") << state_->name << ": all " << state_->maxThreads
-                                  << " serving threads are busy; calls wait for one";
+    if (state_->threads.size() < std::min(kCoreThreads, state_->maxThreads)) {
+      addThread(state_);
+    } else {
+      if (!state_->supervisor.joinable())
+        state_->supervisor = std::thread([s = state_] { supervisorThread(s); });
+      state_->supervise.notify_one();
     }
   }
   state_->wake.notify_one();
@@ -169,15 +210,20 @@ void ServingPool::post(std::function<void()> job) {
 
 void ServingPool::stop() {
   std::vector<std::thread> threads;
-  std::deque<std::function<void()>> dropped;
+  std::deque<State::Job> dropped;
+  std::thread supervisor;
   {
     std::lock_guard lock(state_->mutex);
     state_->stopping = true;
     dropped.swap(state_->jobs);
     threads.swap(state_->threads);
+    supervisor = std::move(state_->supervisor);
   }
   state_->wake.notify_all();
+  state_->supervise.notify_all();
   dropped.clear();
+  if (supervisor.joinable())
+    supervisor.join();
   for (auto& t : threads) {
     if (t.get_id() == std::this_thread::get_id())
       t.detach();  // this job's thread leaves once the job returns

@@ -44,9 +44,10 @@ struct RemoteOptions {
   // How long registering a service, looking one up or listing the directory waits for
   // the listening process.
   std::chrono::milliseconds requestTimeout{10000};
-  // Threads that serve the calls and signals of other processes, at most; they are
-  // started as calls come (each call runs on a thread of its own, as a call made in the
-  // process runs in its caller's thread).
+  // Threads that serve the calls and signals of other processes, at most. They are started
+  // as calls come: a few at once, then one more whenever a call has waited 2 ms for a
+  // thread, so that a call that blocks (a say, a blocking bookmark) never holds up the next
+  // for longer, as a call made in the process runs in its caller's thread.
   std::size_t maxServingThreads = 256;
   CurveKeys curve;
 };
