@@ -25,8 +25,8 @@ class BookmarkCounter : public ZU::ZUModule {
  public:
   BookmarkCounter(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
       : ZU::ZUModule(broker, name) {
-    beginMethod("onBookmark", "BookmarkCounter", "Counts a bookmark.");
-    bindMethod(&BookmarkCounter::onBookmark);
+    bindMethods("BookmarkCounter",
+                {{"onBookmark", &BookmarkCounter::onBookmark, "Counts a bookmark."}});
   }
   void onBookmark(const std::string& /*key*/, const ZU::ZUValue& /*value*/,
                   const std::string& /*message*/) {

@@ -63,35 +63,36 @@ ZUAudioPlayer::ZUAudioPlayer(const std::shared_ptr<ZU::ZUBroker>& broker, const 
 ZUAudioPlayer::~ZUAudioPlayer() = default;
 
 void ZUAudioPlayer::xBindMethods() {
-  beginMethod("loadSoundSet", kClass, "Loads a sound set.");
-  describeParameter("soundSet", "The name of the sound set (its folder).");
-  bindMethod(&ZUAudioPlayer::loadSoundSet);
-
-  beginMethod("unloadSoundSet", kClass, "Unloads a sound set.");
-  describeParameter("soundSet", "The name of a loaded sound set.");
-  bindMethod(&ZUAudioPlayer::unloadSoundSet);
-
-  beginMethod("getLoadedSoundSetsList", kClass, "Lists the loaded sound sets.");
-  describeReturn("soundSets", "Their names, in ascending order.");
-  bindMethod(&ZUAudioPlayer::getLoadedSoundSetsList);
-
-  beginMethod("playSoundSetFile", kClass, "Plays a file of a loaded sound set to its end.");
-  describeParameter("soundSet", "The name of a loaded sound set.");
-  describeParameter("soundFile", "The file's name, with or without \".wav\".");
-  bindMethod<void(const std::string&, const std::string&)>(&ZUAudioPlayer::playSoundSetFile);
-
-  beginMethod("playSoundSetFile", kClass, "Plays a file of a loaded sound set.");
-  describeParameter("soundSet", "The name of a loaded sound set.");
-  describeParameter("soundFile", "The file's name, with or without \".wav\".");
-  describeParameter("position", "Where to begin in the file, in seconds.");
-  describeParameter("volume", "The volume, from 0 to 1.");
-  describeParameter("balance", "The balance, from -1 (left) to 1 (right).");
-  describeParameter("loop", "True to play the file again and again until stopped.");
-  bindMethod<void(const std::string&, const std::string&, double, double, double, bool)>(
-      &ZUAudioPlayer::playSoundSetFile);
-
-  beginMethod("stopAll", kClass, "Stops every play.");
-  bindMethod(&ZUAudioPlayer::stopAll);
+  const ZU::ZUMethodParameter soundSet{"soundSet", "The name of a loaded sound set."};
+  const ZU::ZUMethodParameter soundFile{"soundFile", "The file's name, with or without \".wav\"."};
+  const std::vector<ZU::ZUMethodDeclaration> methods = {
+      {"loadSoundSet",
+       &ZUAudioPlayer::loadSoundSet,
+       "Loads a sound set.",
+       {{"soundSet", "The name of the sound set (its folder)."}}},
+      {"unloadSoundSet", &ZUAudioPlayer::unloadSoundSet, "Unloads a sound set.", {soundSet}},
+      {"getLoadedSoundSetsList",
+       &ZUAudioPlayer::getLoadedSoundSetsList,
+       "Lists the loaded sound sets.",
+       {},
+       {"soundSets", "Their names, in ascending order."}},
+      {"playSoundSetFile",
+       ZU::overload<void(const std::string&, const std::string&)>(&ZUAudioPlayer::playSoundSetFile),
+       "Plays a file of a loaded sound set to its end.",
+       {soundSet, soundFile}},
+      {"playSoundSetFile",
+       ZU::overload<void(const std::string&, const std::string&, double, double, double, bool)>(
+           &ZUAudioPlayer::playSoundSetFile),
+       "Plays a file of a loaded sound set.",
+       {soundSet,
+        soundFile,
+        {"position", "Where to begin in the file, in seconds."},
+        {"volume", "The volume, from 0 to 1."},
+        {"balance", "The balance, from -1 (left) to 1 (right)."},
+        {"loop", "True to play the file again and again until stopped."}}},
+      {"stopAll", &ZUAudioPlayer::stopAll, "Stops every play."},
+  };
+  bindMethods(kClass, methods);
 }
 
 void ZUAudioPlayer::xRecord(const std::string& operation, ko::AnyValue arguments,
