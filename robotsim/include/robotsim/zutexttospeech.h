@@ -4,7 +4,8 @@
 // benchmarks, on a timing-only estimate), plays them on a silent output with a real-time
 // playback clock, raises "ZUTextToSpeech/CurrentBookMark" and "ZUTextToSpeech/Status"
 // through ZUMemory, holds the speech at each "mrkpause" bookmark while the blocking
-// bookmark handler's "_mrkpauseCallback" runs, and keeps a recording of what it played.
+// bookmark handler's "_mrkpauseCallback" runs, and keeps a recording of what it played
+// and the audio times of its words.
 //
 // Threads: calls arrive on ko threads; posted says run one at a time, in the order they
 // were posted, on the module's own one-thread event loop and wait there until their text
@@ -108,6 +109,9 @@ class ZUTextToSpeech : public ZU::ZUModule {
   // ---- inspection ----
   // The marks of a text that ended (the last 256 texts are kept); empty when unknown.
   std::vector<SpeechMarkRecord> markRecords(int id) const;
+  // The words of a text that ended, as espeak-ng spoke them (none from the timing
+  // backend), in the same way.
+  std::vector<SpeechWordRecord> wordRecords(int id) const;
   int sampleRate() const;
 
  private:
@@ -137,7 +141,11 @@ class ZUTextToSpeech : public ZU::ZUModule {
   mutable std::mutex fMutex;
   Settings fSettings;
   std::map<int, std::shared_ptr<SpeechUtterance>> fTexts;  // in progress
-  std::map<int, std::vector<SpeechMarkRecord>> fHistory;   // ended
+  struct Spoken {
+    std::vector<SpeechMarkRecord> marks;
+    std::vector<SpeechWordRecord> words;
+  };
+  std::map<int, Spoken> fHistory;  // ended
   int fNextDirectId = 1 << 30;
   std::uint64_t fStopAllGeneration = 0;  // counts the calls of stopAll
   ko::AnyObject fMemory;                 // cached lookup of the memory service
