@@ -12,6 +12,7 @@
 #include <thread>
 
 #include "ko/log.hpp"
+#include "speechjapanese.h"
 #include "speechsynthesizer.h"
 
 namespace robotsim {
@@ -215,10 +216,19 @@ class EspeakSynthesizer : public SpeechSynthesizer {
   bool producesAudio() const override { return true; }
   std::vector<std::string> languages() const override { return fThread.languages(); }
 
+  // Japanese is read into kana here, in the caller's thread.
   void synthesize(const SpeechScript& script, const SpeechVoiceSettings& voice,
                   std::shared_ptr<SpeechPerformance> performance) override {
     std::vector<SpeechSourceSpan> sources;
-    std::string ssml = toEspeakSsml(script, &sources);
+    std::string ssml;
+    try {
+      ssml = voice.language == "Japanese"
+                 ? toEspeakSsml(JapaneseReadings::shared().read(script), &sources)
+                 : toEspeakSsml(script, &sources);
+    } catch (const std::exception& e) {
+      performance->fail(e.what());
+      return;
+    }
     fThread.post([thread = &fThread, ssml = std::move(ssml), sources = std::move(sources), voice,
                   performance = std::move(performance)] {
       if (performance->isCancelled()) {

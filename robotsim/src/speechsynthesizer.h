@@ -1,8 +1,8 @@
 #pragma once
 // The speech engine's synthesis backends: espeak-ng (real audio, on the one thread of the
-// process that owns espeak-ng, with the words' audio times) and a timing-only estimate
-// from the text. Both write into a SpeechPerformance and report the same bookmarks in
-// the same order.
+// process that owns espeak-ng, with the words' audio times; Japanese read into kana
+// first, in the caller's thread) and a timing-only estimate from the text. Both write
+// into a SpeechPerformance and report the same bookmarks in the same order.
 //
 // A synthesizer's functions may be called from any thread.
 
