@@ -42,8 +42,12 @@ class SpeechSynthesizer {
 
 // Raises std::runtime_error when espeak-ng cannot be initialised.
 std::unique_ptr<SpeechSynthesizer> makeEspeakSynthesizer();
-// Durations of `charactersPerSecond` characters of text a second at speed 100, pauses as
-// written; no audio, at espeak-ng's sample rate.
+// How many characters of a text, as written, espeak-ng speaks a second in `language` at
+// speed 100.
+double speechCharactersPerSecond(const std::string& language);
+// Durations of the text at `charactersPerSecond` characters a second at speed 100 (0: the
+// language's own rate), pauses as written; no audio, at espeak-ng's sample rate, and no
+// words.
 std::unique_ptr<SpeechSynthesizer> makeTimingSynthesizer(double charactersPerSecond);
 
 }  // namespace robotsim

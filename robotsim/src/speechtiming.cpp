@@ -21,7 +21,7 @@ std::size_t characterCount(const std::string& text) {
 class TimingSynthesizer : public SpeechSynthesizer {
  public:
   explicit TimingSynthesizer(double charactersPerSecond)
-      : fCharactersPerSecond(charactersPerSecond > 0 ? charactersPerSecond : 14.0) {}
+      : fCharactersPerSecond(charactersPerSecond) {}
 
   int sampleRate() const override { return kTimingSampleRate; }
   bool producesAudio() const override { return false; }
@@ -36,7 +36,9 @@ class TimingSynthesizer : public SpeechSynthesizer {
   void synthesize(const SpeechScript& script, const SpeechVoiceSettings& voice,
                   std::shared_ptr<SpeechPerformance> performance) override {
     const double speed = voice.speed > 0 ? static_cast<double>(voice.speed) / 100.0 : 1.0;
-    const double samplesPerCharacter = kTimingSampleRate / (fCharactersPerSecond * speed);
+    const double rate =
+        fCharactersPerSecond > 0 ? fCharactersPerSecond : speechCharactersPerSecond(voice.language);
+    const double samplesPerCharacter = kTimingSampleRate / (rate * speed);
     double position = 0;
     for (const auto& part : script.parts) {
       switch (part.kind) {
@@ -59,6 +61,12 @@ class TimingSynthesizer : public SpeechSynthesizer {
 };
 
 }  // namespace
+
+double speechCharactersPerSecond(const std::string& language) {
+  // Measured on espeak-ng: Japanese counts kanji and kana alike, and a kanji often reads
+  // as two kana or more.
+  return language == "Japanese" ? 5.9 : 14.0;
+}
 
 std::unique_ptr<SpeechSynthesizer> makeTimingSynthesizer(double charactersPerSecond) {
   return std::make_unique<TimingSynthesizer>(charactersPerSecond);

@@ -197,11 +197,12 @@ TEST(JapaneseTags, MarksAnywhereKeepTheirOrderAndTheirWords) {
 // The speech engine alone, in Japanese on espeak-ng, without waiting in real time.
 class JapaneseSpeech {
  public:
-  JapaneseSpeech()
+  explicit JapaneseSpeech(
+      ZUTextToSpeechOptions::Backend backend = ZUTextToSpeechOptions::Backend::Espeak)
       : broker(ZU::ZUBroker::create(std::make_shared<ko::Session>())),
         timeline(std::make_shared<Timeline>()),
         module(ZU::ZUModule::createModule<ZUTextToSpeech>(broker, "ZUTextToSpeech",
-                                                          options(timeline))),
+                                                          options(backend, timeline))),
         tts(broker) {}
 
   // Speaks the text to its end; its id.
@@ -225,8 +226,10 @@ class JapaneseSpeech {
   ZU::ZUTextToSpeechProxy tts;
 
  private:
-  static ZUTextToSpeechOptions options(std::shared_ptr<Timeline> timeline) {
+  static ZUTextToSpeechOptions options(ZUTextToSpeechOptions::Backend backend,
+                                       std::shared_ptr<Timeline> timeline) {
     ZUTextToSpeechOptions o;
+    o.backend = backend;
     o.language = "Japanese";
     o.playbackRate = kSpeechAsFastAsPossible;
     o.recordAudio = false;
@@ -291,6 +294,28 @@ TEST(JapaneseSpeaking, EachBookmarkComesWithTheWordAfterIt) {
       continue;
     }
     EXPECT_NEAR(static_cast<double>(mark.audioUs), static_cast<double>(word->audioUs), 80'000);
+  }
+}
+
+// The timing engine's Japanese lasts about as long as espeak-ng's, its bookmarks near
+// espeak-ng's.
+TEST(JapaneseSpeaking, TheTimingEngineReadsJapaneseAtItsOwnRate) {
+  const std::string text =
+      "こんにちは。\\mrk=1\\私はロボットです。\\mrk=2\\みなさんと一緒にお話しできて"
+      "\\mrk=3\\うれしいです。\\mrk=4\\昨日は友達と公園で\\mrk=5\\遊びました。";
+  JapaneseSpeech espeak;
+  JapaneseSpeech timing(ZUTextToSpeechOptions::Backend::Timing);
+  const int spokenId = espeak.speak(text);
+  const int estimatedId = timing.speak(text);
+  const auto spoken = espeak.module->markRecords(spokenId);
+  const auto estimated = timing.module->markRecords(estimatedId);
+  const auto duration = static_cast<double>(espeak.durationUs(spokenId));
+  EXPECT_NEAR(static_cast<double>(timing.durationUs(estimatedId)) / duration, 1.0, 0.15);
+  ASSERT_EQ(spoken.size(), estimated.size());
+  for (std::size_t i = 0; i < spoken.size(); ++i) {
+    EXPECT_NEAR(static_cast<double>(estimated[i].audioUs), static_cast<double>(spoken[i].audioUs),
+                0.15 * duration)
+        << "bookmark " << spoken[i].number;
   }
 }
 
