@@ -298,11 +298,11 @@ TEST(JapaneseSpeaking, EachBookmarkComesWithTheWordAfterIt) {
 }
 
 // The timing engine's Japanese lasts about as long as espeak-ng's, its bookmarks near
-// espeak-ng's.
+// espeak-ng's; the blanks that the service puts around bookmarks are not read.
 TEST(JapaneseSpeaking, TheTimingEngineReadsJapaneseAtItsOwnRate) {
   const std::string text =
-      "こんにちは。\\mrk=1\\私はロボットです。\\mrk=2\\みなさんと一緒にお話しできて"
-      "\\mrk=3\\うれしいです。\\mrk=4\\昨日は友達と公園で\\mrk=5\\遊びました。";
+      "こんにちは。 \\mrk=1\\ 私はロボットです。 \\mrk=2\\ みなさんと一緒にお話しできて "
+      "\\mrk=3\\ うれしいです。 \\mrk=4\\ 昨日は友達と公園で \\mrk=5\\ 遊びました。";
   JapaneseSpeech espeak;
   JapaneseSpeech timing(ZUTextToSpeechOptions::Backend::Timing);
   const int spokenId = espeak.speak(text);
