@@ -47,6 +47,8 @@ INSTANTIATE_TEST_SUITE_P(
         ReadingCase{"今日はいい天気ですね。", "キョーワ イイ テンキデスネ。"},
         ReadingCase{"3人で2024年に１０，０００円と3.14",
                     "サンニンデ ニセンニジュウヨンネンニ イチマンエント サンテンイチヨン"},
+        ReadingCase{"8600と1000000000000と007と0",
+                    "ハッセンロッピャクト イッチョウト ゼロゼロナナト ゼロ"},
         ReadingCase{
             "Ｈｅｌｌｏ worldは、ＡＢＣです。",
             "<voice name=\"en\">Hello world</voice>ワ、<voice name=\"en\"> ABC</voice>デス。"},
@@ -58,27 +60,6 @@ INSTANTIATE_TEST_SUITE_P(
         ReadingCase{"博\\mrk=1\\物館\\mrk=2\\ ,\\pau=300\\ ロボ\\mrk=3\\ット",
                     "<mark name=\"0\"/>ハクブツカン<mark name=\"1\"/>, <break strength=\"x-weak\" "
                     "time=\"300ms\"/><mark name=\"2\"/>ロボット"}));
-
-struct NumberCase {
-  const char* digits;
-  const char* reading;
-};
-
-TEST(JapaneseNumbers, ReadAsJapaneseNumbers) {
-  for (const NumberCase c : {NumberCase{"0", "ゼロ"},
-                             {"10", "ジュウ"},
-                             {"300", "サンビャク"},
-                             {"1000", "セン"},
-                             {"8600", "ハッセンロッピャク"},
-                             {"10000", "イチマン"},
-                             {"1,000,000", "ヒャクマン"},
-                             {"100000000", "イチオク"},
-                             {"1000000000000", "イッチョウ"},
-                             {"007", "ゼロゼロナナ"},
-                             {"0.5", "ゼロテンゴ"}}) {
-    EXPECT_EQ(japaneseNumberReading(c.digits), c.reading) << c.digits;
-  }
-}
 
 TEST(JapaneseReadings, UnreadableKanjiAreLoggedOnceAndLeftOut) {
   JapaneseReadings reader(JapaneseReadings::kDictionary);
@@ -194,61 +175,42 @@ TEST(JapaneseTags, MarksAnywhereKeepTheirOrderAndTheirWords) {
 
 // ---- spoken by espeak-ng --------------------------------------------------------------
 
-// The speech engine alone, in Japanese on espeak-ng, without waiting in real time.
-class JapaneseSpeech {
- public:
-  explicit JapaneseSpeech(
-      ZUTextToSpeechOptions::Backend backend = ZUTextToSpeechOptions::Backend::Espeak)
-      : broker(ZU::ZUBroker::create(std::make_shared<ko::Session>())),
-        timeline(std::make_shared<Timeline>()),
-        module(ZU::ZUModule::createModule<ZUTextToSpeech>(broker, "ZUTextToSpeech",
-                                                          options(backend, timeline))),
-        tts(broker) {}
-
-  // Speaks the text to its end; its id.
-  int speak(const std::string& text) {
-    const int id = tts.post_say(text);
-    EXPECT_FALSE(tts.wait(id, 0));
-    return id;
-  }
-  std::int64_t durationUs(int id) const {
-    for (const auto& entry : timeline->entries("ZUTextToSpeech", "done")) {
-      if (entry.arguments.asList().at(0).to<int>() == id)
-        return entry.result.asMap().at(0).second.to<std::int64_t>();
-    }
-    ADD_FAILURE() << "text " << id << " did not end";
-    return 0;
-  }
-
-  std::shared_ptr<ZU::ZUBroker> broker;
-  std::shared_ptr<Timeline> timeline;
-  std::shared_ptr<ZUTextToSpeech> module;
-  ZU::ZUTextToSpeechProxy tts;
-
- private:
-  static ZUTextToSpeechOptions options(ZUTextToSpeechOptions::Backend backend,
-                                       std::shared_ptr<Timeline> timeline) {
-    ZUTextToSpeechOptions o;
-    o.backend = backend;
-    o.language = "Japanese";
-    o.playbackRate = kSpeechAsFastAsPossible;
-    o.recordAudio = false;
-    o.timeline = std::move(timeline);
-    return o;
-  }
+// What the speech engine made of a Japanese text, spoken without waiting in real time.
+struct Spoken {
+  std::vector<SpeechMarkRecord> marks;
+  std::vector<SpeechWordRecord> words;
+  double durationUs = 0;
 };
+
+Spoken speak(const std::string& text,
+             ZUTextToSpeechOptions::Backend backend = ZUTextToSpeechOptions::Backend::Espeak) {
+  const auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
+  ZUTextToSpeechOptions options;
+  options.backend = backend;
+  options.language = "Japanese";
+  options.playbackRate = kSpeechAsFastAsPossible;
+  options.recordAudio = false;
+  options.timeline = std::make_shared<Timeline>();
+  const auto tts = ZU::ZUModule::createModule<ZUTextToSpeech>(broker, "ZUTextToSpeech", options);
+  ZU::ZUTextToSpeechProxy proxy(broker);
+  const int id = proxy.post_say(text);
+  EXPECT_FALSE(proxy.wait(id, 0));
+  Spoken spoken{tts->markRecords(id), tts->wordRecords(id)};
+  for (const auto& done : options.timeline->entries("ZUTextToSpeech", "done"))
+    spoken.durationUs = done.result.asMap().at(0).second.to<double>();
+  return spoken;
+}
 
 // espeak-ng reads kana only: written in kanji or in kana, a sentence lasts the same.
 TEST(JapaneseSpeaking, AKanjiSentenceLastsAsLongAsInKana) {
-  JapaneseSpeech speech;
   for (const auto& [kanji, kana] : std::vector<std::pair<std::string, std::string>>{
            {"今日はいい天気ですね。", "きょうはいいてんきですね。"},
            {"博物館に行きました。", "はくぶつかんにいきました。"},
            {"昨日友達と公園で遊びました。", "きのうともだちとこうえんであそびました。"},
            {"東京タワーは333メートルです。",
             "とうきょうタワーはさんびゃくさんじゅうさんメートルです。"}}) {
-    const auto a = static_cast<double>(speech.durationUs(speech.speak(kanji)));
-    const auto b = static_cast<double>(speech.durationUs(speech.speak(kana)));
+    const double a = speak(kanji).durationUs;
+    const double b = speak(kana).durationUs;
     EXPECT_NEAR(a / b, 1.0, 0.15) << kanji << " " << a / 1e3 << " ms, " << kana << " " << b / 1e3
                                   << " ms";
   }
@@ -257,7 +219,6 @@ TEST(JapaneseSpeaking, AKanjiSentenceLastsAsLongAsInKana) {
 // Each bookmark comes when the word written after it begins, as the same text without
 // bookmarks speaks it; the words are the caller's.
 TEST(JapaneseSpeaking, EachBookmarkComesWithTheWordAfterIt) {
-  JapaneseSpeech speech;
   const std::vector<std::string> pieces = {
       "今日は", "いい",     "天気ですね。", "私は",       "Helloと",  "言いながら、",
       "3人で",  "博物館に", "行きました！", "ロボットは", "2024年に", "生まれました。"};
@@ -270,21 +231,19 @@ TEST(JapaneseSpeaking, EachBookmarkComesWithTheWordAfterIt) {
     marked += pieces[n];
     plain += pieces[n];
   }
-  const int markedId = speech.speak(marked);
-  const auto marks = speech.module->markRecords(markedId);
-  const auto markedWords = speech.module->wordRecords(markedId);
-  const auto words = speech.module->wordRecords(speech.speak(plain));
-  ASSERT_EQ(marks.size(), pieces.size());
+  const Spoken bookmarked = speak(marked);
+  const auto words = speak(plain).words;
+  ASSERT_EQ(bookmarked.marks.size(), pieces.size());
   for (const auto& word : words)
     EXPECT_EQ(word.text, plain.substr(word.offset, word.length));
-  for (const auto& mark : marks) {
+  for (const auto& mark : bookmarked.marks) {
     const auto n = static_cast<std::size_t>(mark.number - 1);
     SCOPED_TRACE(pieces[n]);
     const auto at = [](const std::vector<SpeechWordRecord>& all, std::size_t offset) {
       return std::find_if(all.begin(), all.end(),
                           [&](const auto& w) { return w.offset == offset; });
     };
-    ASSERT_NE(at(markedWords, markedAt[n]), markedWords.end());
+    ASSERT_NE(at(bookmarked.words, markedAt[n]), bookmarked.words.end());
     const auto word = at(words, plainAt[n]);
     ASSERT_NE(word, words.end());
     // After the end of a sentence, the bookmark comes at the end of the sentence, before
@@ -303,19 +262,14 @@ TEST(JapaneseSpeaking, TheTimingEngineReadsJapaneseAtItsOwnRate) {
   const std::string text =
       "こんにちは。 \\mrk=1\\ 私はロボットです。 \\mrk=2\\ みなさんと一緒にお話しできて "
       "\\mrk=3\\ うれしいです。 \\mrk=4\\ 昨日は友達と公園で \\mrk=5\\ 遊びました。";
-  JapaneseSpeech espeak;
-  JapaneseSpeech timing(ZUTextToSpeechOptions::Backend::Timing);
-  const int spokenId = espeak.speak(text);
-  const int estimatedId = timing.speak(text);
-  const auto spoken = espeak.module->markRecords(spokenId);
-  const auto estimated = timing.module->markRecords(estimatedId);
-  const auto duration = static_cast<double>(espeak.durationUs(spokenId));
-  EXPECT_NEAR(static_cast<double>(timing.durationUs(estimatedId)) / duration, 1.0, 0.15);
-  ASSERT_EQ(spoken.size(), estimated.size());
-  for (std::size_t i = 0; i < spoken.size(); ++i) {
-    EXPECT_NEAR(static_cast<double>(estimated[i].audioUs), static_cast<double>(spoken[i].audioUs),
-                0.15 * duration)
-        << "bookmark " << spoken[i].number;
+  const Spoken spoken = speak(text);
+  const Spoken estimated = speak(text, ZUTextToSpeechOptions::Backend::Timing);
+  EXPECT_NEAR(estimated.durationUs / spoken.durationUs, 1.0, 0.15);
+  ASSERT_EQ(spoken.marks.size(), estimated.marks.size());
+  for (std::size_t i = 0; i < spoken.marks.size(); ++i) {
+    EXPECT_NEAR(static_cast<double>(estimated.marks[i].audioUs),
+                static_cast<double>(spoken.marks[i].audioUs), 0.15 * spoken.durationUs)
+        << "bookmark " << spoken.marks[i].number;
   }
 }
 
