@@ -6,6 +6,7 @@
 #include <array>
 #include <cstdio>
 #include <filesystem>
+#include <functional>
 #include <stdexcept>
 #include <utility>
 #include <vector>
@@ -243,6 +244,25 @@ Token makeToken(const MeCab::Node& node, const char* sentence) {
   return token;
 }
 
+// MeCab may take ASCII symbols and Japanese punctuation for one unknown word ("++、"):
+// the two go apart, the Japanese as a symbol.
+void addToken(const Token& token, std::string_view all, std::vector<Token>& tokens) {
+  std::size_t begin = token.begin;
+  while (begin < token.end) {
+    const bool ascii = static_cast<unsigned char>(all[begin]) < 0x80;
+    std::size_t end = begin + 1;
+    while (end < token.end && (static_cast<unsigned char>(all[end]) < 0x80) == ascii)
+      ++end;
+    if (begin == token.begin && end == token.end) {
+      tokens.push_back(token);
+      return;
+    }
+    Token piece{begin, end, begin == token.begin && token.spaced, "記号", "", ""};
+    tokens.push_back(piece);
+    begin = end;
+  }
+}
+
 // An ASCII stretch of adjacent tokens: a Latin word (with its trailing punctuation left
 // out of the English span), or numbers, punctuation and symbols.
 void addAsciiUnits(std::string_view text, std::size_t begin, std::size_t end, bool startsWord,
@@ -252,7 +272,8 @@ void addAsciiUnits(std::string_view text, std::size_t begin, std::size_t end, bo
     std::size_t stop = run.size();
     while (stop > 0 && isPunctuation(run[stop - 1]))
       --stop;
-    units.push_back(Unit{begin, begin + stop, std::string(run.substr(0, stop)), kLatinVoice, true});
+    units.push_back(
+        Unit{begin, begin + stop, std::string(run.substr(0, stop)), kLatinVoice, startsWord});
     if (stop < run.size())
       units.push_back(Unit{begin + stop, end, std::string(run.substr(stop)), "", false});
     return;
@@ -265,6 +286,74 @@ void addAsciiUnits(std::string_view text, std::size_t begin, std::size_t end, bo
                          i == 0 && startsWord && !isPunctuation(run[i])});
     i += length;
   }
+}
+
+// The units of MeCab's words: Japanese words as their pronunciation, ASCII stretches as
+// Latin words, numbers and symbols.
+std::vector<Unit> wordsOf(std::string_view all, const std::vector<Token>& tokens,
+                          const std::function<void(std::string_view)>& unreadable) {
+  std::vector<Unit> units;
+  bool afterPrefix = false;
+  for (std::size_t t = 0; t < tokens.size();) {
+    const Token& token = tokens[t];
+    const std::string_view surface = all.substr(token.begin, token.end - token.begin);
+    if (isAscii(surface)) {
+      std::size_t u = t + 1;
+      while (u < tokens.size() && tokens[u].begin == tokens[u - 1].end &&
+             isAscii(all.substr(tokens[u].begin, tokens[u].end - tokens[u].begin)))
+        ++u;
+      addAsciiUnits(all, token.begin, tokens[u - 1].end, token.spaced || !afterPrefix, units);
+      afterPrefix = false;
+      t = u;
+      continue;
+    }
+    Unit unit{token.begin, token.end, std::string(token.pronunciation), "", true};
+    if (token.pronunciation.empty()) {
+      // As written, but for the kanji that the dictionary cannot read.
+      for (std::size_t i = 0; i < surface.size();) {
+        const CodePoint c = decode(surface, i);
+        if (isKanji(c.value))
+          unreadable(surface.substr(i, c.size));
+        else
+          unit.text.append(surface.substr(i, c.size));
+        i += c.size;
+      }
+    }
+    // Particles, auxiliaries, suffixes, punctuation and the word after a prefix or an
+    // opening bracket belong to the word before them.
+    const bool attached = token.partOfSpeech == "助詞" || token.partOfSpeech == "助動詞" ||
+                          token.subclass == "接尾" ||
+                          (token.partOfSpeech == "記号" && token.subclass != "括弧開") ||
+                          afterPrefix;
+    unit.startsWord = token.spaced || !attached;
+    afterPrefix = token.partOfSpeech == "接頭詞" || token.subclass == "括弧開";
+    units.push_back(std::move(unit));
+    ++t;
+  }
+  return units;
+}
+
+// For each tag, in order, the edge of the units where it goes (edge k before unit k):
+// where it stands, or the nearest edge of the unit it stands in (the start on a tie). Tags
+// keep their order.
+std::vector<std::size_t> tagEdges(
+    std::string_view all, const std::vector<Unit>& units,
+    const std::vector<std::pair<std::size_t, const SpeechScriptPart*>>& tags) {
+  std::vector<std::size_t> edges;
+  edges.reserve(tags.size());
+  std::size_t k = 0;
+  for (const auto& [at, part] : tags) {
+    while (k < units.size() && units[k].end <= at)
+      ++k;
+    std::size_t edge = k;
+    if (k < units.size() && units[k].begin < at) {
+      const std::size_t before = characterCount(all.substr(units[k].begin, at - units[k].begin));
+      const std::size_t after = characterCount(all.substr(at, units[k].end - at));
+      edge = before <= after ? k : k + 1;
+    }
+    edges.push_back(edge);
+  }
+  return edges;
 }
 
 }  // namespace
@@ -385,66 +474,14 @@ SpeechScript JapaneseReadings::read(const SpeechScript& written) const {
     std::vector<Token> tokens;
     for (const MeCab::Node* node = lattice->bos_node(); node; node = node->next) {
       if (node->stat != MECAB_BOS_NODE && node->stat != MECAB_EOS_NODE && node->length > 0)
-        tokens.push_back(makeToken(*node, text.text.data()));
+        addToken(makeToken(*node, text.text.data()), text.text, tokens);
     }
-    const std::string_view all = text.text;
-    bool afterPrefix = false;
-    for (std::size_t t = 0; t < tokens.size();) {
-      const Token& token = tokens[t];
-      const std::string_view surface = all.substr(token.begin, token.end - token.begin);
-      if (isAscii(surface)) {
-        std::size_t u = t + 1;
-        while (u < tokens.size() && tokens[u].begin == tokens[u - 1].end &&
-               isAscii(all.substr(tokens[u].begin, tokens[u].end - tokens[u].begin)))
-          ++u;
-        addAsciiUnits(all, token.begin, tokens[u - 1].end, token.spaced || !afterPrefix, units);
-        afterPrefix = false;
-        t = u;
-        continue;
-      }
-      Unit unit{token.begin, token.end, std::string(token.pronunciation), "", true};
-      if (token.pronunciation.empty()) {
-        // As written, but for the kanji that the dictionary cannot read.
-        for (std::size_t i = 0; i < surface.size();) {
-          const CodePoint c = decode(surface, i);
-          if (isKanji(c.value))
-            xUnreadable(surface.substr(i, c.size));
-          else
-            unit.text.append(surface.substr(i, c.size));
-          i += c.size;
-        }
-      }
-      // Particles, auxiliaries, suffixes, punctuation and the word after a prefix belong
-      // to the word before them.
-      const bool attached = token.partOfSpeech == "助詞" || token.partOfSpeech == "助動詞" ||
-                            token.subclass == "接尾" ||
-                            (token.partOfSpeech == "記号" && token.subclass != "括弧開") ||
-                            afterPrefix;
-      unit.startsWord = token.spaced || !attached;
-      afterPrefix = token.partOfSpeech == "接頭詞";
-      units.push_back(std::move(unit));
-      ++t;
-    }
+    units = wordsOf(text.text, tokens, [this](std::string_view kanji) { xUnreadable(kanji); });
   }
 
-  // Each tag at an edge of the units: where it stands, or the nearest edge of the unit
-  // it stands in (the start on a tie). Tags keep their order.
-  std::vector<std::size_t> edges;
-  edges.reserve(tags.size());
-  std::size_t k = 0;
-  for (const auto& [at, part] : tags) {
-    while (k < units.size() && units[k].end <= at)
-      ++k;
-    std::size_t edge = k;
-    if (k < units.size() && units[k].begin < at) {
-      const std::string_view all = text.text;
-      const std::size_t before = characterCount(all.substr(units[k].begin, at - units[k].begin));
-      const std::size_t after = characterCount(all.substr(at, units[k].end - at));
-      edge = before <= after ? k : k + 1;
-    }
-    edges.push_back(edge);
-  }
+  const std::vector<std::size_t> edges = tagEdges(text.text, units, tags);
 
+  // The units in order, a blank before each word, each tag at its edge.
   SpeechScript read;
   read.marks = written.marks;
   read.notes = written.notes;

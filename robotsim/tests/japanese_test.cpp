@@ -49,9 +49,9 @@ INSTANTIATE_TEST_SUITE_P(
                     "サンニンデ ニセンニジュウヨンネンニ イチマンエント サンテンイチヨン"},
         ReadingCase{"8600と1000000000000と007と0",
                     "ハッセンロッピャクト イッチョウト ゼロゼロナナト ゼロ"},
-        ReadingCase{
-            "Ｈｅｌｌｏ worldは、ＡＢＣです。",
-            "<voice name=\"en\">Hello world</voice>ワ、<voice name=\"en\"> ABC</voice>デス。"},
+        ReadingCase{"Ｈｅｌｌｏ worldは、「Ｃ＋＋、」です。",
+                    "<voice name=\"en\">Hello world</voice>ワ、 「<voice "
+                    "name=\"en\">C++</voice>、」デス。"},
         // A mark after the end of a sentence goes before its punctuation.
         ReadingCase{"はい。\\mrk=1\\いいえ！\\mrk=2\\",
                     "ハイ<mark name=\"0\"/>。 イーエ<mark name=\"1\"/>！"},
