@@ -222,14 +222,14 @@ TEST_F(AnalysisTest, TheTokeniserCutsTagsSpacesLinksPunctuationAndWords) {
       // Unspaced: the longest stored word wherever it ends; unknown runs of katakana or
       // latin letters stay whole, other unknown characters go one by one.
       {"Japanese",
-       "りんごとペッパーが好き。Pepper犬",
+       "りんごとメロンが好き。Melon犬",
        {{"りんご", 11},
         {"と", 12},
-        {"ペッパー", 4},
+        {"メロン", 4},
         {"が", 12},
         {"好き", 5},
         {"。", 3},
-        {"Pepper", 17},
+        {"Melon", 17},
         {"犬", 4}}},
       {"Unspaced", "ithe theme", {{"i", 13}, {"the", 9}, {" ", 1}, {"the", 9}, {"me", 4}}},
       // Without a database every word is unknown.
@@ -271,7 +271,7 @@ TEST_F(AnalysisTest, AnyTextIsCutWithoutLosingAByte) {
       "l'",
       "'l",
       "n'",
-      "ペッパーーー",
+      "メロンーーー",
       std::string(300, 'x') + " and y",
   };
   std::mt19937 random(7);
