@@ -371,6 +371,23 @@ TEST_F(AnalysisTest, TheLookBackDropsTagsNearTheCallersGestures) {
               ::testing::ElementsAre("two"));
 }
 
+// A bookmark that the anticipation would bring within 1300 ms of speech after the
+// caller's gesture stays before its word, where the look-back accepted it.
+TEST_F(AnalysisTest, TheLookBackHoldsAfterTheMoveBack) {
+  const std::vector<std::pair<std::string, std::string>> cases = {
+      {"^start(a) I like many kinds of fruit: apples, pears and plums",
+       " \\mrk=1\\  I like many kinds of fruit:  \\mrk=2\\ apples"},
+      {"^stop(a) I like many kinds of fruit: apples, pears and plums",
+       " \\mrk=1\\  I like  \\mrk=4\\ many kinds of fruit: apples"},
+      {"^start(a) \\pau=1300\\ I like many kinds of fruit: apples",
+       " \\mrk=1\\   \\pau=1300\\   \\mrk=2\\ I"},
+      {"^start(a) I like many different kinds of fruit, for example apples, pears and plums",
+       " \\mrk=1\\  I like many different  \\mrk=2\\ kinds of fruit"},
+  };
+  for (const auto& [text, expected] : cases)
+    EXPECT_THAT(compile(text)->text, ::testing::HasSubstr(expected)) << text;
+}
+
 TEST_F(AnalysisTest, BookmarksStandBeforeTheirWordOrAheadWithTheFlag) {
   const std::string text = "I like many kinds of fruit: apples, pears and plums";
   // Without the flag, right before the enumeration; with it, 1300 ms of speech earlier,
