@@ -8,7 +8,11 @@ maint-guide, maint-guide-fr, maint-guide-ja). Both are under the GNU GPL version
 later; see texts/README.md. The texts are kept in the repository; this script only
 shows how they were made.
 
+The training corpora of the lexicon build (tools/lexicons/corpus/) are the rest of
+Debian Reference: chapters 2 to 12 and the appendix, every sentence (--corpus).
+
 Usage: tools/quality/extract_texts.py [--count N] OUTPUT_DIRECTORY
+       tools/quality/extract_texts.py --corpus OUTPUT_DIRECTORY
 """
 
 import argparse
@@ -65,8 +69,21 @@ def sentences(paragraph, lang):
 def main():
     parser = argparse.ArgumentParser()
     parser.add_argument("--count", type=int, default=200)
+    parser.add_argument("--corpus", action="store_true")
     parser.add_argument("output")
     args = parser.parse_args()
+    if args.corpus:
+        chapters = ["ch%02d" % n for n in range(2, 13)] + ["apa"]
+        for lang in ("fr", "ja"):
+            lines = [sentence for chapter in chapters
+                     for paragraph in paragraphs("/usr/share/debian-reference/%s.%s.html"
+                                                 % (chapter, lang))
+                     for sentence in sentences(paragraph, lang)]
+            with open(os.path.join(args.output, "debian-reference.%s.txt" % lang), "w",
+                      encoding="utf-8") as out:
+                out.write("\n".join(lines) + "\n")
+            print("corpus", lang, len(lines))
+        return
     for kind, languages in SOURCES.items():
         for lang, paths in languages.items():
             lines = []

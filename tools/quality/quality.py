@@ -7,7 +7,8 @@ For each language, on the development texts (texts/dev.*.txt) or the held-out on
 
 - Japanese word cuts against MeCab (IPADIC): boundary F1 over all sentences, the share
   of sentences with a cut inside a MeCab word, and the share of automatic bookmarks that
-  stand inside a MeCab word;
+  stand inside a MeCab word (cuts inside a run of marks that MeCab takes as one symbol,
+  such as "/", are not counted);
 - base-form agreement: on the words that both cut alike, the base form of the word's
   first record against an independent lemmatiser: MeCab for Japanese, Apertium's
   tagger (the analysers and taggers of the apertium-fr-es and apertium-en-es pairs) for
@@ -39,6 +40,10 @@ APERTIUM = {
            "/usr/share/apertium/apertium-eng-spa/eng-spa.prob"),
 }
 MECAB_DICTIONARY = "/var/lib/mecab/dic/ipadic-utf8"
+# (word, our base form, the reference's) of the words whose base forms differ.
+DISAGREEMENTS = Counter()
+# The MeCab words that the cut splits, with their pieces.
+SPLITS = Counter()
 STRUCTURE_TAGS = {"two", "three", "four", "five", "pick"}
 LIBRARY = os.path.join(HERE, "..", "..", "share", "zefoko", "behaviors", "animations", "Stand")
 
@@ -183,7 +188,11 @@ def measure(mokuto, lang, kind, coordinations):
             theirs_spans = spans(sentence, [t[0] for t in ts])
             their_tokens = [(s, t) for s, t in zip(theirs_spans, ts) if s is not None]
             length = len(sentence)
-            ours = {p for c in cs if c[3] != "interspace" for p in c[:2]} - {0, length}
+            # MeCab makes one symbol of a run of marks ("/", ".."), which are no words:
+            # the cuts inside them are not counted.
+            symbols = [s for s, t in their_tokens if not re.search(r"\w", t[0])]
+            ours = {p for c in cs if c[3] != "interspace" for p in c[:2]
+                    if not any(s[0] < p < s[1] for s in symbols)} - {0, length}
             theirs = {p for s, _ in their_tokens for p in s} - {0, length}
             true_positive += len(ours & theirs)
             ours_total += len(ours)
@@ -191,6 +200,10 @@ def measure(mokuto, lang, kind, coordinations):
             inside = lambda p: any(s[0] < p < s[1] for s, _ in their_tokens)
             if any(inside(p) for p in ours):
                 split_sentences += 1
+                for (start, end), _ in their_tokens:
+                    if any(start < p < end for p in ours):
+                        SPLITS["%s <- %s" % (sentence[start:end], "|".join(
+                            c[2] for c in cs if c[0] < end and c[1] > start))] += 1
             # Automatic bookmarks: their offsets in the text without them.
             text = analysed["text"]
             offset = 0
@@ -206,6 +219,8 @@ def measure(mokuto, lang, kind, coordinations):
                     continue
                 compared += 1
                 agree += our_base(c) == token[2].lower()
+                if our_base(c) != token[2].lower():
+                    DISAGREEMENTS[(c[2].lower(), our_base(c), token[2].lower())] += 1
         precision = percent(true_positive, ours_total)
         recall = percent(true_positive, theirs_total)
         figures["boundary F1 (MeCab)"] = "%.1f %% (precision %.1f, recall %.1f)" % (
@@ -234,6 +249,8 @@ def measure(mokuto, lang, kind, coordinations):
                     continue
                 compared += 1
                 agree += our_base(c) == lemma.lower()
+                if our_base(c) != lemma.lower():
+                    DISAGREEMENTS[(c[2].lower(), our_base(c), lemma.lower())] += 1
     figures["base-form agreement (%s)" % reference] = "%.1f %% of %d words" % (
         percent(agree, compared), compared)
 
@@ -277,6 +294,10 @@ def main():
     parser.add_argument("--held-out", action="store_true",
                         help="measure the held-out texts instead of the development ones")
     parser.add_argument("--languages", default="en,fr,ja")
+    parser.add_argument("--disagreements", type=int, default=0, metavar="N",
+                        help="print the N most frequent base-form disagreements")
+    parser.add_argument("--splits", type=int, default=0, metavar="N",
+                        help="print the N MeCab words most often cut inside")
     parser.add_argument("--coordinations",
                         help="write every coordination of two to five items to this file")
     args = parser.parse_args()
@@ -285,8 +306,14 @@ def main():
     coordinations = open(args.coordinations, "w", encoding="utf-8") if args.coordinations else None
     for lang in args.languages.split(","):
         print("%s (%s text)" % (LANGUAGES[lang], "held-out" if args.held_out else "development"))
+        DISAGREEMENTS.clear()
+        SPLITS.clear()
         for name, value in measure(mokuto, lang, kind, coordinations).items():
             print("  %-42s %s" % (name, value))
+        for (word, ours, theirs), count in DISAGREEMENTS.most_common(args.disagreements):
+            print("    %4d  %s: %s, not %s" % (count, word, ours, theirs))
+        for split, count in SPLITS.most_common(args.splits):
+            print("    %4d  %s" % (count, split))
         sys.stdout.flush()
     if coordinations:
         coordinations.close()

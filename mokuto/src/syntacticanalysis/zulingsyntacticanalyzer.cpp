@@ -130,11 +130,12 @@ bool isAsciiAlnum(char32_t c) noexcept {
 }
 
 // The scripts whose unknown runs stay one chunk where words are not spaced.
+constexpr int kKatakana = 2;
 int unknownRunScript(char32_t c) noexcept {
   if (isAsciiAlnum(c))
     return 1;
   if ((c >= 0x30A1 && c <= 0x30FA) || (c >= 0x30FC && c <= 0x30FE))
-    return 2;  // katakana and the prolonged sound mark
+    return kKatakana;  // and the prolonged sound mark
   if ((c >= 0xFF10 && c <= 0xFF19) || (c >= 0xFF21 && c <= 0xFF3A) || (c >= 0xFF41 && c <= 0xFF5A))
     return 3;  // full-width letters and digits
   return 0;
@@ -149,7 +150,8 @@ int unknownRunScript(char32_t c) noexcept {
 // next space, punctuation or link, is one unknown word. Numbers follow the digit rule.
 // Where words are not spaced (flag 0), the stored word is taken wherever it ends, and
 // unknown text is cut by character, except runs of latin letters and digits, of katakana
-// or of full-width letters, which stay whole.
+// or of full-width letters, which stay whole. A katakana run stays whole even where a
+// stored word starts it, unless stored words make it up from its start to its end.
 class Cutter {
  public:
   Cutter(const ZULingSyntacticAnalyzerBinaryDatabase* database, std::string_view text,
@@ -276,6 +278,16 @@ class Cutter {
   }
 
   std::size_t xUnspacedWord(std::size_t p, std::size_t end, CodePoint cp) {
+    // A run of katakana is one unknown word unless stored words make it up whole
+    // ("プロンプト", but "コマンド" + "ライン").
+    const int script = unknownRunScript(cp.value);
+    if (script == kKatakana && p >= fRunEnd) {
+      fRunEnd = xRunEnd(p, end, script);
+      if (!xStoredWordsMakeUp(p, fRunEnd)) {
+        xPushWord(p, fRunEnd, std::nullopt);
+        return fRunEnd;
+      }
+    }
     std::optional<std::uint32_t> node;
     const std::size_t stored = xLongestStored(p, end, node);
     if (stored > 0 &&
@@ -283,18 +295,32 @@ class Cutter {
       xPushWord(p, p + stored, node);
       return p + stored;
     }
-    std::size_t q = p + cp.length;
-    if (const int script = unknownRunScript(cp.value); script != 0) {
-      while (q < end) {
-        const CodePoint next = decode(fText.substr(0, end), q);
-        if (unknownRunScript(next.value) != script)
-          break;
-        q += next.length;
-      }
-    }
+    const std::size_t q = script != 0 ? xRunEnd(p, end, script) : p + cp.length;
     // Not stored: a stored word would have been the longest prefix.
     xPushWord(p, q, std::nullopt);
     return q;
+  }
+
+  std::size_t xRunEnd(std::size_t p, std::size_t end, int script) const {
+    while (p < end) {
+      const CodePoint next = decode(fText.substr(0, end), p);
+      if (unknownRunScript(next.value) != script)
+        break;
+      p += next.length;
+    }
+    return p;
+  }
+
+  // Whether the longest stored words from p, each within [p, end), reach end.
+  bool xStoredWordsMakeUp(std::size_t p, std::size_t end) const {
+    std::optional<std::uint32_t> node;
+    while (p < end) {
+      const std::size_t stored = xLongestStored(p, end, node);
+      if (stored == 0)
+        return false;
+      p += stored;
+    }
+    return true;
   }
 
   void xPush(std::size_t begin, std::size_t end, ZULingWordClass wordClass) {
@@ -328,6 +354,8 @@ class Cutter {
   std::string_view fLower;
   std::vector<Chunk>& fChunks;
   bool fSpaced;
+  // The end of the last run of one script that was checked, where words are not spaced.
+  std::size_t fRunEnd = 0;
 };
 
 // ---- structures --------------------------------------------------------------------
