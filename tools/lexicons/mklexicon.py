@@ -279,10 +279,61 @@ def lefff_clean(text):
     return re.sub(r"__\w+$", "", text)
 
 
+# Invariable categories: a base form other than the word is one of Lefff's spelling
+# normalisations ("vi" -> "oui", "bcp" -> "beaucoup"), not the word's base form.
+LEFFF_INVARIABLE = {"adv", "prep", "coo", "csu", "pres", "advneg"}
+# The possessor of a possessive determiner (Lefff gives them all the base form "son").
+POSSESSIVES = {"P1s": "mon", "P2s": "ton", "P3s": "son", "P1p": "notre", "P2p": "votre",
+               "P3p": "leur"}
+# Words after which a word is read as a noun, or as a verb, when counting how a corpus
+# uses the words that can be both.
+NOUN_CONTEXT = {"le", "la", "les", "l", "un", "une", "des", "du", "de", "d", "ce", "cet",
+                "cette", "ces", "mon", "ma", "mes", "ton", "ta", "tes", "son", "sa", "ses",
+                "notre", "nos", "votre", "vos", "leur", "leurs", "au", "aux", "chaque"}
+VERB_CONTEXT = {"je", "j", "tu", "il", "elle", "on", "nous", "vous", "ils", "elles", "se",
+                "s", "ne", "n", "qui", "me", "m", "te", "t"}
+
+
+def french_corpus(paths):
+    """How often each word form occurs, and how often after a determiner or a subject."""
+    counts, as_noun, as_verb = {}, {}, {}
+    for path in paths:
+        with open(path, encoding="utf-8") as source:
+            for line in source:
+                previous = None
+                for word in re.findall(r"[^\W\d_]+", line.lower()):
+                    counts[word] = counts.get(word, 0) + 1
+                    if previous in NOUN_CONTEXT:
+                        as_noun[word] = as_noun.get(word, 0) + 1
+                    elif previous in VERB_CONTEXT:
+                        as_verb[word] = as_verb.get(word, 0) + 1
+                    previous = word
+    return counts, as_noun, as_verb
+
+
+def french_base_form(form, category, lemma, features, fixes):
+    """Lefff's base form, repaired where it is not the word's; the repairs go to fixes."""
+    fixed = lemma
+    if category in LEFFF_INVARIABLE and lemma != form and " " not in form:
+        fixed = form
+    elif category in ("caimp", "ilimp") and lemma.endswith("imp"):
+        fixed = form
+    elif category == "det" and lemma == "son":
+        possessor = re.search(r"P[123][sp]", features)
+        if possessor:
+            fixed = POSSESSIVES[possessor.group(0)]
+    if fixed != lemma:
+        fixes.add((form, category, lemma, fixed))
+    return fixed
+
+
 def french(args):
     analyses = {}
     frequencies = {}
+    counts, as_noun, as_verb = french_corpus(args.corpus or [])
+    fixes = set()
     order = 0
+    replaced = {ascii_lower(word) for word, _ in read_closed_lexicon(args.fixes)}
     with open(args.lefff, encoding="utf-8") as source:
         for line in source:
             parts = line.rstrip("\n").split("\t")
@@ -290,7 +341,7 @@ def french(args):
                 continue
             form = lefff_clean(parts[0])
             category = parts[1]
-            if form.startswith("_") or not has_letter(form):
+            if form.startswith("_") or not has_letter(form) or ascii_lower(form) in replaced:
                 continue
             words = form.split(" ")
             # A fixed phrase around a coordination or a negation ("pas de") would hide
@@ -299,27 +350,50 @@ def french(args):
                 continue
             word_class, rank = LEFFF_CLASSES[category]
             lemma = lefff_clean(parts[2]).rstrip("?")
-            if lemma in LEFFF_CLASSES or lemma.startswith("_") or not lemma:
+            # Lefff names some base forms after their category ("cln"); "ce" and "que"
+            # are words too.
+            if (lemma in LEFFF_CLASSES and lemma not in ("ce", "que")) or \
+                    lemma.startswith("_") or not lemma:
                 lemma = form
             features = parts[3] if len(parts) > 3 else ""
+            lemma = french_base_form(form, category, lemma, features, fixes)
             if category in LEFFF_NEGATIONS:
                 features = "n" + features
+            key = ascii_lower(form)
             order += 1
-            analyses.setdefault(ascii_lower(form), []).append(
-                (rank, order, word_class, features, lemma))
+            analyses.setdefault(key, []).append((rank, order, word_class, features, lemma))
             if rank < LEFFF_CLOSED_RANK:
                 frequencies[lemma] = CLOSED_CLASS_FREQUENCY
+            else:
+                frequencies[lemma] = frequencies.get(lemma, 0) + counts.get(key, 0)
 
     lexicon = LexiconWriter()
-    for word, records in read_closed_lexicon(args.extra):
-        for word_class, features, base in records:
-            lexicon.add(word, word_class, features, base)
-            if base is not None:
-                frequencies[base] = CLOSED_CLASS_FREQUENCY
-    for word in analyses:
-        for _, _, word_class, features, lemma in sorted(analyses[word]):
+    for path in (args.fixes, args.extra):
+        for word, records in read_closed_lexicon(path):
+            for word_class, features, base in records:
+                lexicon.add(word, word_class, features, base)
+                if base is not None:
+                    frequencies[base] = CLOSED_CLASS_FREQUENCY
+    for word, records in analyses.items():
+        # A noun that is also a verb is read as the noun first unless a corpus uses it
+        # more after a subject than after a determiner ("la base", "une commande", but
+        # "il parle"); a participle only when the corpus uses it more as a noun ("les
+        # données").
+        classes = {r[2] for r in records}
+        participle = any(r[2] == "verb" and re.search("[KG]", r[3]) for r in records)
+        nouns, verbs = as_noun.get(word, 0), as_verb.get(word, 0)
+        if "noun" in classes and "verb" in classes and (
+                nouns > verbs or (nouns == verbs and not participle)):
+            records = [(LEFFF_CLASSES["v"][1] - 0.5,) + r[1:] if r[2] == "noun" else r
+                       for r in records]
+        for _, _, word_class, features, lemma in sorted(records):
             lexicon.add(word, word_class, features, lemma)
-    print("french: %d words" % lexicon.write(args.lexicon), file=sys.stderr)
+    print("french: %d words, %d base forms of Lefff repaired" % (lexicon.write(args.lexicon),
+                                                                 len(fixes)), file=sys.stderr)
+    with open(args.lexicon + ".fixes", "w", encoding="utf-8") as out:
+        out.write("# Base forms of Lefff repaired: WORD<TAB>CATEGORY<TAB>LEFFF'S<TAB>OURS\n")
+        for fix in sorted(fixes):
+            out.write("\t".join(fix) + "\n")
     write_frequencies(args.frequencies, frequencies)
 
 
@@ -490,10 +564,19 @@ def token_spans(text, tokens):
     return spans
 
 
-def choose_japanese_words(surfaces, corpus, report):
+def behavior_tags(directory):
+    tags = set()
+    for path in glob.glob(os.path.join(directory, "**", "behavior.json"), recursive=True):
+        with open(path, encoding="utf-8") as source:
+            tags.update(json.load(source).get("tags", []))
+    return tags
+
+
+def choose_japanese_words(surfaces, corpus, report, keep):
     """The IPADIC surfaces that the longest-prefix cut may take: those that win where
     MeCab cuts a word as often as they win wrongly (ending inside a MeCab word or running
-    over several), measured on the corpus and again after each removal."""
+    over several), measured on the corpus and again after each removal. The words in
+    keep (gesture tags: "はい", which a written text rarely says) are all kept."""
     stored = set(surfaces)
     longest = max(len(w) for w in stored)
     removed = {}
@@ -510,7 +593,7 @@ def choose_japanese_words(surfaces, corpus, report):
                     good[word] = good.get(word, 0) + 1
                 elif start in starts:
                     bad[word] = bad.get(word, 0) + 1
-        losers = {w for w, n in bad.items() if n > good.get(w, 0)}
+        losers = {w for w, n in bad.items() if n > good.get(w, 0) and w not in keep}
         if not losers:
             break
         for word in losers:
@@ -565,7 +648,8 @@ def japanese(args):
         best = (base, pos1, pos2)
         best_cost[best] = min(best_cost.get(best, cost), cost)
 
-    stored, removed = choose_japanese_words(analyses, corpus, args.lexicon + ".left-out")
+    stored, removed = choose_japanese_words(analyses, corpus, args.lexicon + ".left-out",
+                                            behavior_tags(args.behaviors))
     for surface, word_class, features, base in JAPANESE_WORDS:
         analyses.setdefault(surface, []).insert(0, (-1e9, 0, word_class, features, base))
         stored.add(surface)
@@ -696,6 +780,10 @@ def main():
     command = commands.add_parser("french")
     command.add_argument("--lefff", required=True)
     command.add_argument("--extra", required=True)
+    command.add_argument("--fixes", required=True,
+                         help="words whose records replace Lefff's, with their reasons")
+    command.add_argument("--corpus", action="append",
+                         help="a French text: how often words occur orders the base forms")
     command.set_defaults(run=french)
     command = commands.add_parser("japanese")
     command.add_argument("--ipadic", required=True)
@@ -703,6 +791,8 @@ def main():
                          help="MeCab's compiled IPADIC (UTF-8), whose cut is the reference")
     command.add_argument("--corpus", action="append", required=True,
                          help="a text, one sentence a line")
+    command.add_argument("--behaviors", required=True,
+                         help="the behaviour library, whose tags are all kept")
     command.set_defaults(run=japanese)
     for name in ("english", "french", "japanese"):
         commands.choices[name].add_argument("--frequencies", required=True)
