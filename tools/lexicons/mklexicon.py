@@ -507,15 +507,11 @@ def unknown_run_script(c):
 
 
 def covered(lower, p, q, stored, longest):
-    """Whether the longest stored words from p cut lower[p:q] whole."""
-    while p < q:
-        for length in range(min(longest, q - p), 0, -1):
-            if lower[p:p + length] in stored:
-                p += length
-                break
-        else:
-            return False
-    return True
+    """Whether the longest stored word at p ends at q or after it."""
+    for length in range(min(longest, len(lower) - p), q - p - 1, -1):
+        if lower[p:p + length] in stored:
+            return True
+    return False
 
 
 def unspaced_cut(text, stored, longest):

@@ -150,8 +150,8 @@ int unknownRunScript(char32_t c) noexcept {
 // next space, punctuation or link, is one unknown word. Numbers follow the digit rule.
 // Where words are not spaced (flag 0), the stored word is taken wherever it ends, and
 // unknown text is cut by character, except runs of latin letters and digits, of katakana
-// or of full-width letters, which stay whole. A katakana run stays whole even where a
-// stored word starts it, unless stored words make it up from its start to its end.
+// or of full-width letters, which stay whole. A katakana run is a written word of its
+// own: a stored word counts there only when it ends with the run or after it.
 class Cutter {
  public:
   Cutter(const ZULingSyntacticAnalyzerBinaryDatabase* database, std::string_view text,
@@ -278,18 +278,18 @@ class Cutter {
   }
 
   std::size_t xUnspacedWord(std::size_t p, std::size_t end, CodePoint cp) {
-    // A run of katakana is one unknown word unless stored words make it up whole
-    // ("プロンプト", but "コマンド" + "ライン").
+    std::optional<std::uint32_t> node;
+    const std::size_t stored = xLongestStored(p, end, node);
+    // A run of katakana is written as one word: a stored word that ends inside it does
+    // not count ("プロンプト" although "プロ" is stored, "ファイルシステム").
     const int script = unknownRunScript(cp.value);
     if (script == kKatakana && p >= fRunEnd) {
       fRunEnd = xRunEnd(p, end, script);
-      if (!xStoredWordsMakeUp(p, fRunEnd)) {
+      if (p + stored < fRunEnd) {
         xPushWord(p, fRunEnd, std::nullopt);
         return fRunEnd;
       }
     }
-    std::optional<std::uint32_t> node;
-    const std::size_t stored = xLongestStored(p, end, node);
     if (stored > 0 &&
         (p + stored == end || (static_cast<unsigned char>(fText[p + stored]) & 0xC0) != 0x80)) {
       xPushWord(p, p + stored, node);
@@ -311,17 +311,6 @@ class Cutter {
     return p;
   }
 
-  // Whether the longest stored words from p, each within [p, end), reach end.
-  bool xStoredWordsMakeUp(std::size_t p, std::size_t end) const {
-    std::optional<std::uint32_t> node;
-    while (p < end) {
-      const std::size_t stored = xLongestStored(p, end, node);
-      if (stored == 0)
-        return false;
-      p += stored;
-    }
-    return true;
-  }
 
   void xPush(std::size_t begin, std::size_t end, ZULingWordClass wordClass) {
     Chunk chunk;
