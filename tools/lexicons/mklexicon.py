@@ -452,8 +452,12 @@ def read_ipadic(directory):
 
 JAPANESE_CLOSED = {"助詞", "助動詞", "接続詞", "連体詞", "感動詞", "フィラー"}
 # Forms stored as one word although MeCab cuts them: the polite negation, whose "ん"
-# alone would also be the "ん" of "なんです".
-JAPANESE_WORDS = [("ません", "auxiliary", "n", "ます")]
+# alone would also be the "ん" of "なんです", and the apologies that end with it.
+JAPANESE_WORDS = [("ません", "auxiliary", "n", "ます"),
+                  # Apologies, which would otherwise end with the negation "ません".
+                  ("すみません", "interjection", "", "すみません"),
+                  ("申し訳ありません", "interjection", "", "申し訳ありません"),
+                  ("申し訳ございません", "interjection", "", "申し訳ございません")]
 
 
 def mecab_analyses(dictionary, lines):
@@ -714,6 +718,9 @@ def english_emotions(args):
         word = single or double
         if word and " " not in word:
             labels[word] = NEGATION
+    for word, records in read_closed_lexicon(args.extra):
+        for _, _, base in records:
+            labels[word] = base
     lexicon = LexiconWriter()
     add_labels(lexicon, labels)
     print("english emotions: %d words" % lexicon.write(args.lexicon), file=sys.stderr)
@@ -728,8 +735,13 @@ def french_emotions(args):
             continue
         polarity = float(entry.get("polarity") or 0)
         intensity = float(entry.get("intensity") or 1)
+        # Words of little subjectivity ("données", "autres", "physique") carry no
+        # emotion, whatever their polarity.
+        subjectivity = float(entry.get("subjectivity") or 0)
         if entry.get("pos") == "RB" and intensity >= 1.5:
             labels[word] = STRONG_ADVERB
+        elif subjectivity < 0.4:
+            continue
         elif polarity >= 0.75:
             labels[word] = VERY_POSITIVE
         elif polarity >= 0.1:
@@ -738,9 +750,25 @@ def french_emotions(args):
             labels[word] = VERY_NEGATIVE
         elif polarity <= -0.1:
             labels[word] = NEGATIVE
+    wanted, exact = {}, {}
     for word, records in read_closed_lexicon(args.extra):
         for _, _, base in records:
-            labels[word] = base
+            if word.startswith("="):
+                exact[word[1:]] = base
+            else:
+                wanted[word] = base
+    # The forms of the listed base forms, from Lefff.
+    forms = {word: label for word, label in wanted.items()}
+    with open(args.lefff, encoding="utf-8") as source:
+        for line in source:
+            parts = line.split("\t", 3)
+            if len(parts) >= 3 and " " not in parts[0]:
+                lemma = lefff_clean(parts[2])
+                if lemma in wanted:
+                    forms.setdefault(ascii_lower(lefff_clean(parts[0])), wanted[lemma])
+    labels.update(forms)
+    labels.update(exact)
+    labels = {word: label for word, label in labels.items() if label != "none"}
     lexicon = LexiconWriter()
     add_labels(lexicon, labels)
     print("french emotions: %d words" % lexicon.write(args.lexicon), file=sys.stderr)
@@ -796,10 +824,12 @@ def main():
     command = commands.add_parser("english-emotions")
     command.add_argument("--vader-lexicon", required=True)
     command.add_argument("--vader-source", required=True)
+    command.add_argument("--extra", required=True)
     command.set_defaults(run=english_emotions)
     command = commands.add_parser("french-emotions")
     command.add_argument("--pattern", required=True)
     command.add_argument("--extra", required=True)
+    command.add_argument("--lefff", required=True)
     command.set_defaults(run=french_emotions)
     command = commands.add_parser("japanese-emotions")
     command.add_argument("--list", required=True)
