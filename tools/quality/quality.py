@@ -282,7 +282,8 @@ def measure(mokuto, lang, kind, coordinations):
         for sentence, analysed in zip(sentences, analyses):
             for s in analysed["analysis"]["structures"]:
                 if s["kind"] in ("and", "or") and 2 <= s.get("itemCount", 0) <= 5:
-                    items = " | ".join(" ".join(c["words"]) for c in s.get("children", []))
+                    items = " | ".join("%s[%s]" % (c["kind"], " ".join(c["words"]))
+                                       for c in s.get("children", []))
                     coordinations.write("%s\t%s %d\t%s\t%s\n" % (
                         lang, s["kind"], s["itemCount"], items, sentence))
     return figures

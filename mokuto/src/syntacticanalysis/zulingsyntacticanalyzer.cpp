@@ -729,10 +729,11 @@ class StructureBuilder {
 
   // Coordinations: around each "and" or "or" word, the item after it (more items after
   // further same words) and the items before it, separated by commas or by the same
-  // word ("apples, pears and plums", "A と B と C"); all items are groups of one kind,
-  // nominal groups ending in a noun or pronoun for the Japanese particles. Items begin with a
-  // preposition only when the last one does; otherwise a preposition ends the list. A pronoun after
-  // the word that begins a clause ("I like tea and he likes coffee") coordinates nothing.
+  // word ("apples, pears and plums", "A と B と C"). The items are things: nominal
+  // groups, all ending in an adjective or all in another word, and in a noun or pronoun
+  // for the Japanese particles. Items begin with a preposition only when the last one
+  // does; otherwise a preposition ends the list. Verbs and clauses joined by the word
+  // coordinate nothing (see xStartsClause).
   std::vector<Structure> xCoordinations() {
     std::vector<Structure> structures;
     std::vector<bool> consumed(fTokens.size(), false);
@@ -744,25 +745,32 @@ class StructureBuilder {
       Item item{};
       if (!xItemAt(c + 1, item))
         continue;
+      // Things only: verbs joined by the word ("read, write and remove") are actions,
+      // and make no enumeration.
       const ZULingStructureKind kind = fGroups[item.group].kind;
-      if (word.particle && !xNounHeaded(item.group))
+      if (kind != STRUCTURE_NOMINAL || (word.particle && !xNounHeaded(item.group)))
         continue;
+      const bool adjectives = fGroups[item.group].lastRole == Role::Adjective;
+      const auto sameKind = [&](std::size_t g) {
+        return fGroups[g].kind == kind && (fGroups[g].lastRole == Role::Adjective) == adjectives &&
+               (!word.particle || xNounHeaded(g));
+      };
       after.push_back(item);
       std::vector<std::size_t> words{c};
       for (std::size_t k = fGroups[item.group].lastToken + 1;
            xIsWord(k) && fTokens[k].coordination == word.coordination && xItemAt(k + 1, item) &&
-           fGroups[item.group].kind == kind && (!word.particle || xNounHeaded(item.group));
+           sameKind(item.group);
            k = fGroups[item.group].lastToken + 1) {
         words.push_back(k);
         after.push_back(item);
       }
       std::vector<Item> before;
       std::size_t end = c;
-      if (end > 0 && fTokens[end - 1].type == Token::Comma && fSpaced)
+      const bool commaBefore = end > 0 && fTokens[end - 1].type == Token::Comma && fSpaced;
+      if (commaBefore)
         --end;  // "apples, pears, and plums"
       const bool prepositions = after.front().firstToken != fGroups[after.front().group].firstToken;
-      while (end > 0 && xItemBefore(end - 1, item) && fGroups[item.group].kind == kind &&
-             (!word.particle || xNounHeaded(item.group))) {
+      while (end > 0 && xItemBefore(end - 1, item) && sameKind(item.group)) {
         if (item.firstToken != fGroups[item.group].firstToken && !prepositions) {
           // "for example apples, pears and plums": the preposition leads the list.
           item.firstToken = fGroups[item.group].firstToken;
@@ -786,7 +794,7 @@ class StructureBuilder {
       }
       if (before.empty())
         continue;
-      if (fSpaced && xStartsClause(after.front(), before.back()))
+      if (fSpaced && xStartsClause(after.front(), before.back(), commaBefore, before.size()))
         continue;
       for (std::size_t w : words)
         consumed[w] = true;
@@ -815,24 +823,35 @@ class StructureBuilder {
            (group.lastRole == Role::Noun || group.lastRole == Role::Pronoun);
   }
 
-  // A lone pronoun after the coordinating word, followed by a verb, while the first
-  // item follows a verb or a preposition: two clauses, not a list ("I like tea and he
-  // likes coffee", "I was born in Paris and I was happy").
-  bool xStartsClause(const Item& right, const Item& firstLeft) const {
+  // Two clauses, not a list:
+  // - the group after the coordinating word is a subject, followed by a verb, while the
+  //   first item follows a verb or a preposition ("I like tea and he likes coffee", "I
+  //   was born in Paris and I was happy", "it opens libc and libc calls the kernel") or
+  //   is the only one, before a comma ("there is one disk, and everything is there");
+  // - or it is a lone word that can be a verb, followed by its object or an adverb: a
+  //   second action ("type your name and press the Enter key").
+  bool xStartsClause(const Item& right, const Item& firstLeft, bool commaBefore,
+                     std::size_t leftItems) const {
     const Group& group = fGroups[right.group];
-    if (group.firstToken != group.lastToken || fTokens[group.firstToken].role != Role::Pronoun)
-      return false;
     const std::size_t next = group.lastToken + 1;
-    if (next >= fTokens.size() || fGroupOfToken[next] == kNone ||
-        fGroups[fGroupOfToken[next]].kind != STRUCTURE_VERB)
+    if (next >= fTokens.size() || fTokens[next].type != Token::Word)
       return false;
-    const std::size_t previous = firstLeft.firstToken;
-    if (previous == 0)
-      return false;
-    if (xIsPreposition(previous - 1))
+    const Token& lone = fTokens[group.firstToken];
+    const Role after = fTokens[next].role;
+    if (group.firstToken == group.lastToken &&
+        (lone.has(WORD_CLASS_VERB) || lone.has(WORD_CLASS_AUXILIARY)) &&
+        (after == Role::Determiner || after == Role::Pronoun || after == Role::Clitic ||
+         after == Role::Noun || after == Role::Adverb || after == Role::Adjective))
       return true;
-    return fGroupOfToken[previous - 1] != kNone &&
-           fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB;
+    if (fGroupOfToken[next] == kNone || fGroups[fGroupOfToken[next]].kind != STRUCTURE_VERB)
+      return false;
+    if (commaBefore && leftItems == 1)
+      return true;
+    const std::size_t previous = firstLeft.firstToken;
+    return previous > 0 &&
+           (xIsPreposition(previous - 1) ||
+            (fGroupOfToken[previous - 1] != kNone &&
+             fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB));
   }
 
   Structure xGroupStructure(const Group& group) const {
