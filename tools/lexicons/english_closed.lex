@@ -36,7 +36,9 @@ whose	determinant=whose	pronoun=whose
 all	determinant=all	pronoun=all
 both	determinant=both	pronoun=both
 half	determinant=half	pronoun=half
-no	determinant/n=no	interjection/n=no
+# The determiner "no" ("with no file") has no base form, so that it gets no gesture of
+# its own (the head shake belongs to the answer "no").
+no	determinant/n	interjection/n=no
 what	pronoun=what	determinant=what
 which	pronoun=which	determinant=which
 whatever	pronoun=whatever	determinant=whatever
@@ -310,3 +312,6 @@ hundred	determinant/p=hundred
 thousand	determinant/p=thousand
 million	determinant/p=million
 billion	determinant/p=billion
+# The prefix "non" ("non-POSIX") is no word of its own: no base form, so that it calls
+# for no gesture.
+non	adverb/n

@@ -11,3 +11,6 @@ aux	preposition=à	determinant/p=le
 # Subject pronouns in the plural: Lefff gives no base form; lemmatisers give the singular.
 ils	pronoun/3mp=il
 elles	pronoun/3fp=elle
+# The oven, spelt as the English "four": no base form, so that the gesture of four
+# items is not called for by it.
+four	noun/ms
