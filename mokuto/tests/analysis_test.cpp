@@ -648,8 +648,14 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"English", "There is one disk, and everything is there.", false},
       {"English", "It opens the library and the library calls the kernel.", false},
       {"English", "It is a great feature and very useful.", false},
+      {"English", "It does more and comes with examples.", false},
+      {"English", "Learn how it works and how you can help.", false},
+      {"English", "Put a space between each directory or file in the name.", true},
+      {"English", "Changing the owner or the rights of a file changes its time.", true},
       {"French", "Je mange des pommes et des poires.", true},
       {"French", "Il ouvre le fichier et ferme la fenêtre.", false},
+      {"French", "Il crée le squelette du paquet et il utilise debhelper.", false},
+      {"French", "C'est une idée d'UNIX, et les noyaux de Linux ont développé cette idée.", false},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

@@ -188,6 +188,11 @@ def english(args):
         analyses.setdefault(word, []).append(
             (0 if closed else 1, -frequency, order[0], word_class, features, base))
 
+    lemmas = set()
+    for pos in WORDNET_CLASSES:
+        with open(os.path.join(wordnet, "index." + pos), encoding="latin-1") as source:
+            lemmas.update(line.split(" ", 1)[0] for line in source if not line.startswith(" "))
+    dropped = []
     frequencies = {}
     for pos, word_class in WORDNET_CLASSES.items():
         with open(os.path.join(wordnet, "index." + pos), encoding="latin-1") as source:
@@ -222,8 +227,13 @@ def english(args):
                                      lemma, frequency)
                     elif frequency > 0 and "-" not in lemma and (
                             syllables(lemma) == 1 or (syllables(lemma) == 2 and lemma.endswith("y"))):
-                        analysis(english_degree(lemma, "er"), word_class, "c", lemma, frequency)
-                        analysis(english_degree(lemma, "est"), word_class, "u", lemma, frequency)
+                        for suffix, features in (("er", "c"), ("est", "u")):
+                            form = english_degree(lemma, suffix)
+                            # A word of its own ("owner" is no degree of "own").
+                            if form in lemmas:
+                                dropped.append((form, lemma))
+                            else:
+                                analysis(form, word_class, features, lemma, frequency)
                 else:
                     analysis(lemma, word_class, "", lemma, frequency)
                     for form in irregular:
@@ -239,7 +249,13 @@ def english(args):
     for word in analyses:
         for _, _, _, word_class, features, base in sorted(analyses[word]):
             lexicon.add(word, word_class, features, base)
-    print("english: %d words" % lexicon.write(args.lexicon), file=sys.stderr)
+    print("english: %d words, %d regular degrees that are words of their own left out"
+          % (lexicon.write(args.lexicon), len(dropped)), file=sys.stderr)
+    with open(args.lexicon + ".fixes", "w", encoding="utf-8") as out:
+        out.write("# Comparatives and superlatives made by the rule that are words of their own\n"
+                  "# in WordNet, left out: FORM<TAB>ADJECTIVE\n")
+        for form, lemma in sorted(dropped):
+            out.write("%s\t%s\n" % (form, lemma))
     write_frequencies(args.frequencies, frequencies)
 
 

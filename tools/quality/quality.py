@@ -45,13 +45,13 @@ DISAGREEMENTS = Counter()
 # The MeCab words that the cut splits, with their pieces.
 SPLITS = Counter()
 STRUCTURE_TAGS = {"two", "three", "four", "five", "pick"}
-LIBRARY = os.path.join(HERE, "..", "..", "share", "zefoko", "behaviors", "animations", "Stand")
+LIBRARY = os.path.join(HERE, "..", "..", "share", "zefoko", "behaviors")
 
 
-def library_tags():
+def library_tags(library):
     """The tags of the starter library: an automatic tag without an animation is no gesture."""
     tags = set()
-    for folder, _, files in os.walk(LIBRARY):
+    for folder, _, files in os.walk(os.path.join(library, "animations", "Stand")):
         if "behavior.json" in files:
             with open(os.path.join(folder, "behavior.json"), encoding="utf-8") as source:
                 tags.update(json.load(source).get("tags", []))
@@ -161,7 +161,7 @@ def percent(part, whole):
     return 100.0 * part / whole if whole else 0.0
 
 
-def measure(mokuto, lang, kind, coordinations):
+def measure(mokuto, lang, kind, coordinations, library):
     language = LANGUAGES[lang]
     sentences = read_lines(os.path.join(HERE, "texts", "%s.%s.txt" % (kind, lang)))
     with concurrent.futures.ThreadPoolExecutor(max_workers=os.cpu_count() or 2) as pool:
@@ -264,7 +264,7 @@ def measure(mokuto, lang, kind, coordinations):
                                                            len(labelled))
 
     tags = Counter()
-    gestures = library_tags()
+    gestures = library_tags(library)
     for analysed in analyses:
         for action in analysed["actions"]:
             if action["keyword"] == "AUTO_START_TAG" and action["tag"] in gestures:
@@ -292,6 +292,8 @@ def measure(mokuto, lang, kind, coordinations):
 def main():
     parser = argparse.ArgumentParser(description=__doc__.split("\n")[0])
     parser.add_argument("--build", default=os.path.join(HERE, "..", "..", "build", "default"))
+    parser.add_argument("--library", default=LIBRARY,
+                        help="the behaviour library whose tags count as gestures")
     parser.add_argument("--held-out", action="store_true",
                         help="measure the held-out texts instead of the development ones")
     parser.add_argument("--languages", default="en,fr,ja")
@@ -309,7 +311,7 @@ def main():
         print("%s (%s text)" % (LANGUAGES[lang], "held-out" if args.held_out else "development"))
         DISAGREEMENTS.clear()
         SPLITS.clear()
-        for name, value in measure(mokuto, lang, kind, coordinations).items():
+        for name, value in measure(mokuto, lang, kind, coordinations, args.library).items():
             print("  %-42s %s" % (name, value))
         for (word, ours, theirs), count in DISAGREEMENTS.most_common(args.disagreements):
             print("    %4d  %s: %s, not %s" % (count, word, ours, theirs))

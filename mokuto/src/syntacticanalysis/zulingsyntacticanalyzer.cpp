@@ -28,6 +28,12 @@ constexpr std::array<std::string_view, 8> kAndWords = {"and",  "et",     "と", 
 constexpr std::array<std::string_view, 10> kOrWords = {
     "or", "ou", "か", "または", "又は", "あるいは", "或いは", "もしくは", "若しくは", "それとも"};
 constexpr std::array<std::string_view, 3> kParticles = {"と", "や", "か"};
+// Words that begin an indirect question or a relative clause.
+constexpr std::array<std::string_view, 10> kQuestionWords = {
+    "how", "why", "what", "whether", "comment", "pourquoi", "combien", "quoi", "lorsque",
+    "quand"};
+constexpr std::array<std::string_view, 9> kRelativeWords = {
+    "that", "which", "who", "whom", "whose", "qui", "que", "dont", "où"};
 constexpr std::array<std::string_view, 4> kItemSeparators = {",", "、", "，", "､"};
 
 template <std::size_t N>
@@ -412,6 +418,7 @@ struct Token {
   // The word lowercased, in the builder's buffer.
   std::string_view lower;
   std::uint32_t records = 0;  // bit per word class the word has
+  ZULingWordClass firstClass = WORD_CLASS_UNKNOWN;  // the class of its first record
   bool infinitive = false;    // a verb record of the infinitive
 
   bool has(ZULingWordClass wordClass) const noexcept { return (records >> wordClass) & 1u; }
@@ -484,6 +491,7 @@ class StructureBuilder {
         fLower += lowerByte(b);
       token.lower = std::string_view(fLower).substr(from);
       token.role = roleOfClass(wordClass);
+      token.firstClass = wordClass;
       for (const ZULingClassFeatures& record : chunk.classes) {
         if (record.wordClass >= 0 && record.wordClass < 32)
           token.records |= 1u << record.wordClass;
@@ -823,35 +831,61 @@ class StructureBuilder {
            (group.lastRole == Role::Noun || group.lastRole == Role::Pronoun);
   }
 
-  // Two clauses, not a list:
-  // - the group after the coordinating word is a subject, followed by a verb, while the
-  //   first item follows a verb or a preposition ("I like tea and he likes coffee", "I
-  //   was born in Paris and I was happy", "it opens libc and libc calls the kernel") or
-  //   is the only one, before a comma ("there is one disk, and everything is there");
-  // - or it is a lone word that can be a verb, followed by its object or an adverb: a
-  //   second action ("type your name and press the Enter key").
+  // Two clauses, not a list, where the group after the coordinating word
+  // - begins with a question word ("learn how it works and how you can help");
+  // - is a lone word that can be a verb followed by its object or an adverb, a lone word
+  //   that is first a verb followed by a preposition where the first item follows a
+  //   verb, or an unknown word followed by an object pronoun: a second action ("type
+  //   your name and press the Enter key", "it does more and comes with examples",
+  //   "unpack it and repack it");
+  // - or is a subject, followed by a verb (after a comma, past its prepositional
+  //   groups), while it is a lone pronoun after a first item that does not begin the
+  //   sentence ("the skeleton of our package and it uses debhelper"), or the first item
+  //   follows a verb or a preposition ("I like tea and he likes coffee", "I was born in
+  //   Paris and I was happy", "it has packages for most programs, and the number of
+  //   packages is larger"), or stands alone before a comma ("there is one disk, and
+  //   everything is there"; but "apples, pears, and plums are ripe" stays a list).
   bool xStartsClause(const Item& right, const Item& firstLeft, bool commaBefore,
                      std::size_t leftItems) const {
     const Group& group = fGroups[right.group];
+    const Token& lone = fTokens[group.firstToken];
+    if (isOneOf(lone.lower, kQuestionWords))
+      return true;
     const std::size_t next = group.lastToken + 1;
     if (next >= fTokens.size() || fTokens[next].type != Token::Word)
       return false;
-    const Token& lone = fTokens[group.firstToken];
+    const std::size_t previous = firstLeft.firstToken;
+    const bool beginsSentence = previous == 0 || fTokens[previous - 1].type == Token::Break;
+    const bool afterVerb = previous > 0 && fGroupOfToken[previous - 1] != kNone &&
+                           fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB;
     const Role after = fTokens[next].role;
-    if (group.firstToken == group.lastToken &&
-        (lone.has(WORD_CLASS_VERB) || lone.has(WORD_CLASS_AUXILIARY)) &&
-        (after == Role::Determiner || after == Role::Pronoun || after == Role::Clitic ||
-         after == Role::Noun || after == Role::Adverb || after == Role::Adjective))
+    const bool single = group.firstToken == group.lastToken;
+    const bool canBeVerb = lone.has(WORD_CLASS_VERB) || lone.has(WORD_CLASS_AUXILIARY);
+    const bool objectAfter = after == Role::Pronoun || after == Role::Clitic;
+    if (single &&
+        ((canBeVerb && (objectAfter || after == Role::Determiner || after == Role::Noun ||
+                        after == Role::Adverb || after == Role::Adjective)) ||
+         (lone.firstClass == WORD_CLASS_VERB && after == Role::Preposition && afterVerb) ||
+         (lone.firstClass == WORD_CLASS_UNKNOWN && objectAfter)))
       return true;
-    if (fGroupOfToken[next] == kNone || fGroups[fGroupOfToken[next]].kind != STRUCTURE_VERB)
+    // The verb of a subject; after a comma, past its prepositional groups ("the number of
+    // packages in the archive is"), which without a comma would rather belong to the
+    // list ("changing its owner or its rights of a file changes").
+    std::size_t k = next;
+    while (commaBefore && k < fTokens.size() && fTokens[k].type == Token::Word &&
+           (fTokens[k].role == Role::Preposition || fTokens[k].role == Role::Adverb ||
+            ((fTokens[k].role == Role::Noun || fTokens[k].role == Role::Determiner ||
+              fTokens[k].role == Role::Adjective) &&
+             !isOneOf(fTokens[k].lower, kRelativeWords))))
+      ++k;
+    if (k >= fTokens.size() || fGroupOfToken[k] == kNone ||
+        fGroups[fGroupOfToken[k]].kind != STRUCTURE_VERB)
       return false;
+    if (single && lone.role == Role::Pronoun && k == next && !beginsSentence)
+      return true;
     if (commaBefore && leftItems == 1)
       return true;
-    const std::size_t previous = firstLeft.firstToken;
-    return previous > 0 &&
-           (xIsPreposition(previous - 1) ||
-            (fGroupOfToken[previous - 1] != kNone &&
-             fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB));
+    return afterVerb || (previous > 0 && xIsPreposition(previous - 1));
   }
 
   Structure xGroupStructure(const Group& group) const {
