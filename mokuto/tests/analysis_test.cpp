@@ -649,6 +649,7 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"English", "It opens the library and the library calls the kernel.", false},
       {"English", "It is a great feature and very useful.", false},
       {"English", "It does more and comes with examples.", false},
+      {"English", "Follow the guide provided by the team and sent to the list.", false},
       {"English", "Learn how it works and how you can help.", false},
       {"English", "Put a space between each directory or file in the name.", true},
       {"English", "Changing the owner or the rights of a file changes its time.", true},

@@ -28,6 +28,8 @@ constexpr std::array<std::string_view, 8> kAndWords = {"and",  "et",     "と", 
 constexpr std::array<std::string_view, 10> kOrWords = {
     "or", "ou", "か", "または", "又は", "あるいは", "或いは", "もしくは", "若しくは", "それとも"};
 constexpr std::array<std::string_view, 3> kParticles = {"と", "や", "か"};
+// Determiners that are also the preposition "de": they follow nouns as often as verbs.
+constexpr std::array<std::string_view, 4> kPartitives = {"d", "de", "du", "des"};
 // Words that begin an indirect question or a relative clause.
 constexpr std::array<std::string_view, 10> kQuestionWords = {
     "how", "why", "what", "whether", "comment", "pourquoi", "combien", "quoi", "lorsque",
@@ -420,6 +422,7 @@ struct Token {
   std::uint32_t records = 0;  // bit per word class the word has
   ZULingWordClass firstClass = WORD_CLASS_UNKNOWN;  // the class of its first record
   bool infinitive = false;    // a verb record of the infinitive
+  bool participle = false;    // a verb record of a participle
 
   bool has(ZULingWordClass wordClass) const noexcept { return (records >> wordClass) & 1u; }
 };
@@ -497,6 +500,9 @@ class StructureBuilder {
           token.records |= 1u << record.wordClass;
         if (record.wordClass == WORD_CLASS_VERB && record.features.find('W') != std::string::npos)
           token.infinitive = true;
+        if (record.wordClass == WORD_CLASS_VERB &&
+            record.features.find_first_of("KG") != std::string::npos)
+          token.participle = true;
       }
       if (kCoordinationFirstBytes[static_cast<unsigned char>(token.lower[0])]) {
         if (isOneOf(token.lower, kAndWords))
@@ -833,11 +839,12 @@ class StructureBuilder {
 
   // Two clauses, not a list, where the group after the coordinating word
   // - begins with a question word ("learn how it works and how you can help");
-  // - is a lone word that can be a verb followed by its object or an adverb, a lone word
-  //   that is first a verb followed by a preposition where the first item follows a
-  //   verb, or an unknown word followed by an object pronoun: a second action ("type
-  //   your name and press the Enter key", "it does more and comes with examples",
-  //   "unpack it and repack it");
+  // - is a lone word that can be a verb followed by its object or an adverb, a
+  //   participle followed by a preposition, a lone word that is first a verb followed by
+  //   a preposition where the first item follows a verb, or an unknown word followed by
+  //   an object pronoun or a determiner: a second action ("type your name and press the
+  //   Enter key", "provided by the team and sent to the list", "it does more and comes
+  //   with examples", "unpack it and repack it");
   // - or is a subject, followed by a verb (after a comma, past its prepositional
   //   groups), while it is a lone pronoun after a first item that does not begin the
   //   sentence ("the skeleton of our package and it uses debhelper"), or the first item
@@ -865,8 +872,11 @@ class StructureBuilder {
     if (single &&
         ((canBeVerb && (objectAfter || after == Role::Determiner || after == Role::Noun ||
                         after == Role::Adverb || after == Role::Adjective)) ||
-         (lone.firstClass == WORD_CLASS_VERB && after == Role::Preposition && afterVerb) ||
-         (lone.firstClass == WORD_CLASS_UNKNOWN && objectAfter)))
+         (after == Role::Preposition &&
+          (lone.participle || (lone.firstClass == WORD_CLASS_VERB && afterVerb))) ||
+         (lone.firstClass == WORD_CLASS_UNKNOWN &&
+          (objectAfter ||
+           (after == Role::Determiner && !isOneOf(fTokens[next].lower, kPartitives))))))
       return true;
     // The verb of a subject; after a comma, past its prepositional groups ("the number of
     // packages in the archive is"), which without a comma would rather belong to the
