@@ -28,6 +28,8 @@ constexpr std::array<std::string_view, 8> kAndWords = {"and",  "et",     "と", 
 constexpr std::array<std::string_view, 10> kOrWords = {
     "or", "ou", "か", "または", "又は", "あるいは", "或いは", "もしくは", "若しくは", "それとも"};
 constexpr std::array<std::string_view, 3> kParticles = {"と", "や", "か"};
+// The agent of a passive: "run by dpkg".
+constexpr std::array<std::string_view, 2> kAgentWords = {"by", "par"};
 // Determiners that are also the preposition "de": they follow nouns as often as verbs.
 constexpr std::array<std::string_view, 4> kPartitives = {"d", "de", "du", "des"};
 // Words that begin an indirect question or a relative clause.
@@ -840,15 +842,19 @@ class StructureBuilder {
   // Two clauses, not a list, where the group after the coordinating word
   // - begins with a question word ("learn how it works and how you can help");
   // - is a lone word that can be a verb followed by its object or an adverb, a
-  //   participle followed by a preposition, a lone word that is first a verb followed by
+  //   participle followed by a preposition or a lone word that can be a verb followed by
+  //   "by" ("put in the archive and run by dpkg"), a lone word that is first a verb followed by
   //   a preposition where the first item follows a verb, or an unknown word followed by
   //   an object pronoun or a determiner: a second action ("type your name and press the
   //   Enter key", "provided by the team and sent to the list", "it does more and comes
   //   with examples", "unpack it and repack it");
+  // - begins with a verb that is first a verb, when the first item follows a verb ("copy
+  //   the files and run the tool");
   // - or is a subject, followed by a verb (after a comma, past its prepositional
-  //   groups), while it is a lone pronoun after a first item that does not begin the
-  //   sentence ("the skeleton of our package and it uses debhelper"), or the first item
-  //   follows a verb or a preposition ("I like tea and he likes coffee", "I was born in
+  //   groups) and without a preposition before it, while the first item does not begin a
+  //   clause ("the skeleton of our package and it uses debhelper", "in the patches
+  //   directory and the source tree is untouched"), or the first item follows a verb or
+  //   a preposition ("I like tea and he likes coffee", "I was born in
   //   Paris and I was happy", "it has packages for most programs, and the number of
   //   packages is larger"), or stands alone before a comma ("there is one disk, and
   //   everything is there"; but "apples, pears, and plums are ripe" stays a list).
@@ -862,16 +868,20 @@ class StructureBuilder {
     if (next >= fTokens.size() || fTokens[next].type != Token::Word)
       return false;
     const std::size_t previous = firstLeft.firstToken;
-    const bool beginsSentence = previous == 0 || fTokens[previous - 1].type == Token::Break;
+    const bool beginsClause = previous == 0 || xBeginsClause(previous - 1);
     const bool afterVerb = previous > 0 && fGroupOfToken[previous - 1] != kNone &&
                            fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB;
     const Role after = fTokens[next].role;
     const bool single = group.firstToken == group.lastToken;
     const bool canBeVerb = lone.has(WORD_CLASS_VERB) || lone.has(WORD_CLASS_AUXILIARY);
     const bool objectAfter = after == Role::Pronoun || after == Role::Clitic;
+    // "copy the files and run the tool": a verb first, before its object.
+    if (!single && afterVerb && lone.firstClass == WORD_CLASS_VERB && lone.infinitive)
+      return true;
     if (single &&
         ((canBeVerb && (objectAfter || after == Role::Determiner || after == Role::Noun ||
-                        after == Role::Adverb || after == Role::Adjective)) ||
+                        after == Role::Adverb || after == Role::Adjective ||
+                        isOneOf(fTokens[next].lower, kAgentWords))) ||
          (after == Role::Preposition &&
           (lone.participle || (lone.firstClass == WORD_CLASS_VERB && afterVerb))) ||
          (lone.firstClass == WORD_CLASS_UNKNOWN &&
@@ -891,11 +901,24 @@ class StructureBuilder {
     if (k >= fTokens.size() || fGroupOfToken[k] == kNone ||
         fGroups[fGroupOfToken[k]].kind != STRUCTURE_VERB)
       return false;
-    if (single && lone.role == Role::Pronoun && k == next && !beginsSentence)
+    // A subject has no preposition before it ("of books and of documents are", "de
+    // livres et de documents sont").
+    if (right.firstToken != group.firstToken || lone.lower == "de" || lone.lower == "d")
+      return false;
+    if (k == next && !beginsClause)
       return true;
     if (commaBefore && leftItems == 1)
       return true;
     return afterVerb || (previous > 0 && xIsPreposition(previous - 1));
+  }
+
+  // Whether a clause may begin after token t: a comma, a mark other than a slash
+  // ("debian/patches"), a subordinating or coordinating word ("although").
+  bool xBeginsClause(std::size_t t) const {
+    const Token& token = fTokens[t];
+    if (token.type != Token::Word)
+      return token.type == Token::Comma || fChunks[token.chunk].text != "/";
+    return token.role == Role::Subordinator || token.role == Role::Conjunction;
   }
 
   Structure xGroupStructure(const Group& group) const {
