@@ -529,13 +529,11 @@ def sorry_low(g):
 # another language spells alike with another meaning is no tag: French "content" is
 # English "contents", "ensemble" a musical one, "minuscule" a lowercase letter, "super"
 # the superuser (French "non" stays: the English database gives the prefix "non-" no
-# base form). English "no" is no tag either: a word's first class gives its tag, and
-# the first class of "no" is the determiner ("with no file"), which calls for no shake
-# of the head.
+# base form).
 ME = ["me", "i", "myself", "je", "moi", "私", "僕"]
 YOU = ["you", "yourself", "tu", "toi", "vous", "あなた", "君"]
 YES = ["yes", "oui", "はい", "うん"]
-NO = ["non", "いいえ"]
+NO = ["no", "non", "いいえ"]
 HELLO = ["hello", "hey", "hi", "bonjour", "salut", "coucou", "こんにちは", "やあ"]
 
 GESTURES = [
@@ -556,7 +554,7 @@ GESTURES = [
     ("Five_1", ["five", "hello"], five),
     ("Pick_1", ["pick"], pick),
     ("Pick_2", ["pick"], weigh),
-    ("Oppose_1", ["oppose"], oppose),
+    ("Oppose_1", ["oppose", "no"], oppose),
     ("Oppose_2", ["oppose"], nothing_wipe),
     ("Yeah_1", ["yeah"], yeah),
     ("Medidate_1", ["medidate"], meditate),

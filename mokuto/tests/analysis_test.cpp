@@ -585,7 +585,7 @@ TEST_F(RealDatabases, WordsGetTheirCutBaseFormAndLabel) {
       {"Japanese", "し", "する"},   {"French", "au", "à"},          {"French", "aux", "à"},
       {"French", "du", "de"},       {"French", "des", "de"},        {"French", "cela", "cela"},
       {"French", "vi", "vi"},       {"French", "votre", "votre"},   {"French", "fichiers", "fichier"},
-      {"French", "four", ""},       {"English", "no", ""},          {"English", "non", ""},
+      {"French", "four", ""},       {"English", "no", "no"},        {"English", "non", ""},
       {"English", "files", "file"},
   };
   for (const BaseForm& b : baseForms) {
@@ -678,6 +678,7 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
        std::vector<std::tuple<std::string, std::string, std::string>>{
            {"English", "Read the contents of the file.", "content"},
            {"English", "It works with no file.", "no"},
+           {"English", "No file, no answer.", "no"},
            {"English", "A non-POSIX shell.", "non"},
            {"English", "Log in as the super user.", "super"},
            {"French", "Mettez le plat au four.", "four"},
@@ -694,4 +695,13 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
     }
     EXPECT_THAT(gestures, ::testing::Not(::testing::Contains(unwanted))) << text;
   }
+  // The answer "No" shakes the head.
+  MokutoConfig config;
+  config.msPauseBeforeSpeech = 0;
+  MKTaskInstruction answer(1, "No, thank you.", config, Standing);
+  tagging.process(answer, "English");
+  std::vector<std::string> tags;
+  for (const auto& action : answer.actions)
+    tags.push_back(static_cast<const MKAnimationAction&>(*action).tag);
+  EXPECT_THAT(tags, ::testing::Contains("no"));
 }

@@ -36,9 +36,7 @@ whose	determinant=whose	pronoun=whose
 all	determinant=all	pronoun=all
 both	determinant=both	pronoun=both
 half	determinant=half	pronoun=half
-# The determiner "no" ("with no file") has no base form, so that it gets no gesture of
-# its own (the head shake belongs to the answer "no").
-no	determinant/n	interjection/n=no
+no	determinant/n=no	interjection/n=no
 what	pronoun=what	determinant=what
 which	pronoun=which	determinant=which
 whatever	pronoun=whatever	determinant=whatever

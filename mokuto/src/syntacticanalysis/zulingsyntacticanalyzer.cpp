@@ -425,6 +425,7 @@ struct Token {
   ZULingWordClass firstClass = WORD_CLASS_UNKNOWN;  // the class of its first record
   bool infinitive = false;    // a verb record of the infinitive
   bool participle = false;    // a verb record of a participle
+  bool negativeDeterminer = false;  // a determiner record of negation ("no")
 
   bool has(ZULingWordClass wordClass) const noexcept { return (records >> wordClass) & 1u; }
 };
@@ -505,6 +506,9 @@ class StructureBuilder {
         if (record.wordClass == WORD_CLASS_VERB &&
             record.features.find_first_of("KG") != std::string::npos)
           token.participle = true;
+        if (record.wordClass == WORD_CLASS_DETERMINANT &&
+            record.features.find('n') != std::string::npos)
+          token.negativeDeterminer = true;
       }
       if (kCoordinationFirstBytes[static_cast<unsigned char>(token.lower[0])]) {
         if (isOneOf(token.lower, kAndWords))
@@ -587,6 +591,10 @@ class StructureBuilder {
             !next.has(WORD_CLASS_NOUN) && !next.has(WORD_CLASS_ADJECTIVE))
           role = Role::Clitic;
       }
+      // The answer "No." or "No, ..." rather than the determiner of "no file".
+      if (role == Role::Determiner && token.negativeDeterminer &&
+          token.has(WORD_CLASS_INTERJECTION) && !xIsWord(t + 1))
+        role = Role::Interjection;
       token.role = role;
       verbContext = role == Role::Pronoun || role == Role::Auxiliary || role == Role::Clitic ||
                     (verbContext && role == Role::Adverb);
@@ -682,6 +690,10 @@ class StructureBuilder {
           break;
         }
         default: {
+          // A determiner of negation ("with no file") belongs to no group: it asks for
+          // no gesture of its own, the head shake being the answer "No."'s.
+          if (token.role == Role::Determiner && token.negativeDeterminer)
+            break;
           // Nominal words. Where words are spaced, a determiner or a pronoun after a
           // noun or pronoun, or a word after a pronoun, begins another group.
           bool same = currentKind() == STRUCTURE_NOMINAL;
