@@ -582,10 +582,10 @@ TEST_F(RealDatabases, WordsGetTheirCutBaseFormAndLabel) {
     std::string language, word, baseForm;
   };
   const std::vector<BaseForm> baseForms = {
-      {"Japanese", "し", "する"},   {"French", "au", "à"},          {"French", "aux", "à"},
-      {"French", "du", "de"},       {"French", "des", "de"},        {"French", "cela", "cela"},
-      {"French", "vi", "vi"},       {"French", "votre", "votre"},   {"French", "fichiers", "fichier"},
-      {"French", "four", ""},       {"English", "no", "no"},        {"English", "non", ""},
+      {"Japanese", "し", "する"},   {"French", "au", "à"},        {"French", "aux", "à"},
+      {"French", "du", "de"},       {"French", "des", "de"},      {"French", "cela", "cela"},
+      {"French", "vi", "vi"},       {"French", "votre", "votre"}, {"French", "fichiers", "fichier"},
+      {"French", "four", ""},       {"English", "no", "no"},      {"English", "non", ""},
       {"English", "files", "file"},
   };
   for (const BaseForm& b : baseForms) {
@@ -622,7 +622,8 @@ TEST_F(RealDatabases, WordsGetTheirCutBaseFormAndLabel) {
     EXPECT_EQ(label, b.baseForm) << b.language << ": " << b.word;
   }
   ZULingEmotionEstimator estimator(languages_);
-  for (const auto& [language, text, emotion] : std::vector<std::tuple<std::string, std::string, int>>{
+  for (const auto& [language, text, emotion] :
+       std::vector<std::tuple<std::string, std::string, int>>{
            {"Japanese", "楽しいですね", 1},
            {"Japanese", "満足していません", -1},
            {"Japanese", "申し訳ありません", -1},
@@ -665,8 +666,8 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
     ZULingSyntacticAnalyzer analyzer(languages_);
     analyzer.setLanguage(c.language);
     const std::string structures = describe(analyzer.analyse(c.text));
-    const bool enumeration = structures.find("and") != std::string::npos ||
-                             structures.find("or2") != std::string::npos;
+    const bool enumeration =
+        structures.find("and") != std::string::npos || structures.find("or2") != std::string::npos;
     EXPECT_EQ(enumeration, c.enumeration) << c.text << ": " << structures;
   }
   // Words of one language that another spells alike call for no gesture there: their

@@ -34,8 +34,7 @@ constexpr std::array<std::string_view, 2> kAgentWords = {"by", "par"};
 constexpr std::array<std::string_view, 4> kPartitives = {"d", "de", "du", "des"};
 // Words that begin an indirect question or a relative clause.
 constexpr std::array<std::string_view, 10> kQuestionWords = {
-    "how", "why", "what", "whether", "comment", "pourquoi", "combien", "quoi", "lorsque",
-    "quand"};
+    "how", "why", "what", "whether", "comment", "pourquoi", "combien", "quoi", "lorsque", "quand"};
 constexpr std::array<std::string_view, 9> kRelativeWords = {
     "that", "which", "who", "whom", "whose", "qui", "que", "dont", "où"};
 constexpr std::array<std::string_view, 4> kItemSeparators = {",", "、", "，", "､"};
@@ -321,7 +320,6 @@ class Cutter {
     return p;
   }
 
-
   void xPush(std::size_t begin, std::size_t end, ZULingWordClass wordClass) {
     Chunk chunk;
     chunk.text.assign(fText, begin, end - begin);
@@ -421,11 +419,11 @@ struct Token {
   bool particle = false;
   // The word lowercased, in the builder's buffer.
   std::string_view lower;
-  std::uint32_t records = 0;  // bit per word class the word has
+  std::uint32_t records = 0;                        // bit per word class the word has
   ZULingWordClass firstClass = WORD_CLASS_UNKNOWN;  // the class of its first record
-  bool infinitive = false;    // a verb record of the infinitive
-  bool participle = false;    // a verb record of a participle
-  bool negativeDeterminer = false;  // a determiner record of negation ("no")
+  bool infinitive = false;                          // a verb record of the infinitive
+  bool participle = false;                          // a verb record of a participle
+  bool negativeDeterminer = false;                  // a determiner record of negation ("no")
 
   bool has(ZULingWordClass wordClass) const noexcept { return (records >> wordClass) & 1u; }
 };
@@ -853,13 +851,12 @@ class StructureBuilder {
 
   // Two clauses, not a list, where the group after the coordinating word
   // - begins with a question word ("learn how it works and how you can help");
-  // - is a lone word that can be a verb followed by its object or an adverb, a
-  //   participle followed by a preposition or a lone word that can be a verb followed by
-  //   "by" ("put in the archive and run by dpkg"), a lone word that is first a verb followed by
+  // - is a lone word that can be a verb followed by its object, an adverb or "by", a
+  //   participle followed by a preposition, a lone word that is first a verb followed by
   //   a preposition where the first item follows a verb, or an unknown word followed by
   //   an object pronoun or a determiner: a second action ("type your name and press the
-  //   Enter key", "provided by the team and sent to the list", "it does more and comes
-  //   with examples", "unpack it and repack it");
+  //   Enter key", "put in the archive and run by dpkg", "provided by the team and sent
+  //   to the list", "it does more and comes with examples", "unpack it and repack it");
   // - begins with a verb that is first a verb, when the first item follows a verb ("copy
   //   the files and run the tool");
   // - or is a subject, followed by a verb (after a comma, past its prepositional
@@ -890,15 +887,14 @@ class StructureBuilder {
     // "copy the files and run the tool": a verb first, before its object.
     if (!single && afterVerb && lone.firstClass == WORD_CLASS_VERB && lone.infinitive)
       return true;
-    if (single &&
-        ((canBeVerb && (objectAfter || after == Role::Determiner || after == Role::Noun ||
-                        after == Role::Adverb || after == Role::Adjective ||
-                        isOneOf(fTokens[next].lower, kAgentWords))) ||
-         (after == Role::Preposition &&
-          (lone.participle || (lone.firstClass == WORD_CLASS_VERB && afterVerb))) ||
-         (lone.firstClass == WORD_CLASS_UNKNOWN &&
-          (objectAfter ||
-           (after == Role::Determiner && !isOneOf(fTokens[next].lower, kPartitives))))))
+    if (single && ((canBeVerb && (objectAfter || after == Role::Determiner || after == Role::Noun ||
+                                  after == Role::Adverb || after == Role::Adjective ||
+                                  isOneOf(fTokens[next].lower, kAgentWords))) ||
+                   (after == Role::Preposition &&
+                    (lone.participle || (lone.firstClass == WORD_CLASS_VERB && afterVerb))) ||
+                   (lone.firstClass == WORD_CLASS_UNKNOWN &&
+                    (objectAfter ||
+                     (after == Role::Determiner && !isOneOf(fTokens[next].lower, kPartitives))))))
       return true;
     // The verb of a subject; after a comma, past its prepositional groups ("the number of
     // packages in the archive is"), which without a comma would rather belong to the
