@@ -29,9 +29,13 @@ Json lookUp(const ZU::ZULingSyntacticAnalyzerBinaryDatabase& database, const std
   for (const ZU::ZULingClassFeatures& record : database.wordClasses(word)) {
     std::string baseForm;
     const bool hasBaseForm = database.lemma(word, record.wordClass, baseForm) && !baseForm.empty();
+    // The feature bytes as numbers: they are bytes, not text.
+    Json features = Json::array();
+    for (const char byte : record.features)
+      features.push_back(static_cast<unsigned char>(byte));
     records.push_back({{"class", ZU::lingWordClassToStr(record.wordClass)},
                        {"classValue", record.wordClass},
-                       {"features", record.features},
+                       {"features", std::move(features)},
                        {"lemma", hasBaseForm ? Json(baseForm) : Json(nullptr)}});
   }
   return {{"word", word},
@@ -47,8 +51,11 @@ void printText(const Json& entry) {
   std::cout << dump(entry["word"]) << ": " << (entry["found"].get<bool>() ? "found" : "not found")
             << ", longest stored prefix " << entry["longestPrefix"].get<std::size_t>() << '\n';
   for (const Json& record : entry["records"]) {
+    std::string features;
+    for (const Json& byte : record["features"])
+      features += static_cast<char>(byte.get<unsigned char>());
     std::cout << "  " << record["class"].get<std::string>() << " ("
-              << record["classValue"].get<int>() << ")  features " << dump(record["features"])
+              << record["classValue"].get<int>() << ")  features " << dump(Json(features))
               << "  lemma " << (record["lemma"].is_null() ? "none" : dump(record["lemma"])) << '\n';
   }
 }
@@ -67,7 +74,7 @@ void addLookupCommand(CLI::App& app, int& status) {
       ->excludes(language);
   command->add_flag("--json", options->json,
                     "Print one JSON object per word: word, found, longestPrefix, records "
-                    "(class, classValue, features, lemma)");
+                    "(class, classValue, features as an array of byte values, lemma)");
   command->add_option("words", options->words, "The words, as stored (lowercase)")->required();
   command->callback([options, &status]() {
     ZU::ZULingDatabasePtr database;
