@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "cli_commands.h"
+#include "cli_common.h"
 #include "mokuto/zulingsyntacticanalyzerbinarydatabase.h"
 
 namespace mokuto::cli {
@@ -67,10 +68,11 @@ void addLookupCommand(CLI::App& app, int& status) {
       "lookup", "Look words up in a linguistic database and print their records");
   auto options = std::make_shared<LookupOptions>();
   CLI::Option* language =
-      command->add_option("--language", options->language,
-                          "A language key of the speech engine (French, fr_FR, English, Japanese, "
-                          "EnglishEmotions, ...); default English");
+      addLanguageOption(*command, options->language, databaseKeys(),
+                        "A key of the linguistic databases (French, fr_FR, English, Japanese, "
+                        "EnglishEmotions, ...)");
   command->add_option("--database", options->database, "A database file to read instead")
+      ->type_name("FILE")
       ->excludes(language);
   command->add_flag("--json", options->json,
                     "Print one JSON object per word: word, found, longestPrefix, records "
@@ -87,12 +89,10 @@ void addLookupCommand(CLI::App& app, int& status) {
       ZU::ZULingDatabaseUser user(languages);
       user.setLanguage(options->language);
       database = user.database();
-      if (languages->count(options->language) == 0)
-        std::cerr << "mokuto lookup: \"" << options->language << "\" is not a language key\n";
     }
     if (!database) {
       std::cerr << "mokuto lookup: no linguistic database to read\n";
-      status = 1;
+      status = kFailure;
       return;
     }
     Json all = Json::array();

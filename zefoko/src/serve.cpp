@@ -71,8 +71,11 @@ void addServeCommand(CLI::App& app, int& status) {
                          "Start the simulated robot, load module libraries into it and serve until "
                          "SIGINT or SIGTERM");
   command->add_option("--speech", options->speech, "The speech engine: espeak or timing")
-      ->check(CLI::IsMember({"espeak", "timing"}));
-  command->add_option("--posture", options->posture, "The robot's posture family at start")
+      ->check(CLI::IsMember({"espeak", "timing"}))
+      ->capture_default_str();
+  command
+      ->add_option("--posture", options->posture,
+                   "The robot's posture family at start (default: Standing, the robot's own)")
       ->check(CLI::IsMember({"Standing", "Sitting", "SittingOnChair"}));
   command->add_option("libraries", options->libraries, "The module libraries (.so) to load")
       ->required()
