@@ -388,10 +388,6 @@ int say(SayOptions& o) {
         });
         signals.onStop([&] {
           stopAsked.store(true);
-          // The speech engine's warnings about a stopped speech (one per bookmark that it
-          // did not reach: thousands for a long text) say nothing the user needs.
-          if (ko::os::getenv("ZEFOKO_LOG").empty())
-            ko::log::setLevel("robotsim.texttospeech", ko::log::Error);
           service._stopAll(false);
         });
         if (!signals.received()) {
