@@ -48,12 +48,10 @@ class BehaviorProbe : public ZU::ZUModule {
       : ZU::ZUModule(broker, name), fTimeline(std::move(timeline)) {
     advertiseSignal<std::string>("behaviorStopped");
     fStopped = signal<std::string>("behaviorStopped");
-    beginMethod("startBehavior", "BehaviorProbe", "Records the start.");
-    bindMethod(&BehaviorProbe::startBehavior);
-    beginMethod("stopBehavior", "BehaviorProbe", "Signals the stop.");
-    bindMethod(&BehaviorProbe::stopBehavior);
-    beginMethod("isBehaviorRunning", "BehaviorProbe", "Never.");
-    bindMethod(&BehaviorProbe::isBehaviorRunning);
+    bindMethods("BehaviorProbe",
+                {{"startBehavior", &BehaviorProbe::startBehavior, "Records the start."},
+                 {"stopBehavior", &BehaviorProbe::stopBehavior, "Signals the stop."},
+                 {"isBehaviorRunning", &BehaviorProbe::isBehaviorRunning, "Never."}});
   }
   void startBehavior(const std::string& behavior) {
     fTimeline->record(kManager, "startBehavior", ko::AnyValue::list({behavior}));

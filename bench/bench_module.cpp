@@ -20,12 +20,10 @@ class Adder : public ZU::ZUModule {
  public:
   Adder(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
       : ZUModule(broker, name) {
-    beginMethod("add", "Adder", "Adds two integers.");
-    bindMethod(&Adder::add);
-    beginMethod("noop", "Adder", "Does nothing.");
-    bindMethod(&Adder::noop);
-    beginMethod("getBreathEnabled", "Adder", "Answers whether a chain breathes.");
-    bindMethod(&Adder::getBreathEnabled);
+    bindMethods("Adder", {{"add", &Adder::add, "Adds two integers."},
+                          {"noop", &Adder::noop, "Does nothing."},
+                          {"getBreathEnabled", &Adder::getBreathEnabled,
+                           "Answers whether a chain breathes."}});
   }
   int add(int a, int b) const { return a + b; }
   void noop() {}

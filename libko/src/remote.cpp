@@ -50,6 +50,21 @@ bool isLocalEndpoint(const std::string& endpoint) {
   return host.rfind("127.", 0) == 0 && host.find_first_not_of("0123456789.") == std::string::npos;
 }
 
+std::string missingKeys(const std::string& endpoint, bool listening, const CurveKeys& keys) {
+  if (isLocalEndpoint(endpoint))
+    return {};
+  if (listening && (keys.secretKey.empty() || keys.clientKeys.empty()))
+    return "Listening on " + endpoint +
+           " opens the service to the network: it needs CURVE keys (this process's secret key "
+           "and the public keys of the processes allowed to connect; make pairs with `zefoko "
+           "keys DIR`), or a loopback or ipc:// endpoint";
+  if (!listening && (keys.secretKey.empty() || keys.serverKey.empty()))
+    return "Connecting to " + endpoint +
+           " goes through the network: it needs CURVE keys (the listening process's public key "
+           "and a secret key of this process's own)";
+  return {};
+}
+
 KeyPair makeKeyPair() {
   char publicKey[kZ85KeyLength + 1] = {};
   char secretKey[kZ85KeyLength + 1] = {};

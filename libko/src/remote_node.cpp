@@ -102,18 +102,10 @@ std::shared_ptr<RemoteNode> RemoteNode::start(Session& session, Role role,
   if (options.heartbeatInterval.count() <= 0 ||
       options.heartbeatTimeout <= options.heartbeatInterval)
     throw Error("The heartbeat time-out must be longer than its interval, and both positive");
-  const CurveKeys& curve = options.curve;
-  if (!remote::isLocalEndpoint(endpoint)) {
-    if (role == Role::Listening && (curve.secretKey.empty() || curve.clientKeys.empty()))
-      throw Error("Listening on " + endpoint +
-                  " opens the service to the network: it needs CURVE keys (this process's "
-                  "secret key and the public keys of the processes allowed to connect; "
-                  "make pairs with `zefoko keys DIR`), or a loopback or ipc:// endpoint");
-    if (role == Role::Connecting && (curve.secretKey.empty() || curve.serverKey.empty()))
-      throw Error("Connecting to " + endpoint +
-                  " goes through the network: it needs CURVE keys (the listening process's "
-                  "public key and a secret key of this process's own)");
-  }
+  if (const std::string missing =
+          remote::missingKeys(endpoint, role == Role::Listening, options.curve);
+      !missing.empty())
+    throw Error(missing);
   auto node = std::make_shared<RemoteNode>(Key{}, session, role, std::move(options));
   node->xOpen(endpoint);
   node->thread_ = std::thread([n = node.get()] { n->xRun(); });

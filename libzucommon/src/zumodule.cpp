@@ -32,63 +32,63 @@ ZUValue methodHelp(const ZUMethodInfo& method) {
 
 ZUModule::ZUModule(const std::shared_ptr<ZUBroker>& broker, const std::string& name)
     : ZUModuleCore(broker, name) {
-  beginMethod("version", kModuleClass, "Returns the version of the module.");
-  describeReturn("result", "A string containing the version of the module.");
-  bindMethod(&ZUModuleCore::version);
-
-  beginMethod("ping", kModuleClass, "Just a ping. Always returns true");
-  describeReturn("alwaysTrue", "returns true");
-  bindMethod(&ZUModule::ping);
-
-  beginMethod("getMethodList", kModuleClass, "Retrieves the module's method list.");
-  describeReturn("methodList", "An array of method names.");
-  bindMethod(&ZUModule::getMethodList);
-
-  beginMethod("getMethodHelp", kModuleClass, "Retrieves a method's description.");
-  describeParameter("methodName", "The name of the method.");
-  describeReturn("methodHelp", "A structure containing the method's description.");
-  bindMethod(&ZUModule::getMethodHelp);
-
-  beginMethod("getModuleHelp", kModuleClass, "Retrieves the module's description.");
-  describeReturn("moduleHelp", "A structure describing the module.");
-  bindMethod(&ZUModule::getModuleHelp);
-
-  beginMethod("wait", kModuleClass,
-              "Wait for the end of a long running method that was called using 'post'");
-  describeParameter("id", kTaskIdDescription);
-  describeParameter("timeoutPeriod",
-                    "The timeout period in ms. To wait indefinately, use a timeoutPeriod of zero.");
-  describeReturn("timedOut",
-                 "True if the timeout period terminated. False if the method returned.");
-  bindMethod(&ZUModuleCore::wait);
-
-  beginMethod("isRunning", kModuleClass, "Returns true if the method is currently running.");
-  describeParameter("id", kTaskIdDescription);
-  describeReturn("running", "True if the method is currently running");
-  bindMethod(&ZUModuleCore::isRunning);
-
-  beginMethod("stop", kModuleClass, "returns true if the method is currently running");
-  describeParameter("id", "the ID of the method to wait for");
-  bindMethod(&ZUModuleCore::stop);
-
-  beginMethod("getBrokerName", kModuleClass, "Gets the name of the parent broker.");
-  describeReturn("brokerName", "The name of the parent broker.");
-  bindMethod(&ZUModuleCore::getBrokerName);
-
-  beginMethod("getUsage", kModuleClass,
-              "Gets the method usage string. This summarises how to use the method.");
-  describeParameter("name", "The name of the method.");
-  describeReturn("methodUsage", "A string that summarises the usage of the method.");
-  bindMethod(&ZUModuleCore::getUsage);
-
-  beginMethod("exit", kModuleClass, "Exits and unregisters the module.");
-  bindMethod(&ZUModuleCore::exit);
-
-  beginMethod("__pCall", kModuleClass, "Internal function to pCall methods");
-  bindMethod(&ZUModuleCore::pCallById);
-
-  beginMethod("pCall", kModuleClass, "ZEFOko1 pCall method.");
-  bindMethod(&ZUModuleCore::pCall);
+  static const std::vector<ZUMethodDeclaration> builtIns = {
+      {"version",
+       &ZUModuleCore::version,
+       "Returns the version of the module.",
+       {},
+       {"result", "A string containing the version of the module."}},
+      {"ping",
+       &ZUModule::ping,
+       "Just a ping. Always returns true",
+       {},
+       {"alwaysTrue", "returns true"}},
+      {"getMethodList",
+       &ZUModule::getMethodList,
+       "Retrieves the module's method list.",
+       {},
+       {"methodList", "An array of method names."}},
+      {"getMethodHelp",
+       &ZUModule::getMethodHelp,
+       "Retrieves a method's description.",
+       {{"methodName", "The name of the method."}},
+       {"methodHelp", "A structure containing the method's description."}},
+      {"getModuleHelp",
+       &ZUModule::getModuleHelp,
+       "Retrieves the module's description.",
+       {},
+       {"moduleHelp", "A structure describing the module."}},
+      {"wait",
+       &ZUModuleCore::wait,
+       "Wait for the end of a long running method that was called using 'post'",
+       {{"id", kTaskIdDescription},
+        {"timeoutPeriod",
+         "The timeout period in ms. To wait indefinately, use a timeoutPeriod of zero."}},
+       {"timedOut", "True if the timeout period terminated. False if the method returned."}},
+      {"isRunning",
+       &ZUModuleCore::isRunning,
+       "Returns true if the method is currently running.",
+       {{"id", kTaskIdDescription}},
+       {"running", "True if the method is currently running"}},
+      {"stop",
+       &ZUModuleCore::stop,
+       "returns true if the method is currently running",
+       {{"id", "the ID of the method to wait for"}}},
+      {"getBrokerName",
+       &ZUModuleCore::getBrokerName,
+       "Gets the name of the parent broker.",
+       {},
+       {"brokerName", "The name of the parent broker."}},
+      {"getUsage",
+       &ZUModuleCore::getUsage,
+       "Gets the method usage string. This summarises how to use the method.",
+       {{"name", "The name of the method."}},
+       {"methodUsage", "A string that summarises the usage of the method."}},
+      {"exit", &ZUModuleCore::exit, "Exits and unregisters the module."},
+      {"__pCall", &ZUModuleCore::pCallById, "Internal function to pCall methods"},
+      {"pCall", &ZUModuleCore::pCall, "ZEFOko1 pCall method."},
+  };
+  bindMethods(kModuleClass, builtIns);
 }
 
 ZUModule::~ZUModule() = default;

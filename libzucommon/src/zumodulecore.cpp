@@ -240,6 +240,18 @@ std::optional<ZUMethodInfo> ZUModuleCore::getMethodInfo(const std::string& name)
 
 // ---- binding -----------------------------------------------------------------
 
+void ZUModuleCore::bindMethods(const std::string& moduleClass,
+                               std::span<const ZUMethodDeclaration> methods) {
+  for (const auto& method : methods) {
+    beginMethod(method.name, moduleClass, method.description);
+    for (const auto& parameter : method.parameters)
+      describeParameter(parameter.name, parameter.description);
+    if (!method.returnValue.name.empty())
+      describeReturn(method.returnValue.name, method.returnValue.description);
+    xBind(method.member);
+  }
+}
+
 void ZUModuleCore::beginMethod(const std::string& name, const std::string& moduleClass,
                                const std::string& description) {
   std::lock_guard lock(fBindMutex);
@@ -266,6 +278,13 @@ void ZUModuleCore::describeReturn(const std::string& name, const std::string& de
 
 void ZUModuleCore::xThrowBindError(const std::string& reason) const {
   ZU_THROW_ERROR(fName, "bindMethod", reason);
+}
+
+void ZUModuleCore::xBind(const ZUMethodMember& member) {
+  std::optional<ko::MethodBinding> binding = member.bindOn(*this);
+  if (!binding)
+    xThrowBindError("the member function does not belong to this module's class");
+  xBind(std::move(*binding));
 }
 
 void ZUModuleCore::xBind(ko::MethodBinding binding) {

@@ -243,6 +243,13 @@ TEST(ModuleCoreTest, BindingMistakesRaise) {
   // A refused binding leaves the table as it was.
   EXPECT_EQ(module->metaObject().findMethod("echo").size(), 1u);
   EXPECT_EQ(module->getMethodInfos().size(), module->metaObject().methods().size());
+
+  auto bare = std::make_shared<BareModule>(nullptr, "Bare");
+  EXPECT_THAT(zutest::errorOf([&] {
+                bare->bindMethods("Bare", {{"echo", &Greeter::echo}});
+              }),
+              HasSubstr("does not belong to this module's class"));
+  EXPECT_TRUE(bare->getMethodInfos().empty());
 }
 
 TEST(ModuleCoreTest, TheFunctorBaseOnlyLogs) {

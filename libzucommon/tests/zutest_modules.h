@@ -67,28 +67,27 @@ class Greeter : public ZU::ZUModule {
   Greeter(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
       : ZUModule(broker, name) {
     setModuleDescription("A module of the tests.");
-    beginMethod("say", "Greeter", "Says a text.");
-    describeParameter("text", "The text to say.");
-    bindMethod<void(const std::string&)>(&Greeter::say);
-    beginMethod("say", "Greeter", "Says a text with a configuration.");
-    describeParameter("text", "The text to say.");
-    describeParameter("configuration", "The configuration.");
-    bindMethod<void(const std::string&, const ZU::ZUValue&)>(&Greeter::say);
-    beginMethod("echo", "Greeter", "Answers its argument.");
-    describeParameter("value", "Any value.");
-    describeReturn("echoed", "The same value.");
-    bindMethod(&Greeter::echo);
-    beginMethod("add", "Greeter", "Adds two integers.");
-    describeParameter("a", "First.");
-    describeParameter("b", "Second.");
-    describeReturn("sum", "a + b");
-    bindMethod(&Greeter::add);
-    beginMethod("fail", "Greeter", "Always fails.");
-    bindMethod(&Greeter::fail);
-    beginMethod("waitForRelease", "Greeter", "Blocks until the test releases it.");
-    bindMethod(&Greeter::waitForRelease);
-    beginMethod("waitForStop", "Greeter", "Blocks until its task is asked to stop.");
-    bindMethod(&Greeter::waitForStop);
+    const ZU::ZUMethodParameter text{"text", "The text to say."};
+    bindMethods(
+        "Greeter",
+        {{"say", ZU::overload<void(const std::string&)>(&Greeter::say), "Says a text.", {text}},
+         {"say",
+          ZU::overload<void(const std::string&, const ZU::ZUValue&)>(&Greeter::say),
+          "Says a text with a configuration.",
+          {text, {"configuration", "The configuration."}}},
+         {"echo",
+          &Greeter::echo,
+          "Answers its argument.",
+          {{"value", "Any value."}},
+          {"echoed", "The same value."}},
+         {"add",
+          &Greeter::add,
+          "Adds two integers.",
+          {{"a", "First."}, {"b", "Second."}},
+          {"sum", "a + b"}},
+         {"fail", &Greeter::fail, "Always fails."},
+         {"waitForRelease", &Greeter::waitForRelease, "Blocks until the test releases it."},
+         {"waitForStop", &Greeter::waitForStop, "Blocks until its task is asked to stop."}});
   }
 
   void say(const std::string& text) { record(text); }

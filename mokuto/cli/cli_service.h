@@ -15,7 +15,6 @@
 #include <mutex>
 #include <stdexcept>
 #include <string>
-
 #include <vector>
 
 #include "ko/session.hpp"
@@ -43,8 +42,24 @@ class ServiceError : public std::runtime_error {
 };
 
 // Hears each text enter each stage of the pipeline, in the say caller's thread (null:
-// nothing); remotely, the compiler stage alone.
+// nothing); remotely, the compiler and director stages alone, in the session's threads.
 using StageObserver = std::function<void(ZU::ZUMokutoStage stage, ZU::MKID id)>;
+
+// A line that the director logged, at warning or error level, as it ran an action.
+struct DirectorLine {
+  std::string function;
+  std::string message;
+};
+
+// Hears the director's reports. In the process, they come as onAction, in the say caller's
+// thread, where the director's lines can be heard as they are logged; from a service of
+// another process, as onRemoteAction, with the lines that its director logged about that
+// action there.
+class ActionObserver : public ZU::DirectorObserver {
+ public:
+  virtual void onRemoteAction(const ZU::DirectorActionReport& report,
+                              const std::vector<DirectorLine>& lines) = 0;
+};
 
 // What the commands use of the service; the methods of the module keep their names.
 class ServiceHandle {
@@ -54,10 +69,16 @@ class ServiceHandle {
   // as they are recorded there.
   virtual std::shared_ptr<robotsim::Timeline> timeline() = 0;
   virtual void setStageObserver(StageObserver observer) = 0;
-  virtual void setDirectorObserver(std::shared_ptr<ZU::DirectorObserver> observer) = 0;
+  virtual void setDirectorObserver(std::shared_ptr<ActionObserver> observer) = 0;
   // Once say has returned: waits (with a bound) until the observers and the timeline have
   // everything of the text `id`.
   virtual void settle(ZU::MKID /*id*/) {}
+  // What a signal stops of the command's text `id` (0: not taken up yet): in the process,
+  // everything the service runs, since the command is its only caller; remotely, that text
+  // alone, since other callers share the service.
+  virtual void stopText(ZU::MKID id) = 0;
+  // The behaviours installed on the robot, as its behaviour manager lists them.
+  virtual std::vector<std::string> installedBehaviors() = 0;
   virtual void setBodyLanguageModeFromStr(const std::string& mode) = 0;
   virtual void addTagsToWords(const ZU::ZUValue& tagsToWords) = 0;
   virtual void declareTagForAnimations(const ZU::ZUValue& tagsToAnimations) = 0;
@@ -67,7 +88,7 @@ class ServiceHandle {
                                                          const ZU::ZUValue& configuration) = 0;
   virtual void say(const std::string& text) = 0;
   virtual void say(const std::string& text, const ZU::ZUValue& configuration) = 0;
-  virtual void _stopAll(bool blocking) = 0;
+  virtual void stop(ZU::MKID id) = 0;
   virtual void saveRecording(const std::string& path) = 0;
   virtual std::vector<ZU::ZUMethodInfo> getMethodInfos() = 0;
   virtual std::vector<std::string> _getTagList() = 0;
@@ -76,11 +97,12 @@ class ServiceHandle {
   virtual std::string tagPage() = 0;
 };
 
-// The global options of `mokuto --connect ENDPOINT [--server-key F --secret-key F]`.
-void addConnectOptions(CLI::App& app);
-// Why these options cannot be used with --connect (they belong to the robot's process), or
-// empty; always empty without --connect.
-std::string remoteRefusal(const EmbeddedServiceOptions& options, bool dryRun, bool wav);
+// The global options of `mokuto --connect ENDPOINT [--server-key F --secret-key F]`, for
+// the subcommands named in `services` (the others, which do not use the service, refuse
+// them). Call it once the subcommands are added.
+void addConnectOptions(CLI::App& app, const std::vector<std::string>& services);
+// Whether --connect was given.
+bool connected();
 // The service: in the process, or the running one at the endpoint given with --connect.
 std::unique_ptr<ServiceHandle> openService(const EmbeddedServiceOptions& options);
 
@@ -97,9 +119,11 @@ class EmbeddedService : public ServiceHandle {
 
   void setStageObserver(StageObserver observer) override;
   std::shared_ptr<robotsim::Timeline> timeline() override { return robot().timeline(); }
-  void setDirectorObserver(std::shared_ptr<ZU::DirectorObserver> observer) override {
+  void setDirectorObserver(std::shared_ptr<ActionObserver> observer) override {
     fService->setDirectorObserver(std::move(observer));
   }
+  void stopText(ZU::MKID /*id*/) override { fService->_stopAll(false); }
+  std::vector<std::string> installedBehaviors() override;
   void setBodyLanguageModeFromStr(const std::string& mode) override {
     fService->setBodyLanguageModeFromStr(mode);
   }
@@ -119,7 +143,7 @@ class EmbeddedService : public ServiceHandle {
   void say(const std::string& text, const ZU::ZUValue& configuration) override {
     fService->say(text, configuration);
   }
-  void _stopAll(bool blocking) override { fService->_stopAll(blocking); }
+  void stop(ZU::MKID id) override { fService->stop(id); }
   void saveRecording(const std::string& path) override { robot().speech()->saveRecording(path); }
   std::vector<ZU::ZUMethodInfo> getMethodInfos() override { return fService->getMethodInfos(); }
   std::vector<std::string> _getTagList() override { return fService->_getTagList(); }
@@ -142,9 +166,11 @@ class EmbeddedService : public ServiceHandle {
 };
 
 // The running service "ZUMokuto" of the processes linked at an endpoint, the robot's
-// timeline followed through the robot's service "ZUTimeline", the director's reports
-// through the module's "actionReported". Raises ServiceError when no process answers
-// there within 10 s or the directory has no ZUMokuto.
+// timeline followed through the robot's service "ZUTimeline", the texts that this handle
+// says through the module's "_sayTraced" with a trace of its own, so that of the signals
+// "textAccepted", "textSpoken" and "actionReported" (which every subscriber hears) it
+// keeps those of its own texts. Raises ServiceError when no process answers there within
+// 10 s or the directory has no ZUMokuto.
 class RemoteService : public ServiceHandle {
  public:
   RemoteService(const std::string& endpoint, ko::RemoteOptions options);
@@ -152,8 +178,10 @@ class RemoteService : public ServiceHandle {
 
   std::shared_ptr<robotsim::Timeline> timeline() override { return fTimeline; }
   void setStageObserver(StageObserver observer) override;
-  void setDirectorObserver(std::shared_ptr<ZU::DirectorObserver> observer) override;
+  void setDirectorObserver(std::shared_ptr<ActionObserver> observer) override;
   void settle(ZU::MKID id) override;
+  void stopText(ZU::MKID id) override;
+  std::vector<std::string> installedBehaviors() override;
   void setBodyLanguageModeFromStr(const std::string& mode) override;
   void addTagsToWords(const ZU::ZUValue& v) override;
   void declareTagForAnimations(const ZU::ZUValue& v) override;
@@ -163,7 +191,7 @@ class RemoteService : public ServiceHandle {
                                                  const ZU::ZUValue& configuration) override;
   void say(const std::string& text) override;
   void say(const std::string& text, const ZU::ZUValue& configuration) override;
-  void _stopAll(bool blocking) override;
+  void stop(ZU::MKID id) override;
   void saveRecording(const std::string& path) override;
   std::vector<ZU::ZUMethodInfo> getMethodInfos() override;
   std::vector<std::string> _getTagList() override;
@@ -178,6 +206,8 @@ class RemoteService : public ServiceHandle {
   ko::AnyObject fRobotTimeline;
   std::shared_ptr<robotsim::Timeline> fTimeline = std::make_shared<robotsim::Timeline>();
   std::shared_ptr<Relay> fRelay;
+  // Marks this handle's texts in the module's signals; not 0, which marks untraced texts.
+  const int fTrace;
 };
 
 }  // namespace mokuto::cli

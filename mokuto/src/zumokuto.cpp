@@ -2,6 +2,7 @@
 
 #include <exception>
 #include <optional>
+#include <span>
 #include <utility>
 
 #include "ko/eventloop.hpp"
@@ -43,6 +44,158 @@ std::shared_ptr<CompilerTask> makeCompiler(const std::shared_ptr<ZUBroker>& brok
   return std::make_shared<CompilerTask>(std::move(tts));
 }
 
+// The published methods, in binding order. The constructor binds all but the last, which
+// init binds before it subscribes it to the micro-event.
+const std::vector<ZUMethodDeclaration>& publishedMethods() {
+  static const std::vector<ZUMethodDeclaration> methods = [] {
+    const ZUMethodParameter text{
+        "text", "An annotated text (for example: \"Hello. ^start(Hey_1) My name is ZEFO\")."};
+    const ZUMethodParameter enable{"enable",
+                                   "The boolean value: true to enable, false to disable."};
+    const ZUMethodParameter enabled{
+        "enable", "The boolean value: true means it is enabled, false means it is disabled."};
+    const ZUMethodParameter pause{"pause", "The pause's time in milliseconds before the speech."};
+    const std::vector<ZUMethodParameter> callback = {
+        {"memoryKey", "The subscribed memory key which changed."},
+        {"value", "The new value of the memory key."},
+        {"message", "The message that comes with the callback."}};
+    const std::string say =
+        "Say the annotated text given in parameter and animate it with animations inserted in the "
+        "text.";
+    const std::string modeFromStr =
+        "Set the current body language mode.\n3 modes exist: \"disabled\", \"random\" and "
+        "\"contextual\"\n(see BodyLanguageMode enum for more details)";
+    const std::string mode =
+        "Set the current body language mode.\n3 modes exist: BODY_LANGUAGE_MODE_DISABLED,"
+        "BODY_LANGUAGE_MODE_RANDOM and BODY_LANGUAGE_MODE_CONTEXTUAL\n(see BodyLanguageMode enum "
+        "for more details)";
+    const std::string chosenMode = "The choosen body language mode.";
+    const std::string currentMode = "The current body language mode.";
+    return std::vector<ZUMethodDeclaration>{
+        {"say", overload<void(const std::string&)>(&ZUMokuto::say), say, {text}},
+        {"say",
+         overload<void(const std::string&, const ZUValue&)>(&ZUMokuto::say),
+         say,
+         {text, {"configuration", "The mokuto configuration."}}},
+        {"_reset", &ZUMokuto::_reset, "Reset the Mokuto configuration."},
+        {"_stopAll",
+         &ZUMokuto::_stopAll,
+         "Stop all the speeches.",
+         {{"blocking", "If this method wait for the end of the speeches."}}},
+        {"_isRunning",
+         &ZUMokuto::_isRunning,
+         "Know if mokuto is running.",
+         {},
+         {"running", "True, if mokuto is running, False otherwise."}},
+        {"setBodyTalkEnabled",
+         &ZUMokuto::setBodyTalkEnabled,
+         "DEPRECATED since 1.18: use setBodyLanguageMode instead.Enable or disable the automatic "
+         "body talk on the speech.If it is enabled, anywhere you have not annotate your text with "
+         "animation,the robot will fill the gap with automatically calculated gestures.If it is "
+         "disabled, the robot will move only where you annotate it withanimations.",
+         {enable}},
+        {"setBodyLanguageEnabled",
+         &ZUMokuto::setBodyLanguageEnabled,
+         "DEPRECATED since 1.22: use setBodyLanguageMode instead.Enable or disable the automatic "
+         "body language on the speech.If it is enabled, anywhere you have not annotate your text "
+         "with animation,the robot will fill the gap with automatically calculated gestures.If it "
+         "is disabled, the robot will move only where you annotate it withanimations.",
+         {enable}},
+        {"setBodyLanguageModeFromStr",
+         &ZUMokuto::setBodyLanguageModeFromStr,
+         modeFromStr,
+         {{"stringBodyLanguageMode", chosenMode}}},
+        {"setBodyLanguageMode",
+         &ZUMokuto::setBodyLanguageMode,
+         mode,
+         {{"bodyLanguageMode", chosenMode}}},
+        {"getBodyLanguageModeToStr",
+         &ZUMokuto::getBodyLanguageModeToStr,
+         modeFromStr,
+         {},
+         {"stringBodyLanguageMode", currentMode}},
+        {"getBodyLanguageMode",
+         &ZUMokuto::getBodyLanguageMode,
+         mode,
+         {},
+         {"bodyLanguageMode", currentMode}},
+        {"declareAnimationsPackage",
+         &ZUMokuto::declareAnimationsPackage,
+         "Add a new package that contains animations.",
+         {{"animationsPackage", "The new package that contains animations."}}},
+        {"_setMSPauseBeforeSpeech",
+         &ZUMokuto::_setMSPauseBeforeSpeech,
+         "Change the pause's time before the speech.",
+         {pause}},
+        {"_getMSPauseBeforeSpeech",
+         &ZUMokuto::_getMSPauseBeforeSpeech,
+         "Get the pause's time before the speech.",
+         {},
+         pause},
+        {"_isCheckExecutionTimesEnabled",
+         &ZUMokuto::_isCheckExecutionTimesEnabled,
+         "If we need to check the execution times.",
+         {},
+         {"enable", "True, if we need to check the execution times, False otherwise."}},
+        {"_setCheckExecutionTimes",
+         &ZUMokuto::_setCheckExecutionTimes,
+         "Set if we need to check the execution times.",
+         {{"pause", "If we need to check the execution times."}}},
+        {"addTagsToWords",
+         &ZUMokuto::addTagsToWords,
+         "Add some new links between tags and words.",
+         {{"tagsToWords", "Map of tags to words."}}},
+        {"declareTagForAnimations",
+         &ZUMokuto::declareTagForAnimations,
+         "Declare some tags with the associated animations.",
+         {{"tagsToAnimations", "Map of Tags to Animations."}}},
+        {"_diagnosis", &ZUMokuto::_diagnosis,
+         "Print many debug informations about the current state of mokuto."},
+        {"isBodyTalkEnabled",
+         &ZUMokuto::isBodyTalkEnabled,
+         "DEPRECATED since 1.18: use getBodyLanguageMode instead.Indicate if the body talk is "
+         "enabled or not.",
+         {},
+         enabled},
+        {"isBodyLanguageEnabled",
+         &ZUMokuto::isBodyLanguageEnabled,
+         "DEPRECATED since 1.22: use getBodyLanguageMode instead.Indicate if the body language is "
+         "enabled or not.",
+         {},
+         enabled},
+        {"_getTagList",
+         &ZUMokuto::_getTagList,
+         "Get tags found on installed animations which are in \"animation library\".",
+         {},
+         {"tags", "The list of tags found."}},
+        {"_getAnimationsByTag",
+         &ZUMokuto::_getAnimationsByTag,
+         "Get all installed animations for a tag. Currently: animations = \"behaviors of the "
+         "animation library.\"",
+         {{"tag", "A tag to filter the list of animations with."}},
+         {"animations", "The animation list."}},
+        {"_speechBookMarkCallback", &ZUMokuto::_speechBookMarkCallback,
+         "Callback for ZUMemory subscription for speech bookmark tracking.", callback},
+        {"_mrkpauseCallback",
+         &ZUMokuto::_mrkpauseCallback,
+         "Method called by the tts when \"mrkpause\" bookmark is reached.This method is blocking "
+         "until the action is finish.",
+         {{"pBookmark", "Id of the bookmark."}}},
+        {"_speechStatusCallback", &ZUMokuto::_speechStatusCallback,
+         "Callback for ZUMemory subscription for speech status tracking.", callback},
+        {"_postureFamilyChangedCallback", &ZUMokuto::_postureFamilyChangedCallback,
+         "Callback for ZUMemory subscription to postureFamilyChanged.", callback},
+        {"_updateRepresentations", &ZUMokuto::_updateRepresentations,
+         "Callback for ZUMemory subscription when the behavior list of the Behavior Manager is "
+         "updated.",
+         callback},
+        {kMicroEventCallback, &ZUMokuto::_dialogMatchedInputCallback,
+         "Get the emotions from a text.", callback},
+    };
+  }();
+  return methods;
+}
+
 }  // namespace
 
 ZUMokuto::ZUMokuto(const std::shared_ptr<ZUBroker>& broker, const std::string& name,
@@ -58,183 +211,16 @@ ZUMokuto::ZUMokuto(const std::shared_ptr<ZUBroker>& broker, const std::string& n
         return std::make_shared<DirectorTask>(broker, bodyTalk->bodyTalk, textRegister);
       })) {
   setModuleDescription("The Mokuto module makes ZEFO interpret a text annotated with behaviors.");
-  xBindMethods();
+  const auto& methods = publishedMethods();
+  bindMethods(kModuleName, std::span(methods).first(methods.size() - 1));
 }
 
 ZUMokuto::~ZUMokuto() = default;
 
-void ZUMokuto::xBindMethods() {
-  const std::string memoryKey = "The subscribed memory key which changed.";
-  const std::string value = "The new value of the memory key.";
-  const std::string message = "The message that comes with the callback.";
-  const auto callback = [&](const char* method, const char* description) {
-    beginMethod(method, kModuleName, description);
-    describeParameter("memoryKey", memoryKey);
-    describeParameter("value", value);
-    describeParameter("message", message);
-  };
-  const std::string sayDescription =
-      "Say the annotated text given in parameter and animate it with animations inserted in "
-      "the text.";
-  const std::string textDescription =
-      "An annotated text (for example: \"Hello. ^start(Hey_1) My name is ZEFO\").";
-  const std::string enableDescription = "The boolean value: true to enable, false to disable.";
-  const std::string modeFromStrDescription =
-      "Set the current body language mode.\n3 modes exist: \"disabled\", \"random\" and "
-      "\"contextual\"\n(see BodyLanguageMode enum for more details)";
-  const std::string modeDescription =
-      "Set the current body language mode.\n3 modes exist: BODY_LANGUAGE_MODE_DISABLED,"
-      "BODY_LANGUAGE_MODE_RANDOM and BODY_LANGUAGE_MODE_CONTEXTUAL\n(see BodyLanguageMode enum "
-      "for more details)";
-  const std::string enabledResult =
-      "The boolean value: true means it is enabled, false means it is disabled.";
-
-  beginMethod("say", kModuleName, sayDescription);
-  describeParameter("text", textDescription);
-  bindMethod<void(const std::string&)>(&ZUMokuto::say);
-
-  beginMethod("say", kModuleName, sayDescription);
-  describeParameter("text", textDescription);
-  describeParameter("configuration", "The mokuto configuration.");
-  bindMethod<void(const std::string&, const ZUValue&)>(&ZUMokuto::say);
-
-  beginMethod("_reset", kModuleName, "Reset the Mokuto configuration.");
-  bindMethod(&ZUMokuto::_reset);
-
-  beginMethod("_stopAll", kModuleName, "Stop all the speeches.");
-  describeParameter("blocking", "If this method wait for the end of the speeches.");
-  bindMethod(&ZUMokuto::_stopAll);
-
-  beginMethod("_isRunning", kModuleName, "Know if mokuto is running.");
-  describeReturn("running", "True, if mokuto is running, False otherwise.");
-  bindMethod(&ZUMokuto::_isRunning);
-
-  beginMethod("setBodyTalkEnabled", kModuleName,
-              "DEPRECATED since 1.18: use setBodyLanguageMode instead.Enable or disable the "
-              "automatic body talk on the speech.If it is enabled, anywhere you have not "
-              "annotate your text with animation,the robot will fill the gap with automatically "
-              "calculated gestures.If it is disabled, the robot will move only where you "
-              "annotate it withanimations.");
-  describeParameter("enable", enableDescription);
-  bindMethod(&ZUMokuto::setBodyTalkEnabled);
-
-  beginMethod("setBodyLanguageEnabled", kModuleName,
-              "DEPRECATED since 1.22: use setBodyLanguageMode instead.Enable or disable the "
-              "automatic body language on the speech.If it is enabled, anywhere you have not "
-              "annotate your text with animation,the robot will fill the gap with automatically "
-              "calculated gestures.If it is disabled, the robot will move only where you "
-              "annotate it withanimations.");
-  describeParameter("enable", enableDescription);
-  bindMethod(&ZUMokuto::setBodyLanguageEnabled);
-
-  beginMethod("setBodyLanguageModeFromStr", kModuleName, modeFromStrDescription);
-  describeParameter("stringBodyLanguageMode", "The choosen body language mode.");
-  bindMethod(&ZUMokuto::setBodyLanguageModeFromStr);
-
-  beginMethod("setBodyLanguageMode", kModuleName, modeDescription);
-  describeParameter("bodyLanguageMode", "The choosen body language mode.");
-  bindMethod(&ZUMokuto::setBodyLanguageMode);
-
-  beginMethod("getBodyLanguageModeToStr", kModuleName, modeFromStrDescription);
-  describeReturn("stringBodyLanguageMode", "The current body language mode.");
-  bindMethod(&ZUMokuto::getBodyLanguageModeToStr);
-
-  beginMethod("getBodyLanguageMode", kModuleName, modeDescription);
-  describeReturn("bodyLanguageMode", "The current body language mode.");
-  bindMethod(&ZUMokuto::getBodyLanguageMode);
-
-  beginMethod("declareAnimationsPackage", kModuleName,
-              "Add a new package that contains animations.");
-  describeParameter("animationsPackage", "The new package that contains animations.");
-  bindMethod(&ZUMokuto::declareAnimationsPackage);
-
-  beginMethod("_setMSPauseBeforeSpeech", kModuleName, "Change the pause's time before the speech.");
-  describeParameter("pause", "The pause's time in milliseconds before the speech.");
-  bindMethod(&ZUMokuto::_setMSPauseBeforeSpeech);
-
-  beginMethod("_getMSPauseBeforeSpeech", kModuleName, "Get the pause's time before the speech.");
-  describeReturn("pause", "The pause's time in milliseconds before the speech.");
-  bindMethod(&ZUMokuto::_getMSPauseBeforeSpeech);
-
-  beginMethod("_isCheckExecutionTimesEnabled", kModuleName,
-              "If we need to check the execution times.");
-  describeReturn("enable", "True, if we need to check the execution times, False otherwise.");
-  bindMethod(&ZUMokuto::_isCheckExecutionTimesEnabled);
-
-  beginMethod("_setCheckExecutionTimes", kModuleName,
-              "Set if we need to check the execution times.");
-  describeParameter("pause", "If we need to check the execution times.");
-  bindMethod(&ZUMokuto::_setCheckExecutionTimes);
-
-  beginMethod("addTagsToWords", kModuleName, "Add some new links between tags and words.");
-  describeParameter("tagsToWords", "Map of tags to words.");
-  bindMethod(&ZUMokuto::addTagsToWords);
-
-  beginMethod("declareTagForAnimations", kModuleName,
-              "Declare some tags with the associated animations.");
-  describeParameter("tagsToAnimations", "Map of Tags to Animations.");
-  bindMethod(&ZUMokuto::declareTagForAnimations);
-
-  beginMethod("_diagnosis", kModuleName,
-              "Print many debug informations about the current state of mokuto.");
-  bindMethod(&ZUMokuto::_diagnosis);
-
-  beginMethod("isBodyTalkEnabled", kModuleName,
-              "DEPRECATED since 1.18: use getBodyLanguageMode instead.Indicate if the body talk "
-              "is enabled or not.");
-  describeReturn("enable", enabledResult);
-  bindMethod(&ZUMokuto::isBodyTalkEnabled);
-
-  beginMethod("isBodyLanguageEnabled", kModuleName,
-              "DEPRECATED since 1.22: use getBodyLanguageMode instead.Indicate if the body "
-              "language is enabled or not.");
-  describeReturn("enable", enabledResult);
-  bindMethod(&ZUMokuto::isBodyLanguageEnabled);
-
-  beginMethod("_getTagList", kModuleName,
-              "Get tags found on installed animations which are in \"animation library\".");
-  describeReturn("tags", "The list of tags found.");
-  bindMethod(&ZUMokuto::_getTagList);
-
-  beginMethod("_getAnimationsByTag", kModuleName,
-              "Get all installed animations for a tag. Currently: animations = \"behaviors of "
-              "the animation library.\"");
-  describeParameter("tag", "A tag to filter the list of animations with.");
-  describeReturn("animations", "The animation list.");
-  bindMethod(&ZUMokuto::_getAnimationsByTag);
-
-  callback("_speechBookMarkCallback",
-           "Callback for ZUMemory subscription for speech bookmark tracking.");
-  bindMethod(&ZUMokuto::_speechBookMarkCallback);
-
-  beginMethod("_mrkpauseCallback", kModuleName,
-              "Method called by the tts when \"mrkpause\" bookmark is reached.This method is "
-              "blocking until the action is finish.");
-  describeParameter("pBookmark", "Id of the bookmark.");
-  bindMethod(&ZUMokuto::_mrkpauseCallback);
-
-  callback("_speechStatusCallback",
-           "Callback for ZUMemory subscription for speech status tracking.");
-  bindMethod(&ZUMokuto::_speechStatusCallback);
-
-  callback("_postureFamilyChangedCallback",
-           "Callback for ZUMemory subscription to postureFamilyChanged.");
-  bindMethod(&ZUMokuto::_postureFamilyChangedCallback);
-
-  callback("_updateRepresentations",
-           "Callback for ZUMemory subscription when the behavior list of the Behavior Manager "
-           "is updated.");
-  bindMethod(&ZUMokuto::_updateRepresentations);
-}
-
 // ---- start and exit ----
 
 void ZUMokuto::init() {
-  beginMethod(kMicroEventCallback, kModuleName, "Get the emotions from a text.");
-  describeParameter("memoryKey", "The subscribed memory key which changed.");
-  describeParameter("value", "The new value of the memory key.");
-  describeParameter("message", "The message that comes with the callback.");
-  bindMethod(&ZUMokuto::_dialogMatchedInputCallback);
+  bindMethods(kModuleName, std::span(publishedMethods()).last(1));
 
   if (director && loader) {
     director->behaviorStoppedSignal.connect(

@@ -127,8 +127,8 @@ class ModuleStandIn : public ZU::ZUModule {
   ModuleStandIn(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name,
                 std::weak_ptr<LoaderTask> loader)
       : ZU::ZUModule(broker, name), fLoader(std::move(loader)) {
-    beginMethod("_updateRepresentations", "ModuleStandIn", "Refreshes the animations.");
-    bindMethod(&ModuleStandIn::_updateRepresentations);
+    bindMethods("ModuleStandIn", {{"_updateRepresentations", &ModuleStandIn::_updateRepresentations,
+                                   "Refreshes the animations."}});
   }
   void _updateRepresentations(const std::string&, const ZU::ZUValue&, const std::string&) {
     if (const auto loader = fLoader.lock())
@@ -421,14 +421,14 @@ class FakeBehaviorManager : public ZU::ZUModule {
 
   FakeBehaviorManager(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
       : ZU::ZUModule(broker, name) {
-    beginMethod("getInstalledBehaviors", "FakeBehaviorManager", "The library.");
-    bindMethod(&FakeBehaviorManager::getInstalledBehaviors);
-    beginMethod("getBehaviorTags", "FakeBehaviorManager", "The tags of a behaviour.");
-    bindMethod(&FakeBehaviorManager::getBehaviorTags);
-    beginMethod("resolveBehaviorName", "FakeBehaviorManager", "The path itself when installed.");
-    bindMethod(&FakeBehaviorManager::resolveBehaviorName);
-    beginMethod("preloadBehavior", "FakeBehaviorManager", "Fails for the paths in `failing`.");
-    bindMethod(&FakeBehaviorManager::preloadBehavior);
+    bindMethods(
+        "FakeBehaviorManager",
+        {{"getInstalledBehaviors", &FakeBehaviorManager::getInstalledBehaviors, "The library."},
+         {"getBehaviorTags", &FakeBehaviorManager::getBehaviorTags, "The tags of a behaviour."},
+         {"resolveBehaviorName", &FakeBehaviorManager::resolveBehaviorName,
+          "The path itself when installed."},
+         {"preloadBehavior", &FakeBehaviorManager::preloadBehavior,
+          "Fails for the paths in `failing`."}});
   }
 
   std::vector<std::string> getInstalledBehaviors() {

@@ -24,8 +24,7 @@ class Registrar : public ZU::ZUModule {
  public:
   Registrar(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
       : ZU::ZUModule(broker, name) {
-    beginMethod("registerText", "Registrar", "Registers a text.");
-    bindMethod(&Registrar::registerText);
+    bindMethods("Registrar", {{"registerText", &Registrar::registerText, "Registers a text."}});
   }
   void registerText() {
     registered = texts.newMKID(std::make_shared<ZU::MKTaskInstruction>(), *this);

@@ -55,8 +55,7 @@ class ZUSlow : public ZU::ZUModule {
  public:
   ZUSlow(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
       : ZU::ZUModule(broker, name) {
-    beginMethod("block", "ZUSlow", "");
-    bindMethod(&ZUSlow::block);
+    bindMethods("ZUSlow", {{"block", &ZUSlow::block}});
   }
   void block(int /*n*/) {
     entered->increment();
@@ -71,15 +70,12 @@ class RefusingMemory : public ZU::ZUModule {
  public:
   RefusingMemory(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
       : ZU::ZUModule(broker, name) {
-    const auto bind = [this](const char* method, auto function) {
-      beginMethod(method, "RefusingMemory", "");
-      bindMethod(function);
-    };
-    bind("declareEvent", &RefusingMemory::declareEvent);
-    bind("raiseEvent", &RefusingMemory::raiseEvent);
-    bind("subscribeToEvent", &RefusingMemory::subscribeToEvent);
-    bind("subscribeToMicroEvent", &RefusingMemory::subscribeToMicroEvent);
-    bind("unsubscribeToEvent", &RefusingMemory::unsubscribeToEvent);
+    bindMethods("RefusingMemory",
+                {{"declareEvent", &RefusingMemory::declareEvent},
+                 {"raiseEvent", &RefusingMemory::raiseEvent},
+                 {"subscribeToEvent", &RefusingMemory::subscribeToEvent},
+                 {"subscribeToMicroEvent", &RefusingMemory::subscribeToMicroEvent},
+                 {"unsubscribeToEvent", &RefusingMemory::unsubscribeToEvent}});
   }
   void declareEvent(const std::string&, const std::string&) {}
   void raiseEvent(const std::string&, const ZU::ZUValue&) {}
@@ -97,10 +93,9 @@ class StubBehaviorManager : public ZU::ZUModule {
  public:
   StubBehaviorManager(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
       : ZU::ZUModule(broker, name) {
-    beginMethod("getInstalledBehaviors", "StubBehaviorManager", "");
-    bindMethod(&StubBehaviorManager::getInstalledBehaviors);
-    beginMethod("getBehaviorTags", "StubBehaviorManager", "");
-    bindMethod(&StubBehaviorManager::getBehaviorTags);
+    bindMethods("StubBehaviorManager",
+                {{"getInstalledBehaviors", &StubBehaviorManager::getInstalledBehaviors},
+                 {"getBehaviorTags", &StubBehaviorManager::getBehaviorTags}});
   }
   std::vector<std::string> getInstalledBehaviors() {
     lists.fetch_add(1);

@@ -63,35 +63,36 @@ ZUAudioPlayer::ZUAudioPlayer(const std::shared_ptr<ZU::ZUBroker>& broker, const 
 ZUAudioPlayer::~ZUAudioPlayer() = default;
 
 void ZUAudioPlayer::xBindMethods() {
-  beginMethod("loadSoundSet", kClass, "Loads a sound set.");
-  describeParameter("soundSet", "The name of the sound set (its folder).");
-  bindMethod(&ZUAudioPlayer::loadSoundSet);
-
-  beginMethod("unloadSoundSet", kClass, "Unloads a sound set.");
-  describeParameter("soundSet", "The name of a loaded sound set.");
-  bindMethod(&ZUAudioPlayer::unloadSoundSet);
-
-  beginMethod("getLoadedSoundSetsList", kClass, "Lists the loaded sound sets.");
-  describeReturn("soundSets", "Their names, in ascending order.");
-  bindMethod(&ZUAudioPlayer::getLoadedSoundSetsList);
-
-  beginMethod("playSoundSetFile", kClass, "Plays a file of a loaded sound set to its end.");
-  describeParameter("soundSet", "The name of a loaded sound set.");
-  describeParameter("soundFile", "The file's name, with or without \".wav\".");
-  bindMethod<void(const std::string&, const std::string&)>(&ZUAudioPlayer::playSoundSetFile);
-
-  beginMethod("playSoundSetFile", kClass, "Plays a file of a loaded sound set.");
-  describeParameter("soundSet", "The name of a loaded sound set.");
-  describeParameter("soundFile", "The file's name, with or without \".wav\".");
-  describeParameter("position", "Where to begin in the file, in seconds.");
-  describeParameter("volume", "The volume, from 0 to 1.");
-  describeParameter("balance", "The balance, from -1 (left) to 1 (right).");
-  describeParameter("loop", "True to play the file again and again until stopped.");
-  bindMethod<void(const std::string&, const std::string&, double, double, double, bool)>(
-      &ZUAudioPlayer::playSoundSetFile);
-
-  beginMethod("stopAll", kClass, "Stops every play.");
-  bindMethod(&ZUAudioPlayer::stopAll);
+  const ZU::ZUMethodParameter soundSet{"soundSet", "The name of a loaded sound set."};
+  const ZU::ZUMethodParameter soundFile{"soundFile", "The file's name, with or without \".wav\"."};
+  const std::vector<ZU::ZUMethodDeclaration> methods = {
+      {"loadSoundSet",
+       &ZUAudioPlayer::loadSoundSet,
+       "Loads a sound set.",
+       {{"soundSet", "The name of the sound set (its folder)."}}},
+      {"unloadSoundSet", &ZUAudioPlayer::unloadSoundSet, "Unloads a sound set.", {soundSet}},
+      {"getLoadedSoundSetsList",
+       &ZUAudioPlayer::getLoadedSoundSetsList,
+       "Lists the loaded sound sets.",
+       {},
+       {"soundSets", "Their names, in ascending order."}},
+      {"playSoundSetFile",
+       ZU::overload<void(const std::string&, const std::string&)>(&ZUAudioPlayer::playSoundSetFile),
+       "Plays a file of a loaded sound set to its end.",
+       {soundSet, soundFile}},
+      {"playSoundSetFile",
+       ZU::overload<void(const std::string&, const std::string&, double, double, double, bool)>(
+           &ZUAudioPlayer::playSoundSetFile),
+       "Plays a file of a loaded sound set.",
+       {soundSet,
+        soundFile,
+        {"position", "Where to begin in the file, in seconds."},
+        {"volume", "The volume, from 0 to 1."},
+        {"balance", "The balance, from -1 (left) to 1 (right)."},
+        {"loop", "True to play the file again and again until stopped."}}},
+      {"stopAll", &ZUAudioPlayer::stopAll, "Stops every play."},
+  };
+  bindMethods(kClass, methods);
 }
 
 void ZUAudioPlayer::xRecord(const std::string& operation, ko::AnyValue arguments,
@@ -148,39 +149,40 @@ void ZUAudioPlayer::playSoundSetFile(const std::string& soundSet, const std::str
 
 void ZUAudioPlayer::playSoundSetFile(const std::string& soundSet, const std::string& soundFile,
                                      double position, double volume, double balance, bool loop) {
-  if (!std::isfinite(position) || position < 0) {
-    ZU_THROW_ERROR(
-        getName(), "playSoundSetFile",
-        "The position must be a number of seconds from 0, not " + std::to_string(position));
-  }
-  if (!std::isfinite(volume) || !std::isfinite(balance)) {
-    ZU_THROW_ERROR(getName(), "playSoundSetFile", "The volume and balance must be numbers");
-  }
+  const std::string name = soundName(soundFile);
+  // A refused play is on the timeline too, with the reason, before the caller hears of it.
+  const auto refuse = [&](const std::string& reason) {
+    xRecord("playFailed", ko::AnyValue::list({soundSet, name}), reason);
+    ZU_THROW_ERROR(getName(), "playSoundSetFile", reason);
+  };
+  if (!std::isfinite(position) || position < 0)
+    refuse("The position must be a number of seconds from 0, not " + std::to_string(position));
+  if (!std::isfinite(volume) || !std::isfinite(balance))
+    refuse("The volume and balance must be numbers");
   volume = std::clamp(volume, 0.0, 1.0);
   balance = std::clamp(balance, -1.0, 1.0);
 
-  const std::string name = soundName(soundFile);
   const auto task = currentTask();
   double duration = 0;
   std::uint64_t play = 0;
+  std::string refusal;
   {
     std::lock_guard lock(fMutex);
     const auto set = fLoaded.find(soundSet);
     if (set == fLoaded.end()) {
-      ZU_THROW_ERROR(getName(), "playSoundSetFile",
-                     "Sound set " + quoted(soundSet) + " is not loaded");
+      refusal = "Sound set " + quoted(soundSet) + " is not loaded";
+    } else if (const auto file = set->second.files.find(name); file == set->second.files.end()) {
+      refusal = "No sound " + quoted(name) + " in the sound set " + quoted(soundSet);
+    } else {
+      duration = std::max(0.0, file->second.duration - position);
+      // stop(id) sets the task's flag before it looks the play up, so a stop that finds no
+      // play yet is seen here.
+      play = fNextPlay++;
+      fPlays[play] = Play{task ? task->id() : -1, task && task->isStopRequested()};
     }
-    const auto file = set->second.files.find(name);
-    if (file == set->second.files.end()) {
-      ZU_THROW_ERROR(getName(), "playSoundSetFile",
-                     "No sound " + quoted(name) + " in the sound set " + quoted(soundSet));
-    }
-    duration = std::max(0.0, file->second.duration - position);
-    // stop(id) sets the task's flag before it looks the play up, so a stop that finds no
-    // play yet is seen here.
-    play = fNextPlay++;
-    fPlays[play] = Play{task ? task->id() : -1, task && task->isStopRequested()};
   }
+  if (!refusal.empty())
+    refuse(refusal);
   xRecord("playSoundSetFile", ko::AnyValue::list({soundSet, name, volume, balance, loop}),
           duration);
 

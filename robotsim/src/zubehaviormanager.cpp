@@ -96,61 +96,58 @@ void ZUBehaviorManager::xShutdown() {
 }
 
 void ZUBehaviorManager::xBindMethods() {
-  beginMethod("getInstalledBehaviors", kClass, "Lists the installed behaviours.");
-  describeReturn("behaviors", "Their paths, in ascending order.");
-  bindMethod(&ZUBehaviorManager::getInstalledBehaviors);
-
-  beginMethod("getBehaviorTags", kClass, "Gets the tags of a behaviour.");
-  describeParameter("behavior", "The installed path of the behaviour.");
-  describeReturn("tags", "Its tags.");
-  bindMethod(&ZUBehaviorManager::getBehaviorTags);
-
-  beginMethod("resolveBehaviorName", kClass, "Finds the installed path of a behaviour.");
-  describeParameter("name", "An installed path, or its end after a '/'.");
-  describeReturn("behavior", "The installed path, or an empty string when none or several fit.");
-  bindMethod(&ZUBehaviorManager::resolveBehaviorName);
-
-  beginMethod("preloadBehavior", kClass, "Loads a behaviour so that it starts at once.");
-  describeParameter("behavior", "The installed path of the behaviour.");
-  describeReturn("loaded", "True when the behaviour is ready.");
-  bindMethod(&ZUBehaviorManager::preloadBehavior);
-
-  beginMethod("startBehavior", kClass, "Starts a behaviour and returns at once.");
-  describeParameter("behavior", "The installed path of the behaviour.");
-  bindMethod(&ZUBehaviorManager::startBehavior);
-
-  beginMethod("runBehavior", kClass, "Runs a behaviour and returns at its end.");
-  describeParameter("behavior", "The installed path of the behaviour.");
-  bindMethod(&ZUBehaviorManager::runBehavior);
-
-  beginMethod("stopBehavior", kClass, "Stops a behaviour if it runs.");
-  describeParameter("behavior", "The installed path of the behaviour.");
-  bindMethod(&ZUBehaviorManager::stopBehavior);
-
-  beginMethod("stopAllBehaviors", kClass, "Stops every running behaviour.");
-  bindMethod(&ZUBehaviorManager::stopAllBehaviors);
-
-  beginMethod("isBehaviorRunning", kClass, "Whether a behaviour runs.");
-  describeParameter("behavior", "The installed path of the behaviour.");
-  describeReturn("running", "True while it runs.");
-  bindMethod(&ZUBehaviorManager::isBehaviorRunning);
-
-  beginMethod("getRunningBehaviors", kClass, "Lists the running behaviours.");
-  describeReturn("behaviors", "Their paths, in ascending order.");
-  bindMethod(&ZUBehaviorManager::getRunningBehaviors);
-
-  beginMethod("installBehavior", kClass, "Installs a behaviour in the library.");
-  describeParameter("behavior", "The path to install it under.");
-  describeParameter("descriptor", "The JSON text of its behavior.json.");
-  bindMethod(&ZUBehaviorManager::installBehavior);
-
-  beginMethod("removeBehavior", kClass, "Removes a behaviour from the library.");
-  describeParameter("behavior", "The installed path of the behaviour.");
-  describeReturn("removed", "False when it was not installed.");
-  bindMethod(&ZUBehaviorManager::removeBehavior);
-
-  beginMethod("rescan", kClass, "Reads the library folder again.");
-  bindMethod(&ZUBehaviorManager::rescan);
+  const std::vector<ZU::ZUMethodParameter> behavior = {
+      {"behavior", "The installed path of the behaviour."}};
+  const std::vector<ZU::ZUMethodDeclaration> methods = {
+      {"getInstalledBehaviors",
+       &ZUBehaviorManager::getInstalledBehaviors,
+       "Lists the installed behaviours.",
+       {},
+       {"behaviors", "Their paths, in ascending order."}},
+      {"getBehaviorTags",
+       &ZUBehaviorManager::getBehaviorTags,
+       "Gets the tags of a behaviour.",
+       behavior,
+       {"tags", "Its tags."}},
+      {"resolveBehaviorName",
+       &ZUBehaviorManager::resolveBehaviorName,
+       "Finds the installed path of a behaviour.",
+       {{"name", "An installed path, or its end after a '/'."}},
+       {"behavior", "The installed path, or an empty string when none or several fit."}},
+      {"preloadBehavior",
+       &ZUBehaviorManager::preloadBehavior,
+       "Loads a behaviour so that it starts at once.",
+       behavior,
+       {"loaded", "True when the behaviour is ready."}},
+      {"startBehavior", &ZUBehaviorManager::startBehavior,
+       "Starts a behaviour and returns at once.", behavior},
+      {"runBehavior", &ZUBehaviorManager::runBehavior, "Runs a behaviour and returns at its end.",
+       behavior},
+      {"stopBehavior", &ZUBehaviorManager::stopBehavior, "Stops a behaviour if it runs.", behavior},
+      {"stopAllBehaviors", &ZUBehaviorManager::stopAllBehaviors, "Stops every running behaviour."},
+      {"isBehaviorRunning",
+       &ZUBehaviorManager::isBehaviorRunning,
+       "Whether a behaviour runs.",
+       behavior,
+       {"running", "True while it runs."}},
+      {"getRunningBehaviors",
+       &ZUBehaviorManager::getRunningBehaviors,
+       "Lists the running behaviours.",
+       {},
+       {"behaviors", "Their paths, in ascending order."}},
+      {"installBehavior",
+       &ZUBehaviorManager::installBehavior,
+       "Installs a behaviour in the library.",
+       {{"behavior", "The path to install it under."},
+        {"descriptor", "The JSON text of its behavior.json."}}},
+      {"removeBehavior",
+       &ZUBehaviorManager::removeBehavior,
+       "Removes a behaviour from the library.",
+       behavior,
+       {"removed", "False when it was not installed."}},
+      {"rescan", &ZUBehaviorManager::rescan, "Reads the library folder again."},
+  };
+  bindMethods(kClass, methods);
 }
 
 void ZUBehaviorManager::xLogRejected(const std::map<std::string, std::string>& rejected) {

@@ -37,56 +37,58 @@ void ZUMemory::exit() {
 
 void ZUMemory::xBindMethods() {
   setModuleDescription("The memory and event service of the simulated robot.");
-  beginMethod("declareEvent", kModuleClass, "Declares an event.");
-  describeParameter("eventName", "The event's name.");
-  bindMethod<void(const std::string&)>(&ZUMemory::declareEvent);
-  beginMethod("declareEvent", kModuleClass, "Declares an event raised by a module.");
-  describeParameter("eventName", "The event's name.");
-  describeParameter("extractorName", "The module that raises it.");
-  bindMethod<void(const std::string&, const std::string&)>(&ZUMemory::declareEvent);
-  beginMethod("raiseEvent", kModuleClass,
-              "Stores the value of a key and delivers it to the key's subscribers.");
-  describeParameter("name", "The key.");
-  describeParameter("value", "The value.");
-  bindMethod(&ZUMemory::raiseEvent);
-  beginMethod("insertData", kModuleClass, "Stores the value of a key without delivering it.");
-  describeParameter("name", "The key.");
-  describeParameter("value", "The value.");
-  bindMethod(&ZUMemory::insertData);
-  beginMethod("getData", kModuleClass, "Returns the last value of a key.");
-  describeParameter("name", "The key.");
-  describeReturn("value", "Its last value.");
-  bindMethod(&ZUMemory::getData);
-  beginMethod("subscribeToEvent", kModuleClass,
-              "Calls a module's method with (memoryKey, value, message) when the event is raised.");
-  describeParameter("name", "The event.");
-  describeParameter("callbackModule", "The module to call.");
-  describeParameter("callbackMethod", "Its method.");
-  bindMethod(&ZUMemory::subscribeToEvent);
-  beginMethod("subscribeToMicroEvent", kModuleClass,
-              "Calls a module's method with (memoryKey, value, message) when the event is "
-              "raised, the message given here.");
-  describeParameter("name", "The event.");
-  describeParameter("callbackModule", "The module to call.");
-  describeParameter("callbackMessage", "The message passed to the method.");
-  describeParameter("callbackMethod", "Its method.");
-  bindMethod(&ZUMemory::subscribeToMicroEvent);
-  beginMethod("unsubscribeToEvent", kModuleClass, "Ends a module's subscription to an event.");
-  describeParameter("name", "The event.");
-  describeParameter("callbackModule", "The module.");
-  bindMethod(&ZUMemory::unsubscribeToEvent);
-  beginMethod("unsubscribeToMicroEvent", kModuleClass,
-              "Ends a module's subscription to a micro event.");
-  describeParameter("name", "The event.");
-  describeParameter("callbackModule", "The module.");
-  bindMethod(&ZUMemory::unsubscribeToMicroEvent);
-  beginMethod("getEventList", kModuleClass, "Returns the declared events and the raised keys.");
-  describeReturn("events", "Their names, sorted.");
-  bindMethod(&ZUMemory::getEventList);
-  beginMethod("getSubscribers", kModuleClass, "Returns the modules subscribed to an event.");
-  describeParameter("name", "The event.");
-  describeReturn("modules", "Their names, sorted.");
-  bindMethod(&ZUMemory::getSubscribers);
+  const std::vector<ZU::ZUMethodParameter> keyAndValue = {{"name", "The key."},
+                                                          {"value", "The value."}};
+  const std::vector<ZU::ZUMethodParameter> subscription = {{"name", "The event."},
+                                                           {"callbackModule", "The module."}};
+  const std::vector<ZU::ZUMethodDeclaration> methods = {
+      {"declareEvent",
+       ZU::overload<void(const std::string&)>(&ZUMemory::declareEvent),
+       "Declares an event.",
+       {{"eventName", "The event's name."}}},
+      {"declareEvent",
+       ZU::overload<void(const std::string&, const std::string&)>(&ZUMemory::declareEvent),
+       "Declares an event raised by a module.",
+       {{"eventName", "The event's name."}, {"extractorName", "The module that raises it."}}},
+      {"raiseEvent", &ZUMemory::raiseEvent,
+       "Stores the value of a key and delivers it to the key's subscribers.", keyAndValue},
+      {"insertData", &ZUMemory::insertData, "Stores the value of a key without delivering it.",
+       keyAndValue},
+      {"getData",
+       &ZUMemory::getData,
+       "Returns the last value of a key.",
+       {{"name", "The key."}},
+       {"value", "Its last value."}},
+      {"subscribeToEvent",
+       &ZUMemory::subscribeToEvent,
+       "Calls a module's method with (memoryKey, value, message) when the event is raised.",
+       {{"name", "The event."},
+        {"callbackModule", "The module to call."},
+        {"callbackMethod", "Its method."}}},
+      {"subscribeToMicroEvent",
+       &ZUMemory::subscribeToMicroEvent,
+       "Calls a module's method with (memoryKey, value, message) when the event is "
+       "raised, the message given here.",
+       {{"name", "The event."},
+        {"callbackModule", "The module to call."},
+        {"callbackMessage", "The message passed to the method."},
+        {"callbackMethod", "Its method."}}},
+      {"unsubscribeToEvent", &ZUMemory::unsubscribeToEvent,
+       "Ends a module's subscription to an event.", subscription},
+      {"unsubscribeToMicroEvent", &ZUMemory::unsubscribeToMicroEvent,
+       "Ends a module's subscription to a micro event.", subscription},
+      {"getEventList",
+       &ZUMemory::getEventList,
+       "Returns the declared events and the raised keys.",
+       {},
+       {"events", "Their names, sorted."}},
+      {"getSubscribers",
+       &ZUMemory::getSubscribers,
+       "Returns the modules subscribed to an event.",
+       {{"name", "The event."}},
+       {"modules", "Their names, sorted."}},
+  };
+  bindMethods(kModuleClass, methods);
 }
 
 void ZUMemory::declareEvent(const std::string& name) {

@@ -90,61 +90,63 @@ ZUMotion::~ZUMotion() {
 }
 
 void ZUMotion::xBindMethods() {
-  beginMethod("getAngles", kClass, "Gets the angles of the joints.");
-  describeParameter("names", "A joint or chain name, or a list of them.");
-  describeParameter("useSensors", "Whether to read the sensors (the commanded angles here).");
-  describeReturn("angles", "The angles in radians, one per joint.");
-  bindMethod(&ZUMotion::getAngles);
-
-  beginMethod("setAngles", kClass, "Moves joints towards angles and returns at once.");
-  describeParameter("names", "A joint or chain name, or a list of them.");
-  describeParameter("angles", "One angle for all the joints, or one per joint, in radians.");
-  describeParameter("fractionMaxSpeed", "The fraction of the maximum speed, up to 1.");
-  bindMethod(&ZUMotion::setAngles);
-
-  beginMethod("angleInterpolationBezier", kClass,
-              "Moves joints through Bezier keys and returns when the move ends.");
-  describeParameter("jointNames", "A joint or chain name, or a list of them.");
-  describeParameter("times", "The key times in seconds, one list per joint.");
-  describeParameter("controlPoints",
-                    "The keys, one list per joint: [angle, [3, dTime, dAngle], [3, dTime, "
-                    "dAngle]].");
-  bindMethod(&ZUMotion::angleInterpolationBezier);
-
-  beginMethod("areResourcesAvailable", kClass,
-              "Whether no move holds a joint of the named joints or chains.");
-  describeParameter("resourceNames", "Joint or chain names.");
-  describeReturn("available", "True when all of them are free.");
-  bindMethod(&ZUMotion::areResourcesAvailable);
-
-  beginMethod("getBreathEnabled", kClass, "Whether a chain breathes.");
-  describeParameter("chainName", "\"Head\", \"LArm\", \"RArm\", \"Arms\" or \"Body\".");
-  describeReturn("enabled", "True when every joint chain named breathes.");
-  bindMethod(&ZUMotion::getBreathEnabled);
-
-  beginMethod("setBreathEnabled", kClass, "Starts or stops the breathing of a chain.");
-  describeParameter("chainName", "\"Head\", \"LArm\", \"RArm\", \"Arms\" or \"Body\".");
-  describeParameter("isEnabled", "True to breathe.");
-  bindMethod(&ZUMotion::setBreathEnabled);
-
-  beginMethod("_startBezierMove", kClass,
-              "Starts a Bezier move and answers its id at once (for the behaviour manager).");
-  describeParameter("jointNames", "A joint or chain name, or a list of them.");
-  describeParameter("times", "The key times in seconds, one list per joint.");
-  describeParameter("controlPoints", "The keys, one list per joint.");
-  describeParameter("minDuration", "The move holds its joints at least this long (seconds).");
-  describeReturn("moveId", "The id of the move.");
-  bindMethod(&ZUMotion::_startBezierMove);
-
-  beginMethod("_stopMove", kClass, "Ends a move at once.");
-  describeParameter("moveId", "The id answered by _startBezierMove.");
-  describeReturn("wasRunning", "False when the move had already ended.");
-  bindMethod(&ZUMotion::_stopMove);
-
-  beginMethod("_isMoveRunning", kClass, "Whether a move is running.");
-  describeParameter("moveId", "The id answered by _startBezierMove.");
-  describeReturn("running", "True while the move runs.");
-  bindMethod(&ZUMotion::_isMoveRunning);
+  const ZU::ZUMethodParameter move{"moveId", "The id answered by _startBezierMove."};
+  const std::vector<ZU::ZUMethodDeclaration> methods = {
+      {"getAngles",
+       &ZUMotion::getAngles,
+       "Gets the angles of the joints.",
+       {{"names", "A joint or chain name, or a list of them."},
+        {"useSensors", "Whether to read the sensors (the commanded angles here)."}},
+       {"angles", "The angles in radians, one per joint."}},
+      {"setAngles",
+       &ZUMotion::setAngles,
+       "Moves joints towards angles and returns at once.",
+       {{"names", "A joint or chain name, or a list of them."},
+        {"angles", "One angle for all the joints, or one per joint, in radians."},
+        {"fractionMaxSpeed", "The fraction of the maximum speed, up to 1."}}},
+      {"angleInterpolationBezier",
+       &ZUMotion::angleInterpolationBezier,
+       "Moves joints through Bezier keys and returns when the move ends.",
+       {{"jointNames", "A joint or chain name, or a list of them."},
+        {"times", "The key times in seconds, one list per joint."},
+        {"controlPoints",
+         "The keys, one list per joint: [angle, [3, dTime, dAngle], [3, dTime, "
+         "dAngle]]."}}},
+      {"areResourcesAvailable",
+       &ZUMotion::areResourcesAvailable,
+       "Whether no move holds a joint of the named joints or chains.",
+       {{"resourceNames", "Joint or chain names."}},
+       {"available", "True when all of them are free."}},
+      {"getBreathEnabled",
+       &ZUMotion::getBreathEnabled,
+       "Whether a chain breathes.",
+       {{"chainName", "\"Head\", \"LArm\", \"RArm\", \"Arms\" or \"Body\"."}},
+       {"enabled", "True when every joint chain named breathes."}},
+      {"setBreathEnabled",
+       &ZUMotion::setBreathEnabled,
+       "Starts or stops the breathing of a chain.",
+       {{"chainName", "\"Head\", \"LArm\", \"RArm\", \"Arms\" or \"Body\"."},
+        {"isEnabled", "True to breathe."}}},
+      {"_startBezierMove",
+       &ZUMotion::_startBezierMove,
+       "Starts a Bezier move and answers its id at once (for the behaviour manager).",
+       {{"jointNames", "A joint or chain name, or a list of them."},
+        {"times", "The key times in seconds, one list per joint."},
+        {"controlPoints", "The keys, one list per joint."},
+        {"minDuration", "The move holds its joints at least this long (seconds)."}},
+       {"moveId", "The id of the move."}},
+      {"_stopMove",
+       &ZUMotion::_stopMove,
+       "Ends a move at once.",
+       {move},
+       {"wasRunning", "False when the move had already ended."}},
+      {"_isMoveRunning",
+       &ZUMotion::_isMoveRunning,
+       "Whether a move is running.",
+       {move},
+       {"running", "True while the move runs."}},
+  };
+  bindMethods(kClass, methods);
 }
 
 void ZUMotion::xRecord(const std::string& operation, ko::AnyValue arguments, ko::AnyValue result) {

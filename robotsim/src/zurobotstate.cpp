@@ -11,19 +11,24 @@ ZURobotPosture::ZURobotPosture(const std::shared_ptr<ZU::ZUBroker>& broker, cons
     : ZU::ZUModule(broker, name), fTimeline(std::move(timeline)) {
   setModuleDescription("The posture family of the simulated robot.");
 
-  beginMethod("getPostureFamily", "ZURobotPosture", "Returns the robot's posture family.");
-  describeReturn("postureFamily", "\"Standing\", \"Sitting\" or \"SittingOnChair\"");
-  bindMethod(&ZURobotPosture::getPostureFamily);
-
-  beginMethod("setPostureFamily", "ZURobotPosture",
-              "Puts the simulated robot in another posture family and raises "
-              "PostureFamilyChanged.");
-  describeParameter("postureFamily", "\"Standing\", \"Sitting\" or \"SittingOnChair\"");
-  bindMethod(&ZURobotPosture::setPostureFamily);
-
-  beginMethod("getPostureFamilyList", "ZURobotPosture", "Returns the known posture families.");
-  describeReturn("families", "the names of the posture families");
-  bindMethod(&ZURobotPosture::getPostureFamilyList);
+  const std::vector<ZU::ZUMethodDeclaration> methods = {
+      {"getPostureFamily",
+       &ZURobotPosture::getPostureFamily,
+       "Returns the robot's posture family.",
+       {},
+       {"postureFamily", "\"Standing\", \"Sitting\" or \"SittingOnChair\""}},
+      {"setPostureFamily",
+       &ZURobotPosture::setPostureFamily,
+       "Puts the simulated robot in another posture family and raises "
+       "PostureFamilyChanged.",
+       {{"postureFamily", "\"Standing\", \"Sitting\" or \"SittingOnChair\""}}},
+      {"getPostureFamilyList",
+       &ZURobotPosture::getPostureFamilyList,
+       "Returns the known posture families.",
+       {},
+       {"families", "the names of the posture families"}},
+  };
+  bindMethods("ZURobotPosture", methods);
 }
 
 std::string ZURobotPosture::getPostureFamily() {
@@ -64,13 +69,18 @@ ZURobotModel::ZURobotModel(const std::shared_ptr<ZU::ZUBroker>& broker, const st
     : ZU::ZUModule(broker, name), fRobotType(robotType) {
   setModuleDescription("The model of the simulated robot.");
 
-  beginMethod("_getRobotType", "ZURobotModel", "Returns the type of the robot.");
-  describeReturn("robotType", "the robot type, never 0 on this robot by default");
-  bindMethod(&ZURobotModel::_getRobotType);
-
-  beginMethod("_setRobotType", "ZURobotModel", "Changes the type the robot reports.");
-  describeParameter("robotType", "the robot type");
-  bindMethod(&ZURobotModel::_setRobotType);
+  const std::vector<ZU::ZUMethodDeclaration> methods = {
+      {"_getRobotType",
+       &ZURobotModel::_getRobotType,
+       "Returns the type of the robot.",
+       {},
+       {"robotType", "the robot type, never 0 on this robot by default"}},
+      {"_setRobotType",
+       &ZURobotModel::_setRobotType,
+       "Changes the type the robot reports.",
+       {{"robotType", "the robot type"}}},
+  };
+  bindMethods("ZURobotModel", methods);
 }
 
 int ZURobotModel::_getRobotType() {
@@ -84,12 +94,12 @@ ZUAutonomousMoves::ZUAutonomousMoves(const std::shared_ptr<ZU::ZUBroker>& broker
                                      const std::string& name, std::shared_ptr<Timeline> timeline)
     : ZU::ZUModule(broker, name), fTimeline(std::move(timeline)) {
   setModuleDescription("The small autonomous steps of the simulated robot.");
-  beginMethod("_moveForward", "ZUAutonomousMoves", "Makes a small step forward.");
-  bindMethod(&ZUAutonomousMoves::_moveForward);
-  beginMethod("_moveBackward", "ZUAutonomousMoves", "Makes a small step backward.");
-  bindMethod(&ZUAutonomousMoves::_moveBackward);
-  beginMethod("_moveSides", "ZUAutonomousMoves", "Sways from side to side.");
-  bindMethod(&ZUAutonomousMoves::_moveSides);
+  const std::vector<ZU::ZUMethodDeclaration> methods = {
+      {"_moveForward", &ZUAutonomousMoves::_moveForward, "Makes a small step forward."},
+      {"_moveBackward", &ZUAutonomousMoves::_moveBackward, "Makes a small step backward."},
+      {"_moveSides", &ZUAutonomousMoves::_moveSides, "Sways from side to side."},
+  };
+  bindMethods("ZUAutonomousMoves", methods);
 }
 
 void ZUAutonomousMoves::_moveForward() {

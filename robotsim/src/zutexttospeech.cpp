@@ -130,44 +130,50 @@ void ZUTextToSpeech::xStopThreads() {
 
 void ZUTextToSpeech::xBindMethods() {
   setModuleDescription("The speech engine of the simulated robot.");
-  beginMethod("say", kModuleClass,
-              "Says the text, with its bookmarks and pauses; returns when it is done or stopped.");
-  describeParameter("stringToSay", "The text to say.");
-  bindMethod(&ZUTextToSpeech::say);
-  beginMethod("stopAll", kModuleClass, "Stops the text being spoken and every text waiting.");
-  bindMethod(&ZUTextToSpeech::stopAll);
-  beginMethod("setParameter", kModuleClass,
-              "Sets a parameter: speed, pitchShift, volume or inputMode.");
-  describeParameter("parameter", "The parameter's name.");
-  describeParameter("value", "Its value.");
-  bindMethod(&ZUTextToSpeech::setParameter);
-  beginMethod("getParameter", kModuleClass, "Returns a parameter's value.");
-  describeParameter("parameter", "The parameter's name.");
-  describeReturn("value", "Its value.");
-  bindMethod(&ZUTextToSpeech::getParameter);
-  beginMethod("getLanguage", kModuleClass, "Returns the language the texts are spoken in.");
-  describeReturn("language", "The language's name, for example \"English\".");
-  bindMethod(&ZUTextToSpeech::getLanguage);
-  beginMethod("setLanguage", kModuleClass, "Sets the language the texts are spoken in.");
-  describeParameter("language", "The language's name, for example \"French\".");
-  bindMethod(&ZUTextToSpeech::setLanguage);
-  beginMethod("getAvailableLanguages", kModuleClass, "Returns the languages the engine speaks.");
-  describeReturn("languages", "Their names.");
-  bindMethod(&ZUTextToSpeech::getAvailableLanguages);
-  beginMethod("enableNotifications", kModuleClass,
-              "Raises the bookmark and status events of the texts.");
-  bindMethod(&ZUTextToSpeech::enableNotifications);
-  beginMethod("disableNotifications", kModuleClass,
-              "Stops raising the bookmark and status events.");
-  bindMethod(&ZUTextToSpeech::disableNotifications);
-  beginMethod("areNotificationsEnabled", kModuleClass,
-              "Whether the bookmark and status events are raised.");
-  describeReturn("enabled", "True when they are.");
-  bindMethod(&ZUTextToSpeech::areNotificationsEnabled);
-  beginMethod("_saveRecording", kModuleClass,
-              "Writes everything spoken so far to a WAV file, silences included.");
-  describeParameter("path", "The file to write.");
-  bindMethod(&ZUTextToSpeech::saveRecording);
+  const std::vector<ZU::ZUMethodDeclaration> methods = {
+      {"say",
+       &ZUTextToSpeech::say,
+       "Says the text, with its bookmarks and pauses; returns when it is done or stopped.",
+       {{"stringToSay", "The text to say."}}},
+      {"stopAll", &ZUTextToSpeech::stopAll, "Stops the text being spoken and every text waiting."},
+      {"setParameter",
+       &ZUTextToSpeech::setParameter,
+       "Sets a parameter: speed, pitchShift, volume or inputMode.",
+       {{"parameter", "The parameter's name."}, {"value", "Its value."}}},
+      {"getParameter",
+       &ZUTextToSpeech::getParameter,
+       "Returns a parameter's value.",
+       {{"parameter", "The parameter's name."}},
+       {"value", "Its value."}},
+      {"getLanguage",
+       &ZUTextToSpeech::getLanguage,
+       "Returns the language the texts are spoken in.",
+       {},
+       {"language", "The language's name, for example \"English\"."}},
+      {"setLanguage",
+       &ZUTextToSpeech::setLanguage,
+       "Sets the language the texts are spoken in.",
+       {{"language", "The language's name, for example \"French\"."}}},
+      {"getAvailableLanguages",
+       &ZUTextToSpeech::getAvailableLanguages,
+       "Returns the languages the engine speaks.",
+       {},
+       {"languages", "Their names."}},
+      {"enableNotifications", &ZUTextToSpeech::enableNotifications,
+       "Raises the bookmark and status events of the texts."},
+      {"disableNotifications", &ZUTextToSpeech::disableNotifications,
+       "Stops raising the bookmark and status events."},
+      {"areNotificationsEnabled",
+       &ZUTextToSpeech::areNotificationsEnabled,
+       "Whether the bookmark and status events are raised.",
+       {},
+       {"enabled", "True when they are."}},
+      {"_saveRecording",
+       &ZUTextToSpeech::saveRecording,
+       "Writes everything spoken so far to a WAV file, silences included.",
+       {{"path", "The file to write."}}},
+  };
+  bindMethods(kModuleClass, methods);
 }
 
 void ZUTextToSpeech::exit() {
@@ -241,14 +247,24 @@ void ZUTextToSpeech::say(const std::string& text) {
   {
     std::lock_guard lock(fMutex);
     fTexts.erase(id);
-    fHistory[id] = utterance->marks;
+    Spoken& spoken = fHistory[id];
+    spoken.marks = utterance->marks;
+    for (const auto& word : performance->words()) {
+      spoken.words.push_back(SpeechWordRecord{
+          word.offset, word.length, text.substr(word.offset, word.length),
+          static_cast<std::int64_t>(word.sample * 1'000'000 /
+                                    static_cast<std::uint64_t>(performance->sampleRate()))});
+    }
     while (fHistory.size() > kHistorySize)
       fHistory.erase(fHistory.begin());
   }
-  for (const std::size_t index : performance->placedMarks()) {
-    KO_LOG_WARNING(kCategory) << "Text " << id << ": bookmark "
-                              << utterance->script.marks[index].number
-                              << " was not reported by the synthesis; placed by its neighbours";
+  // A stopped text's synthesis gives up before its last bookmarks: nothing to warn about.
+  if (!performance->isCancelled()) {
+    for (const std::size_t index : performance->placedMarks()) {
+      KO_LOG_WARNING(kCategory) << "Text " << id << ": bookmark "
+                                << utterance->script.marks[index].number
+                                << " was not reported by the synthesis; placed by its neighbours";
+    }
   }
   if (state != ko::FutureState::FinishedWithValue)
     ZU_THROW_ERROR(getName(), "say", ended.error());
@@ -356,7 +372,13 @@ void ZUTextToSpeech::saveRecording(const std::string& path) {
 std::vector<SpeechMarkRecord> ZUTextToSpeech::markRecords(int id) const {
   std::lock_guard lock(fMutex);
   const auto it = fHistory.find(id);
-  return it == fHistory.end() ? std::vector<SpeechMarkRecord>{} : it->second;
+  return it == fHistory.end() ? std::vector<SpeechMarkRecord>{} : it->second.marks;
+}
+
+std::vector<SpeechWordRecord> ZUTextToSpeech::wordRecords(int id) const {
+  std::lock_guard lock(fMutex);
+  const auto it = fHistory.find(id);
+  return it == fHistory.end() ? std::vector<SpeechWordRecord>{} : it->second.words;
 }
 
 int ZUTextToSpeech::sampleRate() const {

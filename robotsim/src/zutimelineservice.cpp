@@ -8,9 +8,11 @@ ZUTimelineService::ZUTimelineService(const std::shared_ptr<ZU::ZUBroker>& broker
                                      const std::string& name, std::shared_ptr<Timeline> timeline)
     : ZU::ZUModule(broker, name), fTimeline(std::move(timeline)) {
   setModuleDescription("The timeline of the simulated robot, entry by entry.");
-  beginMethod("now", "ZUTimeline", "Returns the time on the clock of the entries.");
-  describeReturn("ustime", "Microseconds of the machine's steady clock.");
-  bindMethod(&ZUTimelineService::now);
+  bindMethods("ZUTimeline", {{"now",
+                              &ZUTimelineService::now,
+                              "Returns the time on the clock of the entries.",
+                              {},
+                              {"ustime", "Microseconds of the machine's steady clock."}}});
   auto signal = std::make_shared<EntrySignal>();
   advertiseSignal(kEntrySignal, signal);
   if (fTimeline) {

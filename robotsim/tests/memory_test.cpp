@@ -244,11 +244,12 @@ class HookedModule : public ZU::ZUModule {
   using Hook = std::function<void(const HookedModule& self, const std::string& key)>;
   HookedModule(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name, Hook hook)
       : ZU::ZUModule(broker, name), fHook(std::move(hook)) {
-    beginMethod("onEvent", "HookedModule", "Runs the test's hook.");
-    describeParameter("memoryKey", "The event.");
-    describeParameter("value", "Its value.");
-    describeParameter("message", "The subscription's message.");
-    bindMethod(&HookedModule::onEvent);
+    bindMethods("HookedModule", {{"onEvent",
+                                  &HookedModule::onEvent,
+                                  "Runs the test's hook.",
+                                  {{"memoryKey", "The event."},
+                                   {"value", "Its value."},
+                                   {"message", "The subscription's message."}}}});
   }
   void onEvent(const std::string& key, const ZU::ZUValue&, const std::string&) {
     fHook(*this, key);

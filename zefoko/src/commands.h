@@ -5,7 +5,7 @@
 
 namespace zefoko {
 
-// zefoko speak [--wav FILE] [--timing] [--fast] [--language L] [--json] [TEXT]
+// zefoko speak [--wav FILE] [--speech espeak|timing] [--fast] [--language L] [--json] [TEXT]
 void addSpeakCommand(CLI::App& app, int& status);
 // zefoko bodytalk [--seconds N] [--posture Standing|Sitting|SittingOnChair] [--json]
 void addBodyTalkCommand(CLI::App& app, int& status);

@@ -99,8 +99,28 @@ ko::RemoteOptions remoteOptions(const ServeOptions& o) {
 }
 
 int serve(const ServeOptions& o) {
+  if (!o.connect.empty() && o.libraries.empty()) {
+    std::cerr << "zefoko serve: --connect needs module libraries to serve" << std::endl;
+    return 2;
+  }
   if (o.libraries.empty() && o.listen.empty()) {
     std::cerr << "zefoko serve: nothing to serve: give module libraries, or --listen" << std::endl;
+    return 2;
+  }
+  // The keys and the endpoint, before anything starts.
+  ko::RemoteOptions remote;
+  try {
+    remote = remoteOptions(o);
+  } catch (const ko::Error& e) {
+    std::cerr << "zefoko serve: " << e.what() << std::endl;
+    return 2;
+  }
+  const std::string& endpoint = o.listen.empty() ? o.connect : o.listen;
+  if (const std::string missing =
+          endpoint.empty() ? std::string()
+                           : ko::remote::missingKeys(endpoint, !o.listen.empty(), remote.curve);
+      !missing.empty()) {
+    std::cerr << "zefoko serve: " << missing << std::endl;
     return 2;
   }
   // The signals are taken by one thread alone: blocked before any thread starts, so that
@@ -133,7 +153,7 @@ int serve(const ServeOptions& o) {
   options.connect = o.connect;
   int status = 0;
   try {
-    options.remote = remoteOptions(o);
+    options.remote = remote;
     Host host(options);
     if (!o.listen.empty())
       std::cout << "zefoko serve: listening on " << host.endpoint() << std::endl;
@@ -189,48 +209,77 @@ void addServeCommand(CLI::App& app, int& status) {
       "Start the simulated robot, load module libraries into it and serve until SIGINT or "
       "SIGTERM; with --listen, other processes reach them; with --connect, the modules use the "
       "robot of another process");
-  command->add_option("--speech", options->speech, "The speech engine: espeak or timing")
-      ->check(CLI::IsMember({"espeak", "timing"}));
-  command->add_flag("--fast", options->fast, "Play the speech without waiting in real time");
-  command->add_option("--posture", options->posture, "The robot's posture family at start")
-      ->check(CLI::IsMember({"Standing", "Sitting", "SittingOnChair"}));
-  auto* listen = command->add_option(
-      "--listen", options->listen,
-      "Serve the robot and the modules to other processes at this endpoint: tcp://HOST:PORT "
-      "(tcp://127.0.0.1:* for a free port) or ipc://PATH; an address reached through the "
-      "network needs --secret-key and --client-key");
-  auto* connect = command->add_option(
-      "--connect", options->connect,
-      "Use the robot of the process listening at this endpoint (no robot in this one)");
+  auto* speech =
+      command
+          ->add_option("--speech", options->speech,
+                       "The speech engine: espeak (real speech) or timing (durations estimated "
+                       "from the text, no audio)")
+          ->check(CLI::IsMember({"espeak", "timing"}))
+          ->capture_default_str();
+  auto* fast = command->add_flag("--fast", options->fast,
+                                 "Play the speech without waiting in real time (default: real "
+                                 "time)");
+  auto* posture =
+      command
+          ->add_option("--posture", options->posture,
+                       "The robot's posture family at start (default: Standing, the robot's own)")
+          ->check(CLI::IsMember({"Standing", "Sitting", "SittingOnChair"}));
+  auto* listen =
+      command
+          ->add_option("--listen", options->listen,
+                       "Serve the robot and the modules to other processes at this endpoint: "
+                       "tcp://HOST:PORT (tcp://127.0.0.1:* for a free port) or ipc://PATH; an "
+                       "address reached through the network needs --secret-key and --client-key "
+                       "(default: none, this process alone)")
+          ->type_name("ENDPOINT");
+  auto* connect =
+      command
+          ->add_option("--connect", options->connect,
+                       "Use the robot of the process listening at this endpoint, which has the "
+                       "robot's options (--speech, --fast, --posture); this one has no robot "
+                       "(default: none, the robot in this process)")
+          ->type_name("ENDPOINT");
   listen->excludes(connect);
-  command->add_option("--heartbeat", options->heartbeatMs,
-                      "Milliseconds between two signs of life; a linked process silent for "
-                      "five of them is taken for dead")
+  for (auto* robotOption : {speech, fast, posture})
+    robotOption->excludes(connect);
+  command
+      ->add_option("--heartbeat", options->heartbeatMs,
+                   "Milliseconds between two signs of life, 10 to 60000; a linked process "
+                   "silent for five of them is taken for dead")
       ->check(CLI::Range(10, 60000))
+      ->type_name("MS")
       ->capture_default_str();
-  command->add_option("--max-message", options->maxMessageBytes,
-                      "The largest message accepted, in bytes")
+  command
+      ->add_option("--max-message", options->maxMessageBytes,
+                   "The largest message accepted, in bytes, 1024 to 2^30")
       ->check(CLI::Range(std::size_t{1024}, std::size_t{1} << 30))
+      ->type_name("BYTES")
       ->capture_default_str();
-  command->add_option("--secret-key", options->secretKey,
-                      "This process's CURVE secret key file (made by zefoko keys)")
-      ->check(CLI::ExistingFile);
-  command->add_option("--client-key", options->clientKeys,
-                      "Listening: a public key file of a process allowed to connect (repeatable)")
-      ->check(CLI::ExistingFile);
-  command->add_option("--server-key", options->serverKey,
-                      "Connecting: the public key file of the listening process")
-      ->check(CLI::ExistingFile);
-  command->add_option("libraries", options->libraries, "The module libraries (.so) to load")
-      ->check(CLI::ExistingFile);
-  command->callback([options, &status] {
-    if (!options->connect.empty() && options->libraries.empty()) {
-      std::cerr << "zefoko serve: --connect needs module libraries to serve" << std::endl;
-      status = 2;
-      return;
-    }
-    status = serve(*options);
-  });
+  command
+      ->add_option("--secret-key", options->secretKey,
+                   "This process's CURVE secret key file, made by zefoko keys (default: none)")
+      ->check(CLI::ExistingFile)
+      ->type_name("PATH");
+  command
+      ->add_option("--client-key", options->clientKeys,
+                   "With --listen: a public key file of a process allowed to connect "
+                   "(repeatable; default: none)")
+      ->check(CLI::ExistingFile)
+      ->type_name("PATH")
+      ->needs(listen);
+  command
+      ->add_option("--server-key", options->serverKey,
+                   "With --connect: the public key file of the listening process (default: none)")
+      ->check(CLI::ExistingFile)
+      ->type_name("PATH")
+      ->needs(connect);
+  command
+      ->add_option("libraries", options->libraries,
+                   "The module libraries (.so) to load (default: none, the robot alone, which "
+                   "needs --listen)")
+      ->check(CLI::ExistingFile)
+      ->type_name("LIBRARY");
+  command->callback([options, &status] { status = serve(*options); });
 }
 
 }  // namespace zefoko

@@ -12,10 +12,11 @@ class ZUEcho : public ZU::ZUModule {
   ZUEcho(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
       : ZU::ZUModule(broker, name) {
     setModuleDescription("Answers what it is given.");
-    beginMethod("echo", "ZUEcho", "Answers its argument.");
-    describeParameter("text", "Any text.");
-    describeReturn("echoed", "The same text.");
-    bindMethod(&ZUEcho::echo);
+    bindMethods("ZUEcho", {{"echo",
+                            &ZUEcho::echo,
+                            "Answers its argument.",
+                            {{"text", "Any text."}},
+                            {"echoed", "The same text."}}});
   }
   std::string echo(const std::string& text) { return text; }
 };

@@ -24,12 +24,12 @@ namespace {
 using namespace std::chrono_literals;
 using ko::test::ChildProcess;
 
-// A start, a wait, a sound, an affectation and a tag; in random mode a text keeps its own
-// actions alone.
+// A start, a wait, a sound, a call of a method that its service lacks, an affectation and a
+// tag; in random mode a text keeps its own actions alone.
 const std::string kText =
     "Hello ^start(animations/Stand/Gestures/Hey_1) my friend "
-    "^wait(animations/Stand/Gestures/Hey_1) bye ^runSound(bells/ding, 50) $done=1 "
-    "^startTag(hello) see you";
+    "^wait(animations/Stand/Gestures/Hey_1) bye ^runSound(bells/ding, 50) ^call(ZUMemory.nosuch(1)) "
+    "$done=1 ^startTag(hello) see you";
 
 class RemoteProcesses : public ::testing::Test {
  protected:
@@ -57,7 +57,7 @@ class RemoteProcesses : public ::testing::Test {
     EXPECT_TRUE(host->waitForLine("zefoko serve: serving")) << host->output();
     return host;
   }
-  // `mokuto say` with the actions of its timeline file: [type, text, outcome] each.
+  // `mokuto say` with the actions of its timeline file: [type, text, outcome, failure] each.
   std::vector<std::vector<std::string>> say(std::vector<std::string> argv, const char* file) {
     const std::string timeline = (folder / file).string();
     argv.insert(argv.end(), {"--mode", "random", "--quiet", "--timeline", timeline, kText});
@@ -69,11 +69,11 @@ class RemoteProcesses : public ::testing::Test {
       const auto entry = nlohmann::json::parse(line);
       if (entry["service"] == "ZUMokuto" && entry["operation"] == "action") {
         const auto& a = entry["arguments"];
-        actions.push_back({a["type"], a["text"], a["outcome"]});
+        actions.push_back({a["type"], a["text"], a["outcome"], a["failure"].dump()});
       }
       if (entry["service"] == "ZUMemory" && entry["operation"] == "raiseEvent" &&
           entry["arguments"][0] == "ZUMokuto/EndOfMokuto")
-        actions.push_back({"end", entry["arguments"][0], ""});
+        actions.push_back({"end", entry["arguments"][0], "", ""});
     }
     return actions;
   }
@@ -88,10 +88,11 @@ TEST_F(RemoteProcesses, ATextGivesTheSameActionsAndEndAcrossThreeProcessesAsInOn
   const auto apart = say({MOKUTO_EXECUTABLE, "--connect", endpoint, "say"}, "apart.jsonl");
   const auto together =
       say({MOKUTO_EXECUTABLE, "say", "--speech", "timing", "--fast"}, "together.jsonl");
-  ASSERT_EQ(apart.size(), 6U);  // five actions and the end event
+  ASSERT_EQ(apart.size(), 7U);  // six actions and the end event
   EXPECT_EQ(apart, together);
   for (std::size_t k = 0; k + 1 < apart.size(); ++k)
-    EXPECT_EQ(apart[k][2], "executed") << apart[k][1];
+    EXPECT_EQ(apart[k][2], k == 3 ? "failed" : "executed") << apart[k][1];
+  EXPECT_EQ(apart[3][3], "\"Cannot find method 'nosuch' on ZUMemory\"");
 
   // A robot programmer's script.
   ChildProcess script({PYTHON_EXECUTABLE, SAY_EXAMPLE, endpoint, "Hi ^start(animations/Stand/Gestures/Hey_1) there"});
@@ -138,9 +139,18 @@ TEST_F(RemoteProcesses, ARobotKilledMidTextEndsTheTextAndTheNextIsSpokenOnceItIs
   host.shutdown();
 }
 
-TEST_F(RemoteProcesses, AClientKilledMidSayLetsTheTextEnd) {
+TEST_F(RemoteProcesses, AClientStopsItsOwnTextOnSigintAndOneKilledMidSayLetsTheTextEnd) {
   const auto robot = startRobot(false);
   const auto host = startHost();
+  {
+    ChildProcess client({MOKUTO_EXECUTABLE, "--connect", endpoint, "say", "--mode", "random",
+                         "One two ^start(animations/Stand/Gestures/Hey_1) three four five."});
+    ASSERT_TRUE(client.waitForLine("speech started")) << client.output();
+    client.kill(SIGINT);
+    EXPECT_EQ(client.wait(30s), 130) << client.output();
+    EXPECT_NE(client.output().find("speech stopped"), std::string::npos) << client.output();
+    EXPECT_NE(client.output().find("stopped after"), std::string::npos) << client.output();
+  }
   auto session = std::make_shared<ko::Session>();
   session->connect(endpoint);
   ASSERT_TRUE(session->waitForLink(10s));
@@ -157,7 +167,7 @@ TEST_F(RemoteProcesses, AClientKilledMidSayLetsTheTextEnd) {
   ASSERT_TRUE(client.waitForLine("speech started")) << client.output();
   client.kill(SIGKILL);
   EXPECT_TRUE(ended.wait());
-  EXPECT_TRUE(robot->waitForLine("is gone")) << robot->output();
+  EXPECT_TRUE(robot->waitForLine("is gone: no sign of life")) << robot->output();
   session->closeLink();
 }
 

@@ -58,6 +58,10 @@ namespace remote {
 // loopback address (127.x.x.x, ::1, localhost).
 bool isLocalEndpoint(const std::string& endpoint);
 
+// Why a process may not listen on (`listening`) or connect to `endpoint` with `keys`: an
+// endpoint reached through the network needs CURVE keys. Empty when it may.
+std::string missingKeys(const std::string& endpoint, bool listening, const CurveKeys& keys);
+
 struct KeyPair {
   std::string publicKey;
   std::string secretKey;

@@ -5,11 +5,13 @@
 #include <atomic>
 #include <condition_variable>
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <memory>
 #include <mutex>
 #include <optional>
 #include <shared_mutex>
+#include <span>
 #include <string>
 #include <type_traits>
 #include <vector>
@@ -87,6 +89,65 @@ struct ZUMethodParameter {
   std::string description;
 };
 
+// The member function that runs a published method: a member of the module's class or of
+// one of its bases. Bound on a module, it runs on that module, and the method's ko
+// signatures are those of the member's argument and result types. Made implicitly from
+// the member (&ZUMokuto::_reset); overload<Signature> picks one of overloaded members.
+class ZUMethodMember {
+ public:
+  template <class M>
+  requires std::is_member_function_pointer_v<M> ZUMethodMember(M member)
+      : fBind([member](ZUModuleCore& module) -> std::optional<ko::MethodBinding> {
+          using C = typename ClassOf<M>::type;
+          static_assert(std::is_base_of_v<ZUModuleCore, C>, "bind a member function of a module");
+          C* self = dynamic_cast<C*>(&module);
+          if (!self)
+            return std::nullopt;
+          return ko::bindMethod(self, member);
+        }) {}
+
+  // The member bound on `module`; none when `module` is not of the member's class.
+  std::optional<ko::MethodBinding> bindOn(ZUModuleCore& module) const { return fBind(module); }
+
+ private:
+  template <class M>
+  struct ClassOf;
+  template <class T, class C>
+  struct ClassOf<T C::*> {
+    using type = C;
+  };
+
+  std::function<std::optional<ko::MethodBinding>(ZUModuleCore&)> fBind;
+};
+
+// One of the overloads of a member function: overload<void(const std::string&)>(&ZUMokuto::say).
+template <class Signature, class C>
+requires std::is_function_v<Signature>
+constexpr Signature C::*overload(Signature C::*member) {
+  return member;
+}
+
+// One published method as its module declares it. A module declares its methods once, in
+// a table of these in binding order, and binds them with ZUModuleCore::bindMethods: the
+// method table that getMethodList, getMethodHelp and the ko meta object show is made from
+// that table alone.
+struct ZUMethodDeclaration {
+  ZUMethodDeclaration(std::string methodName, ZUMethodMember function, std::string text = "",
+                      std::vector<ZUMethodParameter> parameterList = {},
+                      ZUMethodParameter result = {})
+      : name(std::move(methodName)),
+        member(std::move(function)),
+        description(std::move(text)),
+        parameters(std::move(parameterList)),
+        returnValue(std::move(result)) {}
+
+  std::string name;
+  ZUMethodMember member;
+  std::string description;
+  std::vector<ZUMethodParameter> parameters;  // in order
+  ZUMethodParameter returnValue;              // none when its name is empty
+};
+
 // What a module publishes about one bound method.
 struct ZUMethodInfo {
   unsigned id = 0;  // the ko method id
@@ -103,8 +164,9 @@ struct ZUMethodInfo {
 // The base of every module: a ko dynamic object with a name, a weak link to its broker, a
 // method table and a table of posted calls.
 //
-// Methods are bound by the module's constructor (and possibly its init) with
-// beginMethod / describeParameter / describeReturn / bindMethod, one thread at a time.
+// Methods are bound by the module's constructor (and possibly its init), one thread at a
+// time: a table of declarations with bindMethods, or one method with beginMethod /
+// describeParameter / describeReturn / bindMethod.
 // Calls arrive on ko threads, several at once; posted calls run on the module's event loop
 // (its own when it set one, otherwise the process's). The task table is guarded by a
 // reader/writer lock, the method table and the module description by their own locks.
@@ -168,6 +230,15 @@ class ZUModuleCore : public ko::DynamicObject, public std::enable_shared_from_th
   std::optional<ZUMethodInfo> getMethodInfo(const std::string& name) const;
 
   // ---- binding ----
+  // Binds the declared methods in their order, each as beginMethod (with `moduleClass`),
+  // describeParameter for each parameter, describeReturn when it has a return value and
+  // bindMethod of its member would. Raises as bindMethod does; the methods declared before
+  // the one refused stay bound.
+  void bindMethods(const std::string& moduleClass, std::span<const ZUMethodDeclaration> methods);
+  void bindMethods(const std::string& moduleClass,
+                   const std::vector<ZUMethodDeclaration>& methods) {
+    bindMethods(moduleClass, std::span(methods));
+  }
   void beginMethod(const std::string& name, const std::string& moduleClass,
                    const std::string& description);
   void describeParameter(const std::string& name, const std::string& description);
@@ -178,13 +249,7 @@ class ZUModuleCore : public ko::DynamicObject, public std::enable_shared_from_th
   // was begun or ko refuses the method (same name and signature bound twice).
   template <class Signature, class C>
   requires std::is_function_v<Signature>
-  void bindMethod(Signature C::*method) {
-    static_assert(std::is_base_of_v<ZUModuleCore, C>, "bind a member function of the module");
-    C* self = dynamic_cast<C*>(this);
-    if (!self)
-      xThrowBindError("the member function does not belong to this module's class");
-    xBind(ko::bindMethod(self, method));
-  }
+  void bindMethod(Signature C::*method) { xBind(ZUMethodMember(method)); }
 
   // ---- posted calls ----
   // Posts the method `methodId` with the arguments in the list `args` and answers the new
@@ -212,6 +277,7 @@ class ZUModuleCore : public ko::DynamicObject, public std::enable_shared_from_th
   std::string xExitedText() const;
   // Ends a posted call that came too late to run (the module has exited).
   void xDropTask(const std::shared_ptr<ZUPCallTask>& task);
+  void xBind(const ZUMethodMember& member);
   void xBind(ko::MethodBinding binding);
   // Removes a task at its end, from the thread that runs it.
   void xRemoveTask(std::int32_t id);

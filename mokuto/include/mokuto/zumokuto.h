@@ -143,7 +143,6 @@ class ZUMokuto : public ZUModule {
   std::shared_ptr<MKTaskInstruction> xNewInstruction(const std::string& text,
                                                      const ZUValue* configuration);
   std::vector<DiagnosisLine> xDiagnosis();
-  void xBindMethods();
   void xEnterStage(ZUMokutoStage stage, MKID id) const;
   // The compiler and loader stages of a registered text, each under its stage lock and
   // skipped once the text is stopped.

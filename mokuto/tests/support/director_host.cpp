@@ -15,19 +15,19 @@ DirectorHost::DirectorHost(const std::shared_ptr<ZU::ZUBroker>& broker, const st
     : ZU::ZUModule(broker, name),
       fBodyTalk(std::make_unique<ZU::ZURobotBodyTalkInstance>(broker, bodyTalkOptions)),
       fDirector(std::make_shared<ZU::DirectorTask>(broker, fBodyTalk->bodyTalk, textRegister)) {
-  beginMethod("_speechBookMarkCallback", kModuleClass, "Hands a bookmark to the director.");
-  describeParameter("memoryKey", "The event.");
-  describeParameter("value", "The bookmark.");
-  describeParameter("message", "Unused.");
-  bindMethod(&DirectorHost::_speechBookMarkCallback);
-  beginMethod("_speechStatusCallback", kModuleClass, "Hands a speech status to the director.");
-  describeParameter("memoryKey", "The event.");
-  describeParameter("value", "[id, status].");
-  describeParameter("message", "Unused.");
-  bindMethod(&DirectorHost::_speechStatusCallback);
-  beginMethod("_mrkpauseCallback", kModuleClass, "Returns when the bookmark's action is done.");
-  describeParameter("pBookmark", "The bookmark.");
-  bindMethod(&DirectorHost::_mrkpauseCallback);
+  bindMethods(kModuleClass,
+              {{"_speechBookMarkCallback",
+                &DirectorHost::_speechBookMarkCallback,
+                "Hands a bookmark to the director.",
+                {{"memoryKey", "The event."}, {"value", "The bookmark."}, {"message", "Unused."}}},
+               {"_speechStatusCallback",
+                &DirectorHost::_speechStatusCallback,
+                "Hands a speech status to the director.",
+                {{"memoryKey", "The event."}, {"value", "[id, status]."}, {"message", "Unused."}}},
+               {"_mrkpauseCallback",
+                &DirectorHost::_mrkpauseCallback,
+                "Returns when the bookmark's action is done.",
+                {{"pBookmark", "The bookmark."}}}});
 }
 
 DirectorHost::~DirectorHost() {

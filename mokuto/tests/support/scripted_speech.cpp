@@ -18,15 +18,16 @@ ScriptedSpeech::ScriptedSpeech(const std::shared_ptr<ZU::ZUBroker>& broker, cons
       fHoldLoop(std::make_shared<ko::EventLoop>(name + ".mrkpause", kHoldThreads)) {
   setEventLoop(std::make_shared<ko::EventLoop>(name, 1));
 
-  beginMethod("say", kModuleClass, "Waits until the test ends the text.");
-  describeParameter("text", "The text with its bookmarks.");
-  bindMethod(&ScriptedSpeech::say);
-  beginMethod("setParameter", kModuleClass, "Records the parameter.");
-  describeParameter("name", "The parameter.");
-  describeParameter("value", "Its value.");
-  bindMethod(&ScriptedSpeech::setParameter);
-  beginMethod("enableNotifications", kModuleClass, "Records the call.");
-  bindMethod(&ScriptedSpeech::enableNotifications);
+  bindMethods(kModuleClass,
+              {{"say",
+                &ScriptedSpeech::say,
+                "Waits until the test ends the text.",
+                {{"text", "The text with its bookmarks."}}},
+               {"setParameter",
+                &ScriptedSpeech::setParameter,
+                "Records the parameter.",
+                {{"name", "The parameter."}, {"value", "Its value."}}},
+               {"enableNotifications", &ScriptedSpeech::enableNotifications, "Records the call."}});
 }
 
 ScriptedSpeech::~ScriptedSpeech() {

@@ -46,14 +46,10 @@ bool CallLog::waitFor(const std::string& method, std::size_t count,
 FakeMotion::FakeMotion(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
     : ZU::ZUModule(broker, name) {
   setEventLoop(std::make_shared<ko::EventLoop>(name, 2));
-  beginMethod("areResourcesAvailable", "FakeMotion", "");
-  bindMethod(&FakeMotion::areResourcesAvailable);
-  beginMethod("getAngles", "FakeMotion", "");
-  bindMethod(&FakeMotion::getAngles);
-  beginMethod("angleInterpolationBezier", "FakeMotion", "");
-  bindMethod(&FakeMotion::angleInterpolationBezier);
-  beginMethod("setAngles", "FakeMotion", "");
-  bindMethod(&FakeMotion::setAngles);
+  bindMethods("FakeMotion", {{"areResourcesAvailable", &FakeMotion::areResourcesAvailable},
+                             {"getAngles", &FakeMotion::getAngles},
+                             {"angleInterpolationBezier", &FakeMotion::angleInterpolationBezier},
+                             {"setAngles", &FakeMotion::setAngles}});
 }
 
 FakeMotion::~FakeMotion() = default;
@@ -98,12 +94,9 @@ void FakeMotion::stop(int id) {
 FakeBehaviorManager::FakeBehaviorManager(const std::shared_ptr<ZU::ZUBroker>& broker,
                                          const std::string& name)
     : ZU::ZUModule(broker, name) {
-  beginMethod("preloadBehavior", "FakeBehaviorManager", "");
-  bindMethod(&FakeBehaviorManager::preloadBehavior);
-  beginMethod("startBehavior", "FakeBehaviorManager", "");
-  bindMethod(&FakeBehaviorManager::startBehavior);
-  beginMethod("stopBehavior", "FakeBehaviorManager", "");
-  bindMethod(&FakeBehaviorManager::stopBehavior);
+  bindMethods("FakeBehaviorManager", {{"preloadBehavior", &FakeBehaviorManager::preloadBehavior},
+                                      {"startBehavior", &FakeBehaviorManager::startBehavior},
+                                      {"stopBehavior", &FakeBehaviorManager::stopBehavior}});
 }
 
 bool FakeBehaviorManager::preloadBehavior(const std::string& behavior) {
@@ -151,15 +144,13 @@ std::vector<std::string> FakeBehaviorManager::started() const {
 FakeRobotModel::FakeRobotModel(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name,
                                int robotType)
     : ZU::ZUModule(broker, name), fRobotType(robotType) {
-  beginMethod("_getRobotType", "FakeRobotModel", "");
-  bindMethod(&FakeRobotModel::_getRobotType);
+  bindMethods("FakeRobotModel", {{"_getRobotType", &FakeRobotModel::_getRobotType}});
 }
 
 FakeRobotPosture::FakeRobotPosture(const std::shared_ptr<ZU::ZUBroker>& broker,
                                    const std::string& name)
     : ZU::ZUModule(broker, name) {
-  beginMethod("getPostureFamily", "FakeRobotPosture", "");
-  bindMethod(&FakeRobotPosture::getPostureFamily);
+  bindMethods("FakeRobotPosture", {{"getPostureFamily", &FakeRobotPosture::getPostureFamily}});
 }
 
 std::string FakeRobotPosture::getPostureFamily() {
@@ -176,10 +167,8 @@ void FakeRobotPosture::setFamily(const std::string& family) {
 
 FakeMemory::FakeMemory(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
     : ZU::ZUModule(broker, name) {
-  beginMethod("subscribeToEvent", "FakeMemory", "");
-  bindMethod(&FakeMemory::subscribeToEvent);
-  beginMethod("unsubscribeToEvent", "FakeMemory", "");
-  bindMethod(&FakeMemory::unsubscribeToEvent);
+  bindMethods("FakeMemory", {{"subscribeToEvent", &FakeMemory::subscribeToEvent},
+                             {"unsubscribeToEvent", &FakeMemory::unsubscribeToEvent}});
 }
 
 void FakeMemory::subscribeToEvent(const std::string& name, const std::string& callbackModule,

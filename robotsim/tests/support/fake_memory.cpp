@@ -4,10 +4,10 @@ namespace robotsim::simtest {
 
 FakeMemory::FakeMemory(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
     : ZU::ZUModule(broker, name) {
-  beginMethod("raiseEvent", "FakeMemory", "Records an event.");
-  describeParameter("key", "The event's name.");
-  describeParameter("value", "The event's value.");
-  bindMethod(&FakeMemory::raiseEvent);
+  bindMethods("FakeMemory", {{"raiseEvent",
+                              &FakeMemory::raiseEvent,
+                              "Records an event.",
+                              {{"key", "The event's name."}, {"value", "The event's value."}}}});
 }
 
 void FakeMemory::raiseEvent(const std::string& key, const ZU::ZUValue& value) {

@@ -9,12 +9,10 @@ namespace robotsim::testing {
 RecordingModule::RecordingModule(const std::shared_ptr<ZU::ZUBroker>& broker,
                                  const std::string& name)
     : ZU::ZUModule(broker, name) {
-  beginMethod("onEvent", "RecordingModule", "Records a memory event.");
-  bindMethod(&RecordingModule::onEvent);
-  beginMethod("failingCallback", "RecordingModule", "Fails.");
-  bindMethod(&RecordingModule::failingCallback);
-  beginMethod("_mrkpauseCallback", "RecordingModule", "Records a blocking bookmark.");
-  bindMethod(&RecordingModule::_mrkpauseCallback);
+  bindMethods("RecordingModule", {{"onEvent", &RecordingModule::onEvent, "Records a memory event."},
+                                  {"failingCallback", &RecordingModule::failingCallback, "Fails."},
+                                  {"_mrkpauseCallback", &RecordingModule::_mrkpauseCallback,
+                                   "Records a blocking bookmark."}});
 }
 
 void RecordingModule::onEvent(const std::string& memoryKey, const ZU::ZUValue& value,
