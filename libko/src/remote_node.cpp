@@ -500,7 +500,7 @@ void RemoteNode::xHandleFor(const wire::Message& m, Peer* peer) {
       return;
     case MessageKind::Bye:
       if (listening && peer)
-        xPeerGone(peer->id, "it has left");
+        xPeerGone(peer->id, "it has left", true);
       else if (!listening)
         xLinkLost("the listening process has stopped");
       return;
@@ -1102,7 +1102,7 @@ void RemoteNode::xAnnounce(const std::string& event, const std::string& service,
     xSend(MessageKind::Service, id, 0, {AnyValue(event), AnyValue(service), AnyValue(owner)});
 }
 
-void RemoteNode::xPeerGone(std::uint32_t id, const std::string& reason) {
+void RemoteNode::xPeerGone(std::uint32_t id, const std::string& reason, bool saidGoodbye) {
   std::string name;
   std::vector<std::string> services;
   std::vector<std::uint32_t> others;
@@ -1129,8 +1129,12 @@ void RemoteNode::xPeerGone(std::uint32_t id, const std::string& reason) {
   std::string list;
   for (const auto& s : services)
     list += (list.empty() ? "" : ", ") + s;
-  KO_LOG_WARNING(kCategory) << "Process '" << name << "' (#" << id << ") is gone: " << reason
-                            << (services.empty() ? "" : "; its services leave the directory: " + list);
+  const std::string news = "Process '" + name + "' (#" + std::to_string(id) + ") is gone: " + reason +
+                           (services.empty() ? "" : "; its services leave the directory: " + list);
+  if (saidGoodbye)
+    KO_LOG_INFO(kCategory) << news;
+  else
+    KO_LOG_WARNING(kCategory) << news;
   for (const auto& s : services)
     xAnnounce("unregistered", s, id);
   for (const auto other : others)

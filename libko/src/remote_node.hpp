@@ -208,7 +208,8 @@ class RemoteNode : public std::enable_shared_from_this<RemoteNode> {
   AnyObject xLocalService(const std::string& name) const;
 
   // Hub.
-  void xPeerGone(std::uint32_t peer, const std::string& reason);
+  // A process that said goodbye is news (info); one lost without a word is a warning.
+  void xPeerGone(std::uint32_t peer, const std::string& reason, bool saidGoodbye = false);
   void xAnnounce(const std::string& event, const std::string& service, std::uint32_t owner);
   AnyValue xServiceInfo(const std::string& name, std::string* error);
   // Both: drop what belongs to a process that is gone (`peer`), or to every one.
