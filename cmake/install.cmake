@@ -1,0 +1,77 @@
+# Installation: the framework's shared libraries with their headers and CMake package, the
+# commands, the service's module library and the data. Components:
+#   Runtime      the libraries, zefoko, mokuto, mkbdb, libzumokuto.so, share/zefoko/
+#   Development  the headers, the CMake package (find_package(zefoko)), the link names
+# A prefix can be moved: run paths, data and the CMake package are found relative to the
+# files themselves.
+
+include(CMakePackageConfigHelpers)
+
+set(MOKUTO_INSTALL_CMAKEDIR "${CMAKE_INSTALL_LIBDIR}/cmake/zefoko")
+# The module libraries that zefoko serve loads (libzumokuto.so, and a robot's own).
+set(MOKUTO_INSTALL_MODULEDIR "${CMAKE_INSTALL_LIBDIR}/zefoko")
+set(MOKUTO_INSTALL_DATADIR "${CMAKE_INSTALL_DATADIR}/zefoko")
+set(MOKUTO_INSTALL_DOCDIR "${CMAKE_INSTALL_DATADIR}/doc/zefoko")
+
+# The framework's libraries: one major version per incompatible change of their interfaces.
+set_target_properties(ko zuvalue zucommon PROPERTIES
+  VERSION "${PROJECT_VERSION}" SOVERSION "${PROJECT_VERSION_MAJOR}")
+set_target_properties(mokutomodule PROPERTIES EXPORT_NAME zumokuto)
+
+# Run paths relative to each file, none where the libraries land in a directory that the
+# dynamic linker searches anyway.
+if(NOT "${CMAKE_INSTALL_FULL_LIBDIR}" IN_LIST CMAKE_CXX_IMPLICIT_LINK_DIRECTORIES)
+  file(RELATIVE_PATH binaryToLibrary "${CMAKE_INSTALL_FULL_BINDIR}" "${CMAKE_INSTALL_FULL_LIBDIR}")
+  set_target_properties(zefoko mokuto mkbdb PROPERTIES INSTALL_RPATH "$ORIGIN/${binaryToLibrary}")
+  set_target_properties(ko zuvalue zucommon PROPERTIES INSTALL_RPATH "$ORIGIN")
+  set_target_properties(mokutomodule PROPERTIES INSTALL_RPATH "$ORIGIN/..")
+endif()
+
+install(TARGETS ko zuvalue zucommon EXPORT zefokoTargets
+  LIBRARY DESTINATION "${CMAKE_INSTALL_LIBDIR}" COMPONENT Runtime NAMELINK_COMPONENT Development)
+install(TARGETS zefoko mokuto mkbdb EXPORT zefokoTargets
+  RUNTIME DESTINATION "${CMAKE_INSTALL_BINDIR}" COMPONENT Runtime)
+install(TARGETS mokutomodule EXPORT zefokoTargets
+  LIBRARY DESTINATION "${MOKUTO_INSTALL_MODULEDIR}" COMPONENT Runtime)
+install(DIRECTORY libko/include/ libzuvalue/include/ libzucommon/include/
+  DESTINATION "${MOKUTO_INSTALL_INCLUDEDIR}" COMPONENT Development)
+
+# The package: zefoko::ko, zefoko::zuvalue, zefoko::zucommon, and the commands and the
+# service's module as imported targets (zefoko::zefoko, zefoko::mokuto, zefoko::mkbdb,
+# zefoko::zumokuto).
+install(EXPORT zefokoTargets NAMESPACE zefoko::
+  DESTINATION "${MOKUTO_INSTALL_CMAKEDIR}" COMPONENT Development)
+configure_package_config_file(cmake/zefokoConfig.cmake.in
+  "${CMAKE_CURRENT_BINARY_DIR}/zefokoConfig.cmake"
+  INSTALL_DESTINATION "${MOKUTO_INSTALL_CMAKEDIR}"
+  PATH_VARS MOKUTO_INSTALL_MODULEDIR MOKUTO_INSTALL_DATADIR)
+write_basic_package_version_file("${CMAKE_CURRENT_BINARY_DIR}/zefokoConfigVersion.cmake"
+  COMPATIBILITY SameMajorVersion)
+install(FILES "${CMAKE_CURRENT_BINARY_DIR}/zefokoConfig.cmake"
+              "${CMAKE_CURRENT_BINARY_DIR}/zefokoConfigVersion.cmake"
+  DESTINATION "${MOKUTO_INSTALL_CMAKEDIR}" COMPONENT Development)
+
+# The data: the starter animations and sounds, and the linguistic databases with the
+# licences of their sources.
+install(DIRECTORY share/zefoko/ DESTINATION "${MOKUTO_INSTALL_DATADIR}" COMPONENT Runtime)
+if(TARGET lingdata)
+  install(DIRECTORY "${MOKUTO_GENERATED_SHARE_DIR}/zefoko/"
+    DESTINATION "${MOKUTO_INSTALL_DATADIR}" COMPONENT Runtime)
+  # Lefff's licence asks that whoever ships a work based on it ships its legible form too:
+  # the lexicons that the two French databases are built from.
+  set(lexiconWork "${CMAKE_BINARY_DIR}/tools/lexicons")
+  set(legible "${CMAKE_BINARY_DIR}/legible-lexicons")
+  set(legibleFiles "")
+  foreach(name french.lex french.freq frenchemotions.lex)
+    add_custom_command(OUTPUT "${legible}/${name}.gz"
+      COMMAND ${CMAKE_COMMAND} -E make_directory "${legible}"
+      COMMAND gzip -9nc "${lexiconWork}/${name}" > "${legible}/${name}.gz"
+      DEPENDS lingdata "${lexiconWork}/${name}"
+      COMMENT "Compressing the legible form ${name}")
+    list(APPEND legibleFiles "${legible}/${name}.gz")
+  endforeach()
+  add_custom_target(legible_lexicons ALL DEPENDS ${legibleFiles})
+  install(FILES ${legibleFiles}
+    DESTINATION "${MOKUTO_INSTALL_DATADIR}/mokuto/syntacticanalysis/sources" COMPONENT Runtime)
+endif()
+install(FILES README.md DESTINATION "${MOKUTO_INSTALL_DOCDIR}" COMPONENT Runtime)
