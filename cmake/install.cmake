@@ -1,7 +1,10 @@
 # Installation: the framework's shared libraries with their headers and CMake package, the
-# commands, the service's module library and the data. Components:
+# commands, the service's module library, the data, and the systemd service that serves the
+# robot at boot with its settings in /etc/zefoko/. Components:
 #   Runtime      the libraries, zefoko, mokuto, mkbdb, libzumokuto.so, share/zefoko/
 #   Development  the headers, the CMake package (find_package(zefoko)), the link names
+#   Service      the systemd unit and /etc/zefoko/ (where the system's configuration is:
+#                /etc for the prefix /usr, <prefix>/etc for /usr/local)
 # A prefix can be moved: run paths, data and the CMake package are found relative to the
 # files themselves.
 
@@ -12,6 +15,13 @@ set(MOKUTO_INSTALL_CMAKEDIR "${CMAKE_INSTALL_LIBDIR}/cmake/zefoko")
 set(MOKUTO_INSTALL_MODULEDIR "${CMAKE_INSTALL_LIBDIR}/zefoko")
 set(MOKUTO_INSTALL_DATADIR "${CMAKE_INSTALL_DATADIR}/zefoko")
 set(MOKUTO_INSTALL_DOCDIR "${CMAKE_INSTALL_DATADIR}/doc/zefoko")
+if(CMAKE_INSTALL_PREFIX STREQUAL "/usr")
+  set(systemdUnitDir "/lib/systemd/system")
+else()
+  set(systemdUnitDir "lib/systemd/system")
+endif()
+set(MOKUTO_INSTALL_SYSTEMDUNITDIR "${systemdUnitDir}" CACHE STRING
+  "Where the systemd unit goes (relative to the prefix, or absolute)")
 
 # The framework's libraries: one major version per incompatible change of their interfaces.
 set_target_properties(ko zuvalue zucommon PROPERTIES
@@ -75,3 +85,14 @@ if(TARGET lingdata)
     DESTINATION "${MOKUTO_INSTALL_DATADIR}/mokuto/syntacticanalysis/sources" COMPONENT Runtime)
 endif()
 install(FILES README.md DESTINATION "${MOKUTO_INSTALL_DOCDIR}" COMPONENT Runtime)
+
+# The service: zefoko serve at boot, listening on the endpoint of /etc/zefoko/serve.conf.
+configure_file(packaging/zefoko.service.in "${CMAKE_CURRENT_BINARY_DIR}/packaging/zefoko.service" @ONLY)
+configure_file(packaging/serve.conf.in "${CMAKE_CURRENT_BINARY_DIR}/packaging/serve.conf" @ONLY)
+install(FILES "${CMAKE_CURRENT_BINARY_DIR}/packaging/zefoko.service"
+  DESTINATION "${MOKUTO_INSTALL_SYSTEMDUNITDIR}" COMPONENT Service)
+install(FILES "${CMAKE_CURRENT_BINARY_DIR}/packaging/serve.conf"
+  DESTINATION "${CMAKE_INSTALL_FULL_SYSCONFDIR}/zefoko" COMPONENT Service)
+
+include(cmake/package.cmake)
+
