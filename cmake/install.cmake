@@ -86,6 +86,12 @@ if(TARGET lingdata)
 endif()
 install(FILES README.md DESTINATION "${MOKUTO_INSTALL_DOCDIR}" COMPONENT Runtime)
 
+# The Python client (import zefoko), where Debian's python3 finds it for the prefix /usr.
+set(MOKUTO_INSTALL_PYTHONDIR "lib/python3/dist-packages" CACHE STRING
+  "Where the Python client goes, relative to the prefix")
+install(DIRECTORY python/zefoko DESTINATION "${MOKUTO_INSTALL_PYTHONDIR}" COMPONENT Runtime
+  FILES_MATCHING PATTERN "*.py")
+
 # The service: zefoko serve at boot, listening on the endpoint of /etc/zefoko/serve.conf.
 configure_file(packaging/zefoko.service.in "${CMAKE_CURRENT_BINARY_DIR}/packaging/zefoko.service" @ONLY)
 configure_file(packaging/serve.conf.in "${CMAKE_CURRENT_BINARY_DIR}/packaging/serve.conf" @ONLY)
@@ -95,4 +101,3 @@ install(FILES "${CMAKE_CURRENT_BINARY_DIR}/packaging/serve.conf"
   DESTINATION "${CMAKE_INSTALL_FULL_SYSCONFDIR}/zefoko" COMPONENT Service)
 
 include(cmake/package.cmake)
-

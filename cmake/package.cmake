@@ -52,6 +52,8 @@ set(CPACK_DEBIAN_ZEFOKO_PACKAGE_SECTION misc)
 set(CPACK_DEBIAN_ZEFOKO_PACKAGE_SHLIBDEPS ON)
 # MeCab's dictionary, which the speech reads Japanese texts with.
 set(CPACK_DEBIAN_ZEFOKO_PACKAGE_DEPENDS "mecab-ipadic-utf8")
+# The Python client's interpreter, sockets and values.
+set(CPACK_DEBIAN_ZEFOKO_PACKAGE_RECOMMENDS "python3, python3-zmq, python3-msgpack")
 set(CPACK_DEBIAN_ZEFOKO_DESCRIPTION
 "speech animation for a humanoid robot, with its framework and a simulated robot
 The service ZUMokuto makes a humanoid robot speak with its body: it
