@@ -101,3 +101,15 @@ install(FILES "${CMAKE_CURRENT_BINARY_DIR}/packaging/serve.conf"
   DESTINATION "${CMAKE_INSTALL_FULL_SYSCONFDIR}/zefoko" COMPONENT Service)
 
 include(cmake/package.cmake)
+
+# The installation in use, out of reach of the source and build trees: installed into a
+# temporary prefix, examples/hello-module built against it, zefoko serve with the module
+# and libzumokuto.so, mokuto and the Python client calling them. The sanitizers' builds
+# would need their runtimes in the module's project: the plain build alone.
+if(MOKUTO_BUILD_TESTS AND MOKUTO_SANITIZE STREQUAL "")
+  add_test(NAME install_hello_module
+    COMMAND bash "${CMAKE_CURRENT_SOURCE_DIR}/packaging/install_test.sh"
+            "${CMAKE_CURRENT_SOURCE_DIR}" "${CMAKE_BINARY_DIR}" "${CMAKE_CXX_COMPILER_LAUNCHER}")
+  set_tests_properties(install_hello_module PROPERTIES
+    LABELS "slow;install" TIMEOUT 300 PASS_REGULAR_EXPRESSION "install test: passed")
+endif()
