@@ -18,18 +18,20 @@ class Hello : public ZU::ZUModule {
   Hello(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
       : ZU::ZUModule(broker, name) {
     setModuleDescription("Greets people, and has the robot greet them aloud.");
-    bindMethods("Hello",
-                {{"greet",
-                  &Hello::greet,
-                  "Answers a greeting.",
-                  {{"name", "Who to greet."}},
-                  {"greeting", "\"Hello, \" followed by the name and \"!\"."}},
-                 {"greetings", &Hello::greetings, "How many greetings so far.", {},
-                  {"count", "The number of greetings answered or spoken."}},
-                 {"sayHello",
-                  &Hello::sayHello,
-                  "The robot says hello to someone with a wave; returns when it is done.",
-                  {{"name", "Who to greet."}}}});
+    bindMethods("Hello", {{"greet",
+                           &Hello::greet,
+                           "Answers a greeting.",
+                           {{"name", "Who to greet."}},
+                           {"greeting", "\"Hello, \" followed by the name and \"!\"."}},
+                          {"greetings",
+                           &Hello::greetings,
+                           "How many greetings so far.",
+                           {},
+                           {"count", "The number of greetings answered or spoken."}},
+                          {"sayHello",
+                           &Hello::sayHello,
+                           "The robot says hello to someone with a wave; returns when it is done.",
+                           {{"name", "Who to greet."}}}});
   }
 
   std::string greet(const std::string& name) {

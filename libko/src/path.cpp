@@ -59,8 +59,8 @@ namespace detail {
 
 std::vector<std::string> dataRoots(const Layout& layout, const std::string& variable) {
   std::vector<std::string> roots;
-  const bool buildTree = !layout.libraryDirectory.empty() &&
-                         layout.libraryDirectory == layout.buildLibraryDirectory;
+  const bool buildTree =
+      !layout.libraryDirectory.empty() && layout.libraryDirectory == layout.buildLibraryDirectory;
   if (!layout.libraryDirectory.empty() && !buildTree)
     roots.push_back((layout.libraryDirectory / layout.libraryToData).lexically_normal().string());
   std::size_t start = 0;

@@ -10,10 +10,14 @@ namespace ko::path::detail {
 
 // Where the framework's library lies and what the build knows about its trees.
 struct Layout {
-  std::filesystem::path libraryDirectory;       // the loaded library's directory; empty if unknown
-  std::filesystem::path buildLibraryDirectory;  // where the build writes the library
-  std::filesystem::path libraryToData;          // installed: from the library's to the data directory
-  std::vector<std::string> buildRoots;          // the build tree's data roots
+  // The directory of the loaded library; empty when unknown.
+  std::filesystem::path libraryDirectory;
+  // Where the build writes the library.
+  std::filesystem::path buildLibraryDirectory;
+  // In an installation, the data directory relative to the library's.
+  std::filesystem::path libraryToData;
+  // The build tree's data roots.
+  std::vector<std::string> buildRoots;
 };
 
 // The roots in search order for `layout` and a value of ZEFOKO_DATA_PATH.

@@ -89,7 +89,8 @@ TEST(DataRoots, InstalledOrBuildTreeByWhereTheLibraryLies) {
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(std::string(c.library) + " with " + c.variable);
-    const ko::path::detail::Layout layout{c.library, "/b/libko", "../../share", {"/b/share", "/s/share"}};
+    const ko::path::detail::Layout layout{
+        c.library, "/b/libko", "../../share", {"/b/share", "/s/share"}};
     EXPECT_EQ(ko::path::detail::dataRoots(layout, c.variable), c.roots);
   }
 }
