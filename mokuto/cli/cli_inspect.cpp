@@ -1,6 +1,7 @@
 // mokuto methods | tags | animations [TAG] | sounds | diagnosis | page: what the service
 // and the simulated robot offer, asked of the service embedded in the process (on the
-// timing speech engine, once its animation index is built).
+// timing speech engine, once its animation index is built) or, with mokuto --connect, of
+// the running one (sounds excepted: it reads this machine's sound library).
 #include <filesystem>
 #include <iostream>
 #include <memory>
@@ -18,7 +19,6 @@
 #include "robotsim/soundlibrary.h"
 #include "zu/enums.h"
 #include "zu/zuerror.h"
-#include "zu/zuserviceproxies.h"
 
 namespace mokuto::cli {
 
@@ -40,7 +40,7 @@ class NotFound : public std::runtime_error {
   using std::runtime_error::runtime_error;
 };
 
-Json methodsToJson(const ZU::ZUMokuto& service) {
+Json methodsToJson(ServiceHandle& service) {
   Json methods = Json::array();
   for (const auto& info : service.getMethodInfos()) {
     Json parameters = Json::array();
@@ -77,7 +77,7 @@ bool madeFor(const std::string& path, const InspectOptions& o) {
   return false;
 }
 
-std::vector<std::string> animationsOfTag(ZU::ZUMokuto& service, const std::string& tag,
+std::vector<std::string> animationsOfTag(ServiceHandle& service, const std::string& tag,
                                          const InspectOptions& o) {
   std::vector<std::string> animations;
   for (const auto& animation : service._getAnimationsByTag(tag)) {
@@ -87,17 +87,17 @@ std::vector<std::string> animationsOfTag(ZU::ZUMokuto& service, const std::strin
   return animations;
 }
 
-void printTags(EmbeddedService& embedded, const InspectOptions& o) {
-  for (const auto& tag : embedded.service()._getTagList()) {
-    if (o.posture.empty() || !animationsOfTag(embedded.service(), tag, o).empty())
+void printTags(ServiceHandle& service, const InspectOptions& o) {
+  for (const auto& tag : service._getTagList()) {
+    if (o.posture.empty() || !animationsOfTag(service, tag, o).empty())
       std::cout << tag << '\n';
   }
 }
 
-void printAnimations(EmbeddedService& embedded, const InspectOptions& o) {
+void printAnimations(ServiceHandle& service, const InspectOptions& o) {
   const std::string posture = o.posture.empty() ? "" : " for the " + o.posture + " posture";
   if (!o.tag.empty()) {
-    const auto animations = animationsOfTag(embedded.service(), o.tag, o);
+    const auto animations = animationsOfTag(service, o.tag, o);
     if (animations.empty())
       throw NotFound("no animation for the tag \"" + o.tag + "\"" + posture);
     for (const auto& animation : animations)
@@ -106,8 +106,7 @@ void printAnimations(EmbeddedService& embedded, const InspectOptions& o) {
   }
   // Every behaviour that a text can start by its path.
   std::size_t count = 0;
-  for (const auto& path :
-       ZU::ZUBehaviorManagerProxy(embedded.robot().broker()).getInstalledBehaviors()) {
+  for (const auto& path : service.installedBehaviors()) {
     if (madeFor(path, o)) {
       std::cout << path << '\n';
       ++count;
@@ -117,19 +116,27 @@ void printAnimations(EmbeddedService& embedded, const InspectOptions& o) {
     throw NotFound("no animation" + posture);
 }
 
-// Runs `body` on the embedded service; the exit status.
+// Runs `body` on the service, embedded or running; the exit status.
 template <class Body>
 int withService(const char* command, const InspectOptions& o, Body&& body) {
   if (ko::os::getenv("ZEFOKO_LOG").empty())
     ko::log::setLevels("*=warning");
+  const bool filter = std::string(command) == "tags" || std::string(command) == "animations";
+  if (connected() && !o.posture.empty() && !filter) {
+    std::cerr << "mokuto " << command
+              << ": --posture belongs to the robot's process with --connect (zefoko serve "
+                 "--listen)"
+              << std::endl;
+    return kUsage;
+  }
   try {
     EmbeddedServiceOptions options;
     options.speech = "timing";
     options.posture = o.posture;
-    EmbeddedService embedded(options);
+    const std::unique_ptr<ServiceHandle> service = openService(options);
     for (const auto& package : o.packages)
-      embedded.service().declareAnimationsPackage(package);
-    body(embedded);
+      service->declareAnimationsPackage(package);
+    body(*service);
   } catch (const ServiceError& e) {
     std::cerr << "mokuto " << command << ": the service cannot start: " << e.what() << std::endl;
     return kFailure;
@@ -145,7 +152,7 @@ int withService(const char* command, const InspectOptions& o, Body&& body) {
 
 void addInspectCommand(CLI::App& app, int& status, const char* name, const char* help,
                        bool withLibraryOptions,
-                       void (*run)(EmbeddedService&, const InspectOptions&)) {
+                       void (*run)(ServiceHandle&, const InspectOptions&)) {
   auto o = std::make_shared<InspectOptions>();
   CLI::App* command = app.add_subcommand(name, help);
   if (withLibraryOptions) {
@@ -165,7 +172,7 @@ void addInspectCommand(CLI::App& app, int& status, const char* name, const char*
   if (std::string(name) == "animations")
     command->add_option("tag", o->tag, "The tag (default: none, every animation)");
   command->callback([o, name, run, &status] {
-    status = withService(name, *o, [&o, run](EmbeddedService& embedded) { run(embedded, *o); });
+    status = withService(name, *o, [&o, run](ServiceHandle& service) { run(service, *o); });
   });
 }
 
@@ -205,8 +212,8 @@ void addInspectCommands(CLI::App& app, int& status) {
   addInspectCommand(app, status, "methods",
                     "Print the service's published methods as JSON, in binding order, the "
                     "built-in ones included",
-                    false, [](EmbeddedService& embedded, const InspectOptions&) {
-                      std::cout << dumpJson(methodsToJson(embedded.service())) << std::endl;
+                    false, [](ServiceHandle& service, const InspectOptions&) {
+                      std::cout << dumpJson(methodsToJson(service)) << std::endl;
                     });
   addInspectCommand(
       app, status, "tags",
@@ -220,15 +227,13 @@ void addInspectCommands(CLI::App& app, int& status) {
                     true, printAnimations);
   addInspectCommand(app, status, "diagnosis",
                     "Print the service's diagnosis lines (as _diagnosis logs them)", true,
-                    [](EmbeddedService& embedded, const InspectOptions&) {
-                      for (const auto& line : embedded.service().diagnosisLines())
+                    [](ServiceHandle& service, const InspectOptions&) {
+                      for (const auto& line : service.diagnosisLines())
                         std::cout << line << '\n';
                     });
-  addInspectCommand(app, status, "page",
-                    "Print the service's tag page (HTML, as httpGet answers it)", true,
-                    [](EmbeddedService& embedded, const InspectOptions&) {
-                      std::cout << embedded.service().tagPage();
-                    });
+  addInspectCommand(
+      app, status, "page", "Print the service's tag page (HTML, as httpGet answers it)", true,
+      [](ServiceHandle& service, const InspectOptions&) { std::cout << service.tagPage(); });
   CLI::App* sounds = app.add_subcommand(
       "sounds", "Print the robot's sounds as a text names them (SET/NAME), one a line");
   sounds->callback([&status] { status = printSounds(); });

@@ -1,7 +1,8 @@
 // mokuto say [options] [TEXT]: speaks an annotated text on the simulated robot with the
-// service embedded in the process, prints the live timeline and a summary, and can write
-// the audio (WAV) and the whole timeline (JSON lines). --dry-run shows the prepared job
-// without speaking.
+// service embedded in the process, or through the running service of other processes
+// (mokuto --connect), prints the live timeline and a summary, and can write the audio (WAV,
+// in the process only) and the whole timeline (JSON lines). --dry-run shows the prepared
+// job without speaking.
 #include <algorithm>
 #include <atomic>
 #include <filesystem>
@@ -175,13 +176,29 @@ std::optional<Refusal> checkValues(const SayOptions& o, Values& values) {
   return std::nullopt;
 }
 
+// With --connect, the options that belong to the robot's process or that need the service
+// in this one.
+std::optional<Refusal> checkRemote(const CLI::App& command) {
+  if (!connected())
+    return std::nullopt;
+  for (const char* option : {"--speech", "--fast", "--language", "--posture"}) {
+    if (command.count(option) > 0)
+      return Refusal{std::string(option) +
+                     " belongs to the robot's process with --connect (zefoko serve --listen)"};
+  }
+  if (command.count("--dry-run") > 0)
+    return Refusal{"--dry-run needs the service in this process (without --connect)"};
+  if (command.count("--wav") > 0)
+    return Refusal{"--wav needs the robot in this process (without --connect)"};
+  return std::nullopt;
+}
+
 // The configuration calls, before the text: each package must hold animations.
 std::optional<Refusal> configureService(const SayOptions& o, const Values& values,
-                                        EmbeddedService& embedded) {
-  ZU::ZUMokuto& service = embedded.service();
-  const std::vector<std::string> installed =
-      ZU::ZUBehaviorManagerProxy(embedded.robot().broker()).getInstalledBehaviors();
+                                        ServiceHandle& service) {
   try {
+    const std::vector<std::string> installed =
+        o.packages.empty() ? std::vector<std::string>() : service.installedBehaviors();
     for (const auto& package : o.packages) {
       const std::string declared = package + "/";
       if (std::none_of(installed.begin(), installed.end(), [&declared](const std::string& path) {
@@ -314,13 +331,15 @@ Json preparedJobToJson(const ZU::MKTaskInstruction& job) {
   return out;
 }
 
-int say(SayOptions& o) {
+int say(SayOptions& o, const CLI::App& command) {
   // First: the signals are blocked before any thread starts.
   StopSignals signals("mokuto say");
   const auto refuse = [](const Refusal& refusal) {
     std::cerr << "mokuto say: " << refusal.message << std::endl;
     return kUsage;
   };
+  if (const auto refusal = checkRemote(command))
+    return refuse(*refusal);
   const std::string text = readText(o.text);
   if (text.find_first_not_of(" \t\r\n") == std::string::npos)
     return refuse({"the text is empty"});
@@ -346,10 +365,9 @@ int say(SayOptions& o) {
     serviceOptions.language = o.language;
     serviceOptions.posture = o.posture;
     serviceOptions.recordAudio = !o.wav.empty();
-    EmbeddedService embedded(serviceOptions);
-    ZU::ZUMokuto& service = embedded.service();
-    robotsim::Robot& robot = embedded.robot();
-    if (const auto refusal = configureService(o, values, embedded))
+    const std::unique_ptr<ServiceHandle> handle = openService(serviceOptions);
+    ServiceHandle& service = *handle;
+    if (const auto refusal = configureService(o, values, service))
       return refuse(*refusal);
     warnAboutText(text);
     const ZU::ZUValue noConfiguration;
@@ -357,18 +375,18 @@ int say(SayOptions& o) {
         values.configuration ? *values.configuration : noConfiguration;
 
     if (o.dryRun) {
-      robot.timeline()->clear();
+      service.timeline()->clear();
       const auto job = service.prepare(text, configuration);
       std::cout << dumpJson(preparedJobToJson(*job)) << std::endl;
       if (timelineFile.is_open())
-        robot.timeline()->writeJsonLines(timelineFile);
+        service.timeline()->writeJsonLines(timelineFile);
     } else {
       const auto recorder =
-          SayTimeline::create(robot.timeline(), o.quiet ? nullptr : &std::cout, o.fast);
+          SayTimeline::create(service.timeline(), o.quiet ? nullptr : &std::cout, o.fast);
       // Set once a signal has asked the text to stop while the service had it.
       std::atomic<bool> stopAsked{false};
       service.setDirectorObserver(recorder);
-      embedded.setStageObserver([&](ZU::ZUMokutoStage stage, ZU::MKID id) {
+      service.setStageObserver([&](ZU::ZUMokutoStage stage, ZU::MKID id) {
         recorder->stage(stage, id);
         // A signal that came before the service registered the text stopped nothing yet.
         if (stage == ZU::ZUMokutoStage::Compiler && signals.received()) {
@@ -376,23 +394,19 @@ int say(SayOptions& o) {
           service.stop(id);
         }
       });
-      robot.timeline()->clear();
+      service.timeline()->clear();
       recorder->begin(text);
       {
         // Whatever say does, the signals and the service forget the callbacks on its way
         // out; a signal after it is only remembered, so that the summary and files come.
         const std::shared_ptr<void> detach(nullptr, [&](void*) {
           signals.onStop([] {});
-          embedded.setStageObserver(nullptr);
+          service.setStageObserver(nullptr);
           service.setDirectorObserver(nullptr);
         });
         signals.onStop([&] {
           stopAsked.store(true);
-          // The speech engine's warnings about a stopped speech (one per bookmark that it
-          // did not reach: thousands for a long text) say nothing the user needs.
-          if (ko::os::getenv("ZEFOKO_LOG").empty())
-            ko::log::setLevel("robotsim.texttospeech", ko::log::Error);
-          service._stopAll(false);
+          service.stopText(recorder->id());
         });
         if (!signals.received()) {
           if (values.configuration)
@@ -400,12 +414,15 @@ int say(SayOptions& o) {
           else
             service.say(text);
         }
+        // From a service of another process, the last reports and the robot's last entries
+        // may still be on their way.
+        service.settle(recorder->id());
       }
       ZU::MKID id = 0;
       const SaySummary summary = recorder->end(stopAsked.load() || signals.received(), &id);
       SayTimeline::printSummary(std::cout, id, summary);
       if (!o.wav.empty()) {
-        robot.speech()->saveRecording(o.wav);
+        service.saveRecording(o.wav);
         std::cout << "Audio written to " << o.wav << '\n';
       }
       if (timelineFile.is_open()) {
@@ -439,9 +456,9 @@ void addSayCommand(CLI::App& app, int& status) {
   auto o = std::make_shared<SayOptions>();
   CLI::App* command = app.add_subcommand(
       "say",
-      "Speak an annotated text on the simulated robot, with the service in the process: "
-      "print the timeline live, then a summary of the actions and of their sync with the "
-      "speech");
+      "Speak an annotated text on the simulated robot, with the service in the process (or "
+      "the running one, with mokuto --connect): print the timeline live, then a summary of "
+      "the actions and of their sync with the speech");
   command
       ->add_option("--mode", o->mode,
                    "The body language mode, set before the text: disabled, random or "
@@ -504,10 +521,12 @@ void addSayCommand(CLI::App& app, int& status) {
       "configuration value that the service rejects, before anything is spoken; 1 when the "
       "service fails; 130 when SIGINT (Ctrl-C) or SIGTERM stopped the text (its summary and "
       "files still come; a second signal, or one before the text is handed to the service, "
-      "ends the command at once).\nWarnings about the text "
+      "ends the command at once).\nWith mokuto --connect, --speech, --fast, --language and "
+      "--posture belong to the robot's process (zefoko serve --listen), and --wav and "
+      "--dry-run need the service in this one: they are usage errors.\nWarnings about the text "
       "and log lines go to standard error, warnings and errors only unless ZEFOKO_LOG sets "
       "the levels.");
-  command->callback([o, &status] { status = say(*o); });
+  command->callback([o, command, &status] { status = say(*o, *command); });
 }
 
 }  // namespace mokuto::cli

@@ -85,13 +85,18 @@ class DirectorFailures : public ko::log::Sink {
   }
   void consume(const ko::log::Record& record) override {
     if (record.category != kDirectorCategory || record.level > ko::log::Warning ||
-        std::find(kActionFunctions.begin(), kActionFunctions.end(), record.function) ==
-            kActionFunctions.end()) {
+        !isActionFailure(record.function)) {
       return;
     }
     std::lock_guard lock(fMutex);
     if (fThread == std::this_thread::get_id())
       fReasons.push_back(failureReason(record.message));
+  }
+  // Whether a warning or error line of the director's, logged by `function`, is about the
+  // action it runs.
+  static bool isActionFailure(const std::string& function) {
+    return std::find(kActionFunctions.begin(), kActionFunctions.end(), function) !=
+           kActionFunctions.end();
   }
   // The reasons logged since the last call.
   std::vector<std::string> take() {
@@ -213,8 +218,27 @@ void SayTimeline::stage(ZU::ZUMokutoStage stage, ZU::MKID id) {
   fTimeline->record(kService, "say", ko::AnyValue::List{id, std::move(text)});
 }
 
+ZU::MKID SayTimeline::id() const {
+  std::lock_guard lock(fMutex);
+  return fId;
+}
+
 void SayTimeline::onAction(const ZU::DirectorActionReport& report) {
-  std::vector<std::string> failures = fFailures->take();
+  xAction(report, fFailures->take());
+}
+
+void SayTimeline::onRemoteAction(const ZU::DirectorActionReport& report,
+                                 const std::vector<DirectorLine>& lines) {
+  std::vector<std::string> failures;
+  for (const auto& line : lines) {
+    if (DirectorFailures::isActionFailure(line.function))
+      failures.push_back(failureReason(line.message));
+  }
+  xAction(report, std::move(failures));
+}
+
+void SayTimeline::xAction(const ZU::DirectorActionReport& report,
+                          std::vector<std::string> failures) {
   std::size_t index = 0;
   {
     std::lock_guard lock(fMutex);

@@ -16,7 +16,9 @@
 //
 // Threads: the timeline's listener runs in whatever thread records an entry (the robot's
 // services, the director); the sync reports and the director's error lines come in the say
-// caller's thread (the one that called begin). One mutex guards the state and the live
+// caller's thread (the one that called begin). With the service in another process, the
+// reports come with the director's lines (onRemoteAction), and they and the robot's entries
+// in the session's serving threads. One mutex guards the state and the live
 // output; it is never held while an entry is recorded, since recording calls the listener.
 #include <condition_variable>
 #include <cstddef>
@@ -31,6 +33,7 @@
 #include <utility>
 #include <vector>
 
+#include "cli_service.h"
 #include "mokuto/directortask.h"
 #include "mokuto/zumokuto.h"
 #include "robotsim/timeline.h"
@@ -68,7 +71,7 @@ struct SaySummary {
 
 class DirectorFailures;
 
-class SayTimeline : public ZU::DirectorObserver, public std::enable_shared_from_this<SayTimeline> {
+class SayTimeline : public ActionObserver, public std::enable_shared_from_this<SayTimeline> {
  public:
   // At most this many stopped actions are listed one by one; the others are counted.
   static constexpr int kListedStops = 3;
@@ -86,7 +89,11 @@ class SayTimeline : public ZU::DirectorObserver, public std::enable_shared_from_
   void begin(const std::string& text);
   // The text entered a stage of the service as `id`: the "say" entry at the compiler.
   void stage(ZU::ZUMokutoStage stage, ZU::MKID id);
+  // The text's identifier once the service took it up, else 0.
+  ZU::MKID id() const;
   void onAction(const ZU::DirectorActionReport& report) override;
+  void onRemoteAction(const ZU::DirectorActionReport& report,
+                      const std::vector<DirectorLine>& lines) override;
   // The service's say has returned (`stopped`: the command stopped the text): the "end"
   // entry, with the summary as its result. `id` (when given) receives the text's
   // identifier, 0 when the service never took it up.
@@ -123,6 +130,7 @@ class SayTimeline : public ZU::DirectorObserver, public std::enable_shared_from_
 
   SayTimeline(std::shared_ptr<robotsim::Timeline> timeline, std::ostream* live, bool fast);
   void xOnEntry(const robotsim::TimelineEntry& entry);
+  void xAction(const ZU::DirectorActionReport& report, std::vector<std::string> failures);
   // The rest with fMutex held.
   void xOutcome(Action& action, std::vector<std::string> failures);
   void xPlayed(Play play, std::int64_t us);

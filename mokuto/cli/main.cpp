@@ -3,6 +3,7 @@
 
 #include "cli_commands.h"
 #include "cli_common.h"
+#include "cli_service.h"
 
 int main(int argc, char** argv) {
   CLI::App app{"mokuto: speech animation for a humanoid robot"};
@@ -20,6 +21,8 @@ int main(int argc, char** argv) {
   mokuto::cli::addLookupCommand(app, status);
   mokuto::cli::addConfigCommand(app, status);
   mokuto::cli::addInspectCommands(app, status);
+  mokuto::cli::addConnectOptions(app,
+                                 {"say", "methods", "tags", "animations", "diagnosis", "page"});
   try {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& e) {

@@ -17,6 +17,7 @@ int main(int argc, char** argv) {
   zefoko::addSpeakCommand(app, status);
   zefoko::addBodyTalkCommand(app, status);
   zefoko::addServeCommand(app, status);
+  zefoko::addKeysCommand(app, status);
   try {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& e) {

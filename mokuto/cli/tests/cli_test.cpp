@@ -213,6 +213,31 @@ TEST_F(MokutoCommand, AnswersEachCaseWithItsStatusAndMessage) {
       {"mokuto say --bogus Hi", 2, Stream::Err, "--bogus"},
       {"zefoko speak --bogus", 2, Stream::Err, "--bogus"},
       {"zefoko bodytalk --seconds 0", 2, Stream::Err, "0 is not a number of seconds above 0"},
+      // --connect: the robot's options belong to its process, what needs the service here
+      // and what does not use the service refuse it; the network needs keys.
+      {"mokuto --connect ipc:///nonexistent say --speech timing Hi", 2, Stream::Err,
+       "--speech belongs to the robot's process with --connect"},
+      {"mokuto --connect ipc:///nonexistent say --wav x.wav Hi", 2, Stream::Err,
+       "--wav needs the robot in this process"},
+      {"mokuto --connect ipc:///nonexistent say --dry-run Hi", 2, Stream::Err,
+       "--dry-run needs the service in this process"},
+      {"mokuto --connect ipc:///nonexistent diagnosis --posture Sitting", 2, Stream::Err,
+       "--posture belongs to the robot's process with --connect"},
+      {"mokuto --connect ipc:///nonexistent sounds", 2, Stream::Err,
+       "mokuto sounds does not use the running service"},
+      {"mokuto --connect ipc:///nonexistent parse Hi", 2, Stream::Err,
+       "mokuto parse does not use the running service"},
+      {"mokuto --connect tcp://192.0.2.1:5555 methods", 2, Stream::Err,
+       "goes through the network: it needs CURVE keys"},
+      {"mokuto --server-key /dev/null methods", 2, Stream::Err, "--server-key requires --connect"},
+      {"zefoko serve --listen tcp://0.0.0.0:0 --speech timing", 2, Stream::Err,
+       "opens the service to the network: it needs CURVE keys"},
+      {"zefoko serve --connect ipc:///nonexistent", 2, Stream::Err,
+       "--connect needs module libraries to serve"},
+      {"zefoko serve --connect ipc:///nonexistent --speech timing /dev/null", 2, Stream::Err,
+       "--speech excludes --connect"},
+      {"zefoko serve --heartbeat 5 --listen ipc:///nonexistent", 2, Stream::Err, "--heartbeat"},
+      {"zefoko serve", 2, Stream::Err, "nothing to serve"},
       // One language option: an unknown language is a usage error everywhere.
       {"mokuto say --language Klingon Hi", 2, Stream::Err, "--language: Klingon not in"},
       {"mokuto say --language fr_FR Hi", 2, Stream::Err, "--language: fr_FR not in"},
@@ -275,6 +300,8 @@ TEST_F(MokutoCommand, AnswersEachCaseWithItsStatusAndMessage) {
        {"say", "syntax", "parse", "analyse", "emotion", "lookup", "config", "methods", "tags",
         "animations", "sounds", "diagnosis", "page"})
     cases.push_back({"mokuto " + command + " --help", 0, Stream::Out, "Usage"});
+  for (const std::string command : {"speak", "bodytalk", "serve", "keys"})
+    cases.push_back({"zefoko " + command + " --help", 0, Stream::Out, "Usage"});
   for (const auto& c : cases) {
     SCOPED_TRACE(c.arguments);
     if (c.databases && !MOKUTO_HAVE_LINGDATA)
