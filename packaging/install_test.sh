@@ -122,6 +122,12 @@ expect say "\^start\(animations/Stand/Gestures/Hey_1\) +executed"
 expect say "\^runSound\(bells/ding, 50\) +executed"
 expect say "end of text 1 \(ZUMokuto/EndOfMokuto\)"
 
+# The service in mokuto's own process: its framework finds the prefix's French database.
+run say_here "$prefix/bin/mokuto" say --speech timing --fast --language French \
+  'Bonjour ^runSound(bells/ding, 50) mes amis' || { cat say_here.log >&2; fail "mokuto say failed"; }
+expect say_here "AUTO_START_TAG\(bonjour\) +executed"
+expect say_here "\^runSound\(bells/ding, 50\) +executed"
+
 run client env PYTHONPATH="$prefix/lib/python3/dist-packages" "$python" \
   hello-module/hello.py "$endpoint" Ada || { cat client.log >&2; fail "the Python client failed"; }
 expect client "^Hello, Ada!$"
