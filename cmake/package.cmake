@@ -24,6 +24,32 @@ foreach(package zefoko zefoko-dev)
   list(APPEND changelogs "${packaging}/${package}/changelog.Debian.gz")
 endforeach()
 add_custom_target(package_changelogs ALL DEPENDS ${changelogs})
+
+# The commands' manual pages, made by help2man from their --help (the package preset only:
+# the commands run during the build).
+option(MOKUTO_MAN_PAGES "Make the commands' manual pages with help2man" OFF)
+if(MOKUTO_MAN_PAGES)
+  find_program(MOKUTO_HELP2MAN help2man REQUIRED)
+  set(whatis_zefoko "the simulated robot, the host of module libraries, and its tools")
+  set(whatis_mokuto "speak annotated texts with the speech-animation service, and inspect it")
+  set(whatis_mkbdb "build a linguistic database file from plain lexicons")
+  set(manPages "")
+  foreach(command zefoko mokuto mkbdb)
+    set(page "${packaging}/man/${command}.1")
+    add_custom_command(OUTPUT "${page}.gz"
+      COMMAND ${CMAKE_COMMAND} -E make_directory "${packaging}/man"
+      COMMAND "${MOKUTO_HELP2MAN}" --no-info --no-discard-stderr
+              --version-string "${PROJECT_VERSION}" --name "${whatis_${command}}"
+              --include "${CMAKE_CURRENT_SOURCE_DIR}/packaging/man.h2m"
+              --output "${page}" "$<TARGET_FILE:${command}>"
+      COMMAND gzip -9nf "${page}"
+      DEPENDS ${command} packaging/man.h2m
+      COMMENT "Manual page of ${command}")
+    list(APPEND manPages "${page}.gz")
+  endforeach()
+  add_custom_target(man_pages ALL DEPENDS ${manPages})
+  install(FILES ${manPages} DESTINATION "${CMAKE_INSTALL_MANDIR}/man1" COMPONENT Runtime)
+endif()
 install(FILES packaging/copyright "${packaging}/zefoko/changelog.Debian.gz"
   DESTINATION "${CMAKE_INSTALL_DATADIR}/doc/zefoko" COMPONENT Runtime)
 install(FILES packaging/copyright "${packaging}/zefoko-dev/changelog.Debian.gz"
