@@ -69,7 +69,8 @@ set(CPACK_DEBIAN_PACKAGE_VERSION "${PROJECT_VERSION}")
 set(CPACK_DEBIAN_PACKAGE_RELEASE "${MOKUTO_PACKAGE_REVISION}")
 set(CPACK_DEBIAN_PACKAGE_PRIORITY optional)
 set(CPACK_DEBIAN_PACKAGE_CONTROL_STRICT_PERMISSION ON)
-# The shlibs file of the framework's libraries, for the packages built against them.
+# The shlibs file of the framework's libraries, for the packages built against them. CPack
+# warns that libzumokuto.so has no soname: a module library, loaded by path, needs none.
 set(CPACK_DEBIAN_PACKAGE_GENERATE_SHLIBS ON)
 set(CPACK_DEBIAN_PACKAGE_GENERATE_SHLIBS_POLICY ">=")
 
