@@ -61,8 +61,11 @@ traced=no
 if strace -f -qq -o /dev/null true 2>/dev/null; then
   traced=yes
 fi
-[[ "$INSTALL_TEST_HIDE" == yes || "$traced" == yes ]] ||
-  fail "neither a mount namespace (unshare) nor strace is available: the trees cannot be kept out of reach"
+if [[ "$INSTALL_TEST_HIDE" != yes && "$traced" != yes ]]; then
+  # A container without CAP_SYS_ADMIN and ptrace: the test cannot prove anything here.
+  echo "install test: skipped: neither a mount namespace (unshare) nor strace is available, so the trees cannot be kept out of reach"
+  exit 0
+fi
 
 # run NAME COMMAND...: COMMAND under strace when it works, its output in NAME.log.
 run() {
