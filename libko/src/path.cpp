@@ -1,11 +1,14 @@
 #include "ko/path.hpp"
 
+#include <dlfcn.h>
+
 #include <algorithm>
 #include <filesystem>
 #include <system_error>
 
 #include "ko/log.hpp"
 #include "ko/os.hpp"
+#include "path_roots.hpp"
 
 namespace ko::path {
 
@@ -27,22 +30,55 @@ bool isContained(const fs::path& relative) {
   }
   return true;
 }
+
+// Any object of this library: its address tells the dynamic linker's file name.
+const int kAnchor = 0;
+
+// The directory of the loaded framework library, with the build's layout; resolved once.
+const detail::Layout& layout() {
+  static const detail::Layout value = [] {
+    detail::Layout l;
+    Dl_info info{};
+    std::error_code ec;
+    if (::dladdr(&kAnchor, &info) != 0 && info.dli_fname) {
+      const fs::path library = fs::canonical(info.dli_fname, ec);
+      if (!ec)
+        l.libraryDirectory = library.parent_path();
+    }
+    // Compared as written (resolved by the build): an installed library never touches it.
+    l.buildLibraryDirectory = KO_BUILD_LIBRARY_DIR;
+    l.libraryToData = KO_LIBRARY_TO_DATA_DIR;
+    l.buildRoots = {KO_GENERATED_SHARE_DIR, KO_BUILD_SHARE_DIR};
+    return l;
+  }();
+  return value;
+}
 }  // namespace
 
-std::vector<std::string> dataRoots() {
+namespace detail {
+
+std::vector<std::string> dataRoots(const Layout& layout, const std::string& variable) {
   std::vector<std::string> roots;
-  const std::string env = os::getenv("ZEFOKO_DATA_PATH");
+  const bool buildTree =
+      !layout.libraryDirectory.empty() && layout.libraryDirectory == layout.buildLibraryDirectory;
+  if (!layout.libraryDirectory.empty() && !buildTree)
+    roots.push_back((layout.libraryDirectory / layout.libraryToData).lexically_normal().string());
   std::size_t start = 0;
-  while (start <= env.size()) {
-    const std::size_t end = std::min(env.find(':', start), env.size());
+  while (start <= variable.size()) {
+    const std::size_t end = std::min(variable.find(':', start), variable.size());
     if (end > start)
-      roots.push_back(env.substr(start, end - start));
+      roots.push_back(variable.substr(start, end - start));
     start = end + 1;
   }
-  roots.emplace_back(KO_GENERATED_SHARE_DIR);
-  roots.emplace_back(KO_BUILD_SHARE_DIR);
-  roots.emplace_back(KO_INSTALL_SHARE_DIR);
+  if (buildTree)
+    roots.insert(roots.end(), layout.buildRoots.begin(), layout.buildRoots.end());
   return roots;
+}
+
+}  // namespace detail
+
+std::vector<std::string> dataRoots() {
+  return detail::dataRoots(layout(), os::getenv("ZEFOKO_DATA_PATH"));
 }
 
 std::vector<std::string> dataDirectories(const std::string& application) {

@@ -10,6 +10,7 @@
 #include <thread>
 
 #include "ko/os.hpp"
+#include "path_roots.hpp"
 
 namespace {
 
@@ -57,9 +58,10 @@ TEST_F(FindDataTest, FirstDirectoryOfTheVariableWins) {
   EXPECT_EQ(ko::path::findData("other", "db/both.bdb"), "");
 }
 
+// The framework of the build tree: the variable's directories, then the build tree's.
 TEST_F(FindDataTest, RootsInOrderAndExistingDirectories) {
   const auto roots = ko::path::dataRoots();
-  ASSERT_EQ(roots.size(), 5u);  // the empty entry between "::" is skipped
+  ASSERT_EQ(roots.size(), 4u);  // the empty entry between "::" is skipped
   EXPECT_EQ(roots[0], first_.string());
   EXPECT_EQ(roots[1], second_.string());
   EXPECT_EQ(roots[2], KO_TEST_GENERATED_SHARE_DIR);
@@ -69,6 +71,28 @@ TEST_F(FindDataTest, RootsInOrderAndExistingDirectories) {
       ::testing::IsSupersetOf({(first_ / "zefoko").string(), (second_ / "zefoko").string()}));
   EXPECT_EQ(ko::path::dataDirectories("zefoko").front(), (first_ / "zefoko").string());
   EXPECT_TRUE(ko::path::dataDirectories("no-such-application").empty());
+}
+
+// An installed framework: its own prefix's data, then the variable's; never the build tree.
+TEST(DataRoots, InstalledOrBuildTreeByWhereTheLibraryLies) {
+  const struct {
+    const char* library;
+    const char* variable;
+    std::vector<std::string> roots;
+  } cases[] = {
+      {"/b/libko", "/x::/y", {"/x", "/y", "/b/share", "/s/share"}},
+      {"/b/libko", "", {"/b/share", "/s/share"}},
+      {"/opt/r/lib/x86_64-linux-gnu", "", {"/opt/r/share"}},
+      {"/opt/r/lib/x86_64-linux-gnu", "/x:", {"/opt/r/share", "/x"}},
+      {"/b", "/x", {"/share", "/x"}},
+      {"", "/x", {"/x"}},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(std::string(c.library) + " with " + c.variable);
+    const ko::path::detail::Layout layout{
+        c.library, "/b/libko", "../../share", {"/b/share", "/s/share"}};
+    EXPECT_EQ(ko::path::detail::dataRoots(layout, c.variable), c.roots);
+  }
 }
 
 TEST_F(FindDataTest, PathsLeavingTheDataDirectoryAreRefused) {
