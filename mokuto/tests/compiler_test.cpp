@@ -46,12 +46,16 @@ struct Compiler {
     if (!withSpeechEngine)
       robot.reset();
     auto languages = std::make_shared<ZULingLanguageMap>();
-    (*languages)["English"] = folder.database(
-        "en.bdb", "i\tpronoun/1s=i\nlike\tverb/WP=like\napples\tnoun/p\npears\tnoun/p\n"
-                  "tea\tnoun/s\nand\tconjunctive\n", 0);
-    (*languages)["EnglishEmotions"] = folder.database(
-        "emotions.bdb", "happy\tunkonwn=positive\nawful\tunkonwn=very negative\n"
-                        "not\tunkonwn=negation\n", 0);
+    (*languages)["English"] =
+        folder.database("en.bdb",
+                        "i\tpronoun/1s=i\nlike\tverb/WP=like\napples\tnoun/p\npears\tnoun/p\n"
+                        "tea\tnoun/s\nand\tconjunctive\n",
+                        0);
+    (*languages)["EnglishEmotions"] =
+        folder.database("emotions.bdb",
+                        "happy\tunkonwn=positive\nawful\tunkonwn=very negative\n"
+                        "not\tunkonwn=negation\n",
+                        0);
     compiler.emplace(tts, languages);
   }
   void setLanguage(const std::string& language) { robot->speech()->setLanguage(language); }
@@ -73,17 +77,31 @@ TEST(CompilerTask, TheLanguageDecidesThePauseRuleAndTheDatabase) {
     std::vector<std::string> actions;
   };
   const Case cases[] = {
-      {"Japanese", BODY_LANGUAGE_MODE_RANDOM, R"(\mrk=1\ \pau=300\ hai)",
-       R"(\mrk=1\ ,\pau=300\ hai)", {}},
-      {"French", BODY_LANGUAGE_MODE_RANDOM, R"(\mrk=1\ \pau=300\ hai)", R"(\mrk=1\ \pau=300\ hai)",
+      {"Japanese",
+       BODY_LANGUAGE_MODE_RANDOM,
+       R"(\mrk=1\ \pau=300\ hai)",
+       R"(\mrk=1\ ,\pau=300\ hai)",
        {}},
-      {"English", BODY_LANGUAGE_MODE_RANDOM, "Hello ^start(a) I like apples and pears",
-       R"(Hello \mrk=1\ I like apples and pears)", {"^start(a)"}},
-      {"English", BODY_LANGUAGE_MODE_CONTEXTUAL, "^stop(x) I like apples and pears ^run(y)",
+      {"French",
+       BODY_LANGUAGE_MODE_RANDOM,
+       R"(\mrk=1\ \pau=300\ hai)",
+       R"(\mrk=1\ \pau=300\ hai)",
+       {}},
+      {"English",
+       BODY_LANGUAGE_MODE_RANDOM,
+       "Hello ^start(a) I like apples and pears",
+       R"(Hello \mrk=1\ I like apples and pears)",
+       {"^start(a)"}},
+      {"English",
+       BODY_LANGUAGE_MODE_CONTEXTUAL,
+       "^stop(x) I like apples and pears ^run(y)",
        R"( \pau=500\  \mrk=1\   \mrk=3\ I  \mrk=4\ like  \mrk=5\ apples and pears  \mrkpause=2\ )",
        {"^stop(x)", "AUTO_START_TAG(i)", "AUTO_START_TAG(like)", "AUTO_START_TAG(two)", "^run(y)"}},
-      {"French", BODY_LANGUAGE_MODE_CONTEXTUAL, "^stop(y) I like tea",
-       R"( \pau=500\  \mrk=1\  I like  \mrk=2\ tea)", {"^stop(y)", "AUTO_START_TAG(drink)"}},
+      {"French",
+       BODY_LANGUAGE_MODE_CONTEXTUAL,
+       "^stop(y) I like tea",
+       R"( \pau=500\  \mrk=1\  I like  \mrk=2\ tea)",
+       {"^stop(y)", "AUTO_START_TAG(drink)"}},
   };
   Compiler c;
   MKID id = 0;
@@ -106,9 +124,12 @@ TEST(CompilerTask, TheEmotionOfARecognisedTextIsRaisedFromHalfConfidence) {
     std::optional<std::int32_t> raised;
   };
   const Case cases[] = {
-      {"English", "I am happy", 1, 0.49, std::nullopt}, {"English", "I am happy", 1, 0.5, 1},
-      {"English", "not happy", -1, 1.0, -1},            {"English", "Awful", -2, 0.7, -2},
-      {"English", "I like tea", 0, 0.9, std::nullopt},  {"French", "happy", 0, 0.9, std::nullopt},
+      {"English", "I am happy", 1, 0.49, std::nullopt},
+      {"English", "I am happy", 1, 0.5, 1},
+      {"English", "not happy", -1, 1.0, -1},
+      {"English", "Awful", -2, 0.7, -2},
+      {"English", "I like tea", 0, 0.9, std::nullopt},
+      {"French", "happy", 0, 0.9, std::nullopt},
   };
   Compiler c;
   for (const auto& k : cases) {

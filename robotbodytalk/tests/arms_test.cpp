@@ -89,9 +89,9 @@ TEST(ArmsIteration, InAnUnknownPostureTheyTakeTheLatestOnceAndOtherwiseWarn) {
       EXPECT_EQ(a.robot.behaviors->started().at(0), "a");
     } else {
       ASSERT_TRUE(waitForLines(a.log, "robotbodytalk", Warning, "", 2));
-      EXPECT_EQ(linesOf(a.log, "robotbodytalk", Warning).size(),
-                linesOf(a.log, "robotbodytalk", Warning, "Cannot move the arms in that posture")
-                    .size());
+      EXPECT_EQ(
+          linesOf(a.log, "robotbodytalk", Warning).size(),
+          linesOf(a.log, "robotbodytalk", Warning, "Cannot move the arms in that posture").size());
       EXPECT_EQ(a.robot.behaviors->log.count("startBehavior"), 0u);
     }
   }
@@ -150,8 +150,8 @@ TEST(ArmsList, ThreeEntriesPlayTheFirstAndTheThirdThenTheListIsShuffled) {
   auto again = behaviors.behaviorsOf("preloadBehavior");
   again.erase(again.begin(), again.begin() + 3);
   std::sort(again.begin(), again.end());
-  EXPECT_EQ(again, (std::vector<std::string>{std::min(order[0], order[1]),
-                                             std::max(order[0], order[1])}));
+  EXPECT_EQ(again,
+            (std::vector<std::string>{std::min(order[0], order[1]), std::max(order[0], order[1])}));
 
   a.worker.notifyBehaviorStopped(order[2]);
   ASSERT_TRUE(behaviors.log.waitFor("startBehavior", 3));
@@ -172,9 +172,9 @@ TEST(ArmsList, AnEntryThatCannotBePreloadedIsLoggedAndStillPlayedAFamilyOutsideI
 
   a.arms.setAnimations({"a"}, 7);
   EXPECT_TRUE(a.arms.getAnimations(7).empty());
-  EXPECT_EQ(linesOf(a.log, "robotbodytalk", Error, "No animation set for the posture family 7")
-                .size(),
-            1u);
+  EXPECT_EQ(
+      linesOf(a.log, "robotbodytalk", Error, "No animation set for the posture family 7").size(),
+      1u);
   EXPECT_EQ(a.robot.behaviors->behaviorsOf("preloadBehavior"), std::vector<std::string>{"x"});
 }
 

@@ -266,9 +266,9 @@ TEST(BodyTalkThread, APartWithoutPauseIteratesBackToBackInOneRun) {
   EXPECT_FALSE(part.isRunning());
   ASSERT_EQ(part.threads.size(), 4u);  // the fifth would come 1000 s later
   EXPECT_EQ(std::count(part.threads.begin(), part.threads.end(), part.threads[0]), 4);
-  EXPECT_EQ(part.events, (std::vector<std::string>{"iteration", "after", "iteration", "after",
-                                                   "iteration", "after", "iteration", "after",
-                                                   "stop"}));
+  EXPECT_EQ(part.events,
+            (std::vector<std::string>{"iteration", "after", "iteration", "after", "iteration",
+                                      "after", "iteration", "after", "stop"}));
   worker.setBodyPart(nullptr);
   EXPECT_EQ(worker.name(), "BodyTalk loop without body part set");
 }

@@ -86,7 +86,10 @@ TEST(HeadIteration, WithoutResourcesPostureOrMotionTheIterationEndsWithoutMoving
   const Case cases[] = {
       {false, ZU::Standing, false, {"areResourcesAvailable"}, nullptr},
       {true, ZU::Unknown, false, {"areResourcesAvailable"}, "Cannot move the head in that posture"},
-      {true, ZU::Sitting, true, {"areResourcesAvailable", "getAngles"},
+      {true,
+       ZU::Sitting,
+       true,
+       {"areResourcesAvailable", "getAngles"},
        "ZUMotion exception: \tZUMotion::getAngles\n\tjoints unplugged"},
   };
   for (const Case& c : cases) {

@@ -16,8 +16,12 @@ using ZU::ZURobotBodyTalkPosture;
 
 TEST(PostureWatcher, InitSubscribesTheModuleAndTakesTheFamilyByExactName) {
   const std::vector<std::pair<const char*, ZU::PostureFamily>> cases = {
-      {"Standing", ZU::Standing}, {"Sitting", ZU::Sitting}, {"SittingOnChair", ZU::SittingOnChair},
-      {"standing", ZU::Unknown},  {"Crouching", ZU::Unknown}, {"", ZU::Unknown}};
+      {"Standing", ZU::Standing},
+      {"Sitting", ZU::Sitting},
+      {"SittingOnChair", ZU::SittingOnChair},
+      {"standing", ZU::Unknown},
+      {"Crouching", ZU::Unknown},
+      {"", ZU::Unknown}};
   for (const auto& [name, family] : cases) {
     SCOPED_TRACE(name);
     FakeRobot robot;
@@ -30,9 +34,9 @@ TEST(PostureWatcher, InitSubscribesTheModuleAndTakesTheFamilyByExactName) {
     const auto calls = robot.memory->log.calls();
     ASSERT_EQ(calls.size(), 2u);
     EXPECT_EQ(calls[0].method, "subscribeToEvent");
-    EXPECT_EQ(ZU::ZUValue::makeArray({calls[0].args[0], calls[0].args[1], calls[0].args[2]})
-                  .toString(),
-              R"(["PostureFamilyChanged", "ZUMokuto", "_postureFamilyChangedCallback"])");
+    EXPECT_EQ(
+        ZU::ZUValue::makeArray({calls[0].args[0], calls[0].args[1], calls[0].args[2]}).toString(),
+        R"(["PostureFamilyChanged", "ZUMokuto", "_postureFamilyChangedCallback"])");
     EXPECT_EQ(calls[1].method, "unsubscribeToEvent");
     EXPECT_EQ(ZU::ZUValue::makeArray({calls[1].args[0], calls[1].args[1]}).toString(),
               R"(["PostureFamilyChanged", "ZUMokuto"])");

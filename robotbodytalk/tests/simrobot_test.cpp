@@ -59,8 +59,7 @@ TEST(SimulatedRobot, TheSpeakingBodyTalkMovesTheHeadAndPlaysArmAnimationsInTurn)
     if (entry.operation == "angleInterpolationBezier") {
       // [names, duration, times, keys, start angles]: the last key is the start angle.
       const auto& keys = plain(at(entry.arguments, 3).asList().at(0)).asList();
-      EXPECT_NEAR(at(keys.back(), 0).to<double>(), at(at(entry.arguments, 4), 0).to<double>(),
-                  1e-6)
+      EXPECT_NEAR(at(keys.back(), 0).to<double>(), at(at(entry.arguments, 4), 0).to<double>(), 1e-6)
           << entry;
       ++moves;
     } else if (entry.operation == "startBehavior") {
