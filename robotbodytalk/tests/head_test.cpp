@@ -42,6 +42,36 @@ struct Head {
   ZU::ZURobotBodyTalkHeadSpeaking head;
 };
 
+// The rules every move of the three tables keeps: one joint, rising key times, handles of
+// type 3 at a third of the time to the key before and after (rounded; the last after-handle
+// 0), no change of angle in a handle, and a last key at the start angle.
+TEST(HeadTables, EveryMoveEndsWhereItBeganWithHandlesAtThirds) {
+  for (auto table : {ZU::ZURobotBodyTalkHeadSpeaking::makeMoves(),
+                     ZU::ZURobotBodyTalkHeadListening::makeMoves(1),
+                     ZU::ZURobotBodyTalkHeadListening::makeMoves(0)}) {
+    for (const auto& move : table) {
+      SCOPED_TRACE(move.times.toString());
+      ASSERT_EQ(move.names.arraySize(), 1);
+      const ZUValue& times = move.times[0];
+      const ZUValue& keys = move.keys[0];
+      ASSERT_EQ(keys.arraySize(), times.arraySize());
+      for (int k = 0; k < keys.arraySize(); ++k) {
+        const bool last = k + 1 == keys.arraySize();
+        const double before = times[k].asFloat() - (k == 0 ? 0.0 : times[k - 1].asFloat());
+        const double after = last ? 0.0 : times[k + 1].asFloat() - times[k].asFloat();
+        EXPECT_GT(before, 0.0);
+        EXPECT_NEAR(keys[k][1][1].asFloat(), -before / 3, 1e-4);
+        EXPECT_NEAR(keys[k][2][1].asFloat(), after / 3, 1e-4);
+        for (const int h : {1, 2}) {
+          EXPECT_EQ(keys[k][h][0].toString(), "3");
+          EXPECT_EQ(keys[k][h][2].asFloat(), 0.0);
+        }
+      }
+      EXPECT_EQ(keys[keys.arraySize() - 1][0].asFloat(), 0.0);
+    }
+  }
+}
+
 TEST(HeadIteration, AJointAtPointThreeGoesThroughTheKeysAndIsSetBack) {
   Head h(1.0);
   h.robot.motion->angle = 0.3f;
