@@ -353,7 +353,7 @@ TEST_F(AnalysisTest, ActionsFollowTheirBookmarksAfterInsertion) {
   EXPECT_EQ(job->actions[1]->text, "AUTO_START_TAG(three)");
 }
 
-TEST_F(AnalysisTest, ThePauseBeforeSpeechComesOncePerTextId) {
+TEST_F(AnalysisTest, ThePauseBeforeSpeechComesOncePerTextIdInContextualModeAlone) {
   config_.msPauseBeforeSpeech = 500;
   EXPECT_EQ(compile("tea", "English", 7)->text, " \\pau=500\\ tea");
   EXPECT_EQ(compile("tea", "English", 7)->text, "tea");
@@ -362,6 +362,13 @@ TEST_F(AnalysisTest, ThePauseBeforeSpeechComesOncePerTextId) {
   EXPECT_EQ(compile("tea", "English", 9)->text, "tea");
   config_.msPauseBeforeSpeech = 500;
   EXPECT_EQ(compile("tea", "English", 9)->text, " \\pau=500\\ tea");
+  // Only contextual mode tags; Japanese keeps its comma.
+  config_.bodyLanguageMode = BODY_LANGUAGE_MODE_RANDOM;
+  EXPECT_EQ(compile("apples and pears", "English", 9)->text, "apples and pears");
+  config_.bodyLanguageMode = BODY_LANGUAGE_MODE_CONTEXTUAL;
+  config_.msPauseBeforeSpeech = 0;
+  EXPECT_EQ(compile("\\mrk=1\\ \\pau=300\\", "Japanese")->text, " \\mrk=1\\  , \\pau=300\\ ");
+  EXPECT_EQ(compile("\\mrk=1\\ \\pau=300\\", "English")->text, " \\mrk=1\\   \\pau=300\\ ");
 }
 
 TEST_F(AnalysisTest, ConfigurationWordsChooseAmongTheirTags) {
@@ -379,16 +386,6 @@ TEST_F(AnalysisTest, ConfigurationWordsChooseAmongTheirTags) {
   EXPECT_THAT(autoTags(*compile("I like tea and pears", "Klingon")), ::testing::ElementsAre("two"));
   config_.wordsToTags["i"] = {"me"};
   EXPECT_THAT(autoTags(*compile("I like coffee", "Klingon")), ::testing::ElementsAre("me"));
-}
-
-TEST_F(AnalysisTest, OnlyContextualModeTagsAndJapaneseKeepsItsComma) {
-  config_.bodyLanguageMode = BODY_LANGUAGE_MODE_RANDOM;
-  const auto random = compile("apples and pears");
-  EXPECT_TRUE(random->actions.empty());
-  EXPECT_EQ(random->text, "apples and pears");
-  config_.bodyLanguageMode = BODY_LANGUAGE_MODE_CONTEXTUAL;
-  EXPECT_EQ(compile("\\mrk=1\\ \\pau=300\\", "Japanese")->text, " \\mrk=1\\  , \\pau=300\\ ");
-  EXPECT_EQ(compile("\\mrk=1\\ \\pau=300\\", "English")->text, " \\mrk=1\\   \\pau=300\\ ");
 }
 
 TEST_F(AnalysisTest, EmotionFollowsItsLabels) {

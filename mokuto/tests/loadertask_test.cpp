@@ -172,7 +172,10 @@ class LoaderOnRobot : public testing::Test {
   std::shared_ptr<LoaderTask> loader;
 };
 
+// Each package's posture folders under their tags; the body talk folder of "animations/"
+// alone handed to the body talk; a rebuild forgets what was uninstalled.
 TEST_F(LoaderOnRobot, IndexesThePackagesPostureFoldersUnderTheirTags) {
+  ZU::ZURobotBodyTalk& talk = *bodyTalk->bodyTalk;
   loader->updateRepresentations("animations/");
   EXPECT_EQ(loader->getInstalledTags(ZU::Standing), (TagMap{{"hello", {kHeyStand, kHey2Stand}},
                                                             {"hey", {kHeyStand}},
@@ -181,7 +184,6 @@ TEST_F(LoaderOnRobot, IndexesThePackagesPostureFoldersUnderTheirTags) {
   EXPECT_EQ(loader->getInstalledTags(ZU::Sitting), (TagMap{{"hello", {kHeySit}}}));
   EXPECT_EQ(loader->getInstalledTags(ZU::SittingOnChair), (TagMap{{"yes", {kYesChair}}}));
   EXPECT_THAT(loader->getInstalledTags(ZU::Unknown), IsEmpty());
-
   TagMap merged{{"stale", {"x"}}};
   loader->getMergedTags(merged);
   EXPECT_EQ(merged, (TagMap{{"hello", {kHeyStand, kHey2Stand, kHeySit}},
@@ -189,30 +191,18 @@ TEST_F(LoaderOnRobot, IndexesThePackagesPostureFoldersUnderTheirTags) {
                             {"thinking", {kThinking}},
                             {"wave", {kWave}},
                             {"yes", {kYesChair}}}));
-}
-
-TEST_F(LoaderOnRobot, HandsOnlyTheBodyTalkFolderOfAnimationsToTheBodyTalk) {
-  ZU::ZURobotBodyTalk& talk = *bodyTalk->bodyTalk;
-  loader->updateRepresentations("animations/");
   EXPECT_THAT(talk.getSpeakingAnimations(ZU::Standing), ElementsAre(kSpeaking));
   EXPECT_THAT(talk.getListeningAnimations(ZU::Standing), ElementsAre(kListening));
   EXPECT_THAT(talk.getSpeakingAnimations(ZU::Sitting), ElementsAre(kSpeakingSit));
   EXPECT_THAT(talk.getListeningAnimations(ZU::Sitting), IsEmpty());
   EXPECT_THAT(talk.getSpeakingAnimations(ZU::SittingOnChair), IsEmpty());
 
-  // Another package's body talk folder is indexed under its tags only.
   loader->updateRepresentations("extra/");
   EXPECT_EQ(loader->getInstalledTags(ZU::Standing).at("extra"), Paths{kExtraSpeaking});
   EXPECT_THAT(talk.getSpeakingAnimations(ZU::Standing), ElementsAre(kSpeaking));
-  EXPECT_THAT(talk.getListeningAnimations(ZU::Standing), ElementsAre(kListening));
-}
 
-TEST_F(LoaderOnRobot, ARebuildForgetsAnUninstalledBehaviourAndTheTagsOnlyItCarried) {
-  loader->updateRepresentations("extra/");
-  loader->updateRepresentations("animations/");
   ASSERT_TRUE(service("ZUBehaviorManager")->call<bool>("removeBehavior", std::string(kHeyStand)));
   loader->updateRepresentations("animations/");
-
   const TagMap standing = loader->getInstalledTags(ZU::Standing);
   EXPECT_EQ(standing.count("hey"), 0u);
   EXPECT_EQ(standing.at("hello"), Paths{kHey2Stand});

@@ -95,9 +95,7 @@ TEST(EnumNamesTest, LookupsMatchTheFirstThreeNamesExactly) {
       {"Sit", 3},      {"", 3}};
   for (const auto& [name, family] : families)
     EXPECT_EQ(ZU::postureFamilyFromStr(name), family) << name;
-}
-
-TEST(EnumNamesTest, NamesOfValuesOutsideTheTableAreTheLastName) {
+  // The names of values outside the table are the last name.
   EXPECT_STREQ(ZU::bodyLanguageModeToStr(ZU::BODY_LANGUAGE_MODE_RANDOM), "random");
   EXPECT_STREQ(ZU::postureFamilyToStr(ZU::SittingOnChair), "SittingOnChair");
   for (std::int32_t out : {3, 4, -1, std::numeric_limits<std::int32_t>::min(),
@@ -222,10 +220,7 @@ TEST(MokutoConfigFromZUValueTest, MalformedValuesAndElementsAreSkippedSilently) 
 
   expectDefaults(c);
   EXPECT_EQ(cap->count(), 0u);
-}
-
-TEST(MokutoConfigFromZUValueTest, JsonObjectArrivesAsPairs) {
-  MokutoConfig c;
+  // A JSON object arrives as pairs.
   c.fromZUValue(json(R"({"msPauseBeforeSpeech": 0, "bodyLanguageMode": "random"})"));
   EXPECT_EQ(c.msPauseBeforeSpeech, 0);
   EXPECT_EQ(c.bodyLanguageMode, ZU::BODY_LANGUAGE_MODE_RANDOM);
