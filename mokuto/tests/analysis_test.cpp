@@ -5,16 +5,15 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <atomic>
+#include <array>
 #include <filesystem>
-#include <fstream>
 #include <random>
 #include <set>
-#include <sstream>
 #include <string>
 #include <vector>
 
 #include "ko/path.hpp"
+#include "lingtest.h"
 #include "mkbdb/writer.h"
 #include "mokuto/zulingsyntacticanalyzer.h"
 #include "mokuto/zulingsyntacticanalyzertagger.h"
@@ -86,31 +85,14 @@ constexpr const char* kEmotions =
 class AnalysisTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    static std::atomic<int> counter{0};
-    dir_ = fs::temp_directory_path() /
-           ("analysis-" + std::to_string(::getpid()) + "-" + std::to_string(counter++));
-    fs::create_directories(dir_);
     auto languages = std::make_shared<ZULingLanguageMap>();
-    (*languages)["English"] = write("en.bdb", kEnglish, 1);
-    (*languages)["Unspaced"] = write("en0.bdb", kEnglish, 0);
-    (*languages)["Japanese"] = write("ja.bdb", kJapanese, 0);
-    (*languages)["EnglishEmotions"] = write("emotions.bdb", kEmotions, 1);
+    (*languages)["English"] = folder_.database("en.bdb", kEnglish, 1);
+    (*languages)["Unspaced"] = folder_.database("en0.bdb", kEnglish, 0);
+    (*languages)["Japanese"] = folder_.database("ja.bdb", kJapanese, 0);
+    (*languages)["EnglishEmotions"] = folder_.database("emotions.bdb", kEmotions, 1);
     languages_ = languages;
     config_.msPauseBeforeSpeech = 0;
     tagging_ = std::make_unique<ZULingAutomaticTagging>(languages_);
-  }
-  void TearDown() override { fs::remove_all(dir_); }
-
-  std::string write(const std::string& name, const std::string& lexiconText, std::uint8_t flag) {
-    mkbdb::Lexicon lexicon;
-    std::istringstream in(lexiconText);
-    mkbdb::readLexicon(in, name, lexicon);
-    mkbdb::Options options;
-    options.flag = flag;
-    mkbdb::Report report;
-    const std::string path = (dir_ / name).string();
-    std::ofstream(path, std::ios::binary) << mkbdb::build(lexicon, options, report);
-    return path;
   }
 
   ZULingSyntacticAnalysis analyse(const std::string& text,
@@ -138,7 +120,7 @@ class AnalysisTest : public ::testing::Test {
     return tags;
   }
 
-  fs::path dir_;
+  lingtest::Folder folder_;
   std::shared_ptr<const ZULingLanguageMap> languages_;
   MokutoConfig config_;
   std::unique_ptr<ZULingAutomaticTagging> tagging_;
@@ -163,86 +145,41 @@ std::string describe(const ZULingSyntacticAnalysis& analysis) {
   return out;
 }
 
+// The chunks of an analysis, "|" between them; with their class after a ":" if asked.
+std::string cut(const ZULingSyntacticAnalysis& analysis, bool withClasses = false) {
+  std::string out;
+  for (const auto& chunk : analysis.chunks) {
+    out += (out.empty() ? "" : "|") + chunk.text;
+    if (withClasses)
+      out += ":" + std::to_string(chunk.wordClass());
+  }
+  return out;
+}
+
 TEST_F(AnalysisTest, TheTokeniserCutsTagsSpacesLinksPunctuationAndWords) {
-  using Chunks = std::vector<std::pair<std::string, ZULingWordClass>>;
-  struct Case {
-    std::string language;
-    std::string text;
-    Chunks chunks;
-  };
-  const std::vector<Case> cases = {
-      {"English",
-       "Hello \\mrk=1\\ the\\pau=300\\",
-       {{"Hello", 10}, {" ", 1}, {" \\mrk=1\\ ", 0}, {" ", 1}, {"the", 9}, {" \\pau=300\\ ", 0}}},
+  const std::vector<std::array<std::string, 3>> cases = {
+      {"English", "Hello \\mrk=1\\ the\\pau=300\\",
+       "Hello:10| :1| \\mrk=1\\ :0| :1|the:9| \\pau=300\\ :0"},
       // A backslash before a space, or never closed, is no tag.
-      {"English",
-       "a \\ b \\mrk=1",
-       {{"a", 4},
-        {" ", 1},
-        {"\\", 3},
-        {" ", 1},
-        {"b", 4},
-        {" ", 1},
-        {"\\", 3},
-        {"mrk", 4},
-        {"=", 3},
-        {"1", 4}}},
+      {"English", "a \\ b \\mrk=1", "a:4| :1|\\:3| :1|b:4| :1|\\:3|mrk:4|=:3|1:4"},
       // Stored words with links, elisions, a written word longer than a stored prefix.
-      {"English",
-       "don't aujourd'hui peut-être l'homme theme",
-       {{"don't", 15},
-        {" ", 1},
-        {"aujourd'hui", 6},
-        {" ", 1},
-        {"peut-être", 6},
-        {" ", 1},
-        {"l", 9},
-        {"'", 2},
-        {"homme", 11},
-        {" ", 1},
-        {"theme", 4}}},
-      {"English",
-       "pear-shaped n'a",
-       {{"pear", 4}, {"-", 2}, {"shaped", 4}, {" ", 1}, {"n", 6}, {"'", 2}, {"a", 4}}},
+      {"English", "don't aujourd'hui peut-être l'homme theme",
+       "don't:15| :1|aujourd'hui:6| :1|peut-être:6| :1|l:9|':2|homme:11| :1|theme:4"},
+      {"English", "pear-shaped n'a", "pear:4|-:2|shaped:4| :1|n:6|':2|a:4"},
       // The digit rule and repeated marks.
-      {"English",
-       "1 000,50 or 3.5!!! (2)",
-       {{"1 000,50", 4},
-        {" ", 1},
-        {"or", 7},
-        {" ", 1},
-        {"3.5", 4},
-        {"!!!", 3},
-        {" ", 1},
-        {"(", 3},
-        {"2", 4},
-        {")", 3}}},
+      {"English", "1 000,50 or 3.5!!! (2)", "1 000,50:4| :1|or:7| :1|3.5:4|!!!:3| :1|(:3|2:4|):3"},
       // Capitals: a known word keeps its class first, an unknown one is a proper noun.
-      {"English", "The Paris", {{"The", 9}, {" ", 1}, {"Paris", 17}}},
+      {"English", "The Paris", "The:9| :1|Paris:17"},
       // Unspaced: the longest stored word wherever it ends; unknown runs of katakana or
       // latin letters stay whole, other unknown characters go one by one.
-      {"Japanese",
-       "りんごとメロンが好き。Melon犬",
-       {{"りんご", 11},
-        {"と", 12},
-        {"メロン", 4},
-        {"が", 12},
-        {"好き", 5},
-        {"。", 3},
-        {"Melon", 17},
-        {"犬", 4}}},
-      {"Unspaced", "ithe theme", {{"i", 13}, {"the", 9}, {" ", 1}, {"the", 9}, {"me", 4}}},
+      {"Japanese", "りんごとメロンが好き。Melon犬",
+       "りんご:11|と:12|メロン:4|が:12|好き:5|。:3|Melon:17|犬:4"},
+      {"Unspaced", "ithe theme", "i:13|the:9| :1|the:9|me:4"},
       // Without a database every word is unknown.
-      {"Klingon", "Hello world", {{"Hello", 17}, {" ", 1}, {"world", 4}}},
+      {"Klingon", "Hello world", "Hello:17| :1|world:4"},
   };
-  for (const Case& c : cases) {
-    SCOPED_TRACE(c.language + ": " + c.text);
-    const ZULingSyntacticAnalysis analysis = analyse(c.text, c.language);
-    Chunks chunks;
-    for (const auto& chunk : analysis.chunks)
-      chunks.emplace_back(chunk.text, chunk.wordClass());
-    EXPECT_EQ(chunks, c.chunks);
-  }
+  for (const auto& [language, text, chunks] : cases)
+    EXPECT_EQ(cut(analyse(text, language), true), chunks) << language << ": " << text;
   // A proper noun is appended to a known word's classes.
   const auto the = analyse("The").chunks.at(0).classes;
   EXPECT_EQ(the, (std::vector<ZULingClassFeatures>{{WORD_CLASS_DETERMINANT, ""},
@@ -416,7 +353,7 @@ TEST_F(AnalysisTest, ActionsFollowTheirBookmarksAfterInsertion) {
   EXPECT_EQ(job->actions[1]->text, "AUTO_START_TAG(three)");
 }
 
-TEST_F(AnalysisTest, ThePauseBeforeSpeechComesOncePerTextId) {
+TEST_F(AnalysisTest, ThePauseBeforeSpeechComesOncePerTextIdInContextualModeAlone) {
   config_.msPauseBeforeSpeech = 500;
   EXPECT_EQ(compile("tea", "English", 7)->text, " \\pau=500\\ tea");
   EXPECT_EQ(compile("tea", "English", 7)->text, "tea");
@@ -425,6 +362,13 @@ TEST_F(AnalysisTest, ThePauseBeforeSpeechComesOncePerTextId) {
   EXPECT_EQ(compile("tea", "English", 9)->text, "tea");
   config_.msPauseBeforeSpeech = 500;
   EXPECT_EQ(compile("tea", "English", 9)->text, " \\pau=500\\ tea");
+  // Only contextual mode tags; Japanese keeps its comma.
+  config_.bodyLanguageMode = BODY_LANGUAGE_MODE_RANDOM;
+  EXPECT_EQ(compile("apples and pears", "English", 9)->text, "apples and pears");
+  config_.bodyLanguageMode = BODY_LANGUAGE_MODE_CONTEXTUAL;
+  config_.msPauseBeforeSpeech = 0;
+  EXPECT_EQ(compile("\\mrk=1\\ \\pau=300\\", "Japanese")->text, " \\mrk=1\\  , \\pau=300\\ ");
+  EXPECT_EQ(compile("\\mrk=1\\ \\pau=300\\", "English")->text, " \\mrk=1\\   \\pau=300\\ ");
 }
 
 TEST_F(AnalysisTest, ConfigurationWordsChooseAmongTheirTags) {
@@ -442,16 +386,6 @@ TEST_F(AnalysisTest, ConfigurationWordsChooseAmongTheirTags) {
   EXPECT_THAT(autoTags(*compile("I like tea and pears", "Klingon")), ::testing::ElementsAre("two"));
   config_.wordsToTags["i"] = {"me"};
   EXPECT_THAT(autoTags(*compile("I like coffee", "Klingon")), ::testing::ElementsAre("me"));
-}
-
-TEST_F(AnalysisTest, OnlyContextualModeTagsAndJapaneseKeepsItsComma) {
-  config_.bodyLanguageMode = BODY_LANGUAGE_MODE_RANDOM;
-  const auto random = compile("apples and pears");
-  EXPECT_TRUE(random->actions.empty());
-  EXPECT_EQ(random->text, "apples and pears");
-  config_.bodyLanguageMode = BODY_LANGUAGE_MODE_CONTEXTUAL;
-  EXPECT_EQ(compile("\\mrk=1\\ \\pau=300\\", "Japanese")->text, " \\mrk=1\\  , \\pau=300\\ ");
-  EXPECT_EQ(compile("\\mrk=1\\ \\pau=300\\", "English")->text, " \\mrk=1\\   \\pau=300\\ ");
 }
 
 TEST_F(AnalysisTest, EmotionFollowsItsLabels) {
@@ -549,19 +483,6 @@ TEST_F(RealDatabases, TheLibrarysWordTagsAreBaseForms) {
   }
 }
 
-}  // namespace
-
-namespace {
-
-std::string cut(ZULingSyntacticAnalyzer& analyzer, const std::string& text) {
-  std::string out;
-  for (const auto& chunk : analyzer.analyse(text).chunks)
-    out += (out.empty() ? "" : "|") + chunk.text;
-  return out;
-}
-
-}  // namespace
-
 // The data of the databases: words with their cut, base form or emotion label.
 TEST_F(RealDatabases, WordsGetTheirCutBaseFormAndLabel) {
   ZULingSyntacticAnalyzer japanese(languages_);
@@ -575,7 +496,7 @@ TEST_F(RealDatabases, WordsGetTheirCutBaseFormAndLabel) {
            {"ファイルシステム", "ファイルシステム"},
            {"楽しいですね", "楽しい|です|ね"},
        })
-    EXPECT_EQ(cut(japanese, text), expected) << text;
+    EXPECT_EQ(cut(japanese.analyse(text)), expected) << text;
 
   // The base form of each word's first record; "" for none.
   struct BaseForm {
@@ -706,3 +627,5 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
     tags.push_back(static_cast<const MKAnimationAction&>(*action).tag);
   EXPECT_THAT(tags, ::testing::Contains("no"));
 }
+
+}  // namespace

@@ -3,21 +3,18 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <atomic>
 #include <cstdint>
-#include <filesystem>
-#include <fstream>
 #include <sstream>
 #include <string>
 #include <vector>
 
 #include "ko/log.hpp"
+#include "lingtest.h"
 #include "mkbdb/writer.h"
 #include "mokuto/zulingsyntacticanalyzerbinarydatabase.h"
 
 namespace {
 
-namespace fs = std::filesystem;
 using ZU::ZULingClassFeatures;
 using ZU::ZULingSyntacticAnalyzerBinaryDatabase;
 
@@ -36,14 +33,7 @@ constexpr const char* kLexicon =
     "zut\tinterjection\n"
     "et\tconjunctive=et\n";
 
-std::string buildBytes(const std::string& text, const mkbdb::Options& options = {},
-                       mkbdb::Report* report = nullptr) {
-  mkbdb::Lexicon lexicon;
-  std::istringstream in(text);
-  mkbdb::readLexicon(in, "test", lexicon);
-  mkbdb::Report local;
-  return mkbdb::build(lexicon, options, report ? *report : local);
-}
+using lingtest::build;
 
 void put32(std::string& bytes, std::size_t at, std::uint32_t value) {
   for (int i = 0; i < 4; ++i)
@@ -52,26 +42,15 @@ void put32(std::string& bytes, std::size_t at, std::uint32_t value) {
 
 class LingDatabaseTest : public ::testing::Test {
  protected:
-  void SetUp() override {
-    static std::atomic<int> counter{0};
-    dir_ = fs::temp_directory_path() /
-           ("lingdb-" + std::to_string(::getpid()) + "-" + std::to_string(counter++));
-    fs::create_directories(dir_);
-  }
-  void TearDown() override { fs::remove_all(dir_); }
-
   std::string write(const std::string& name, const std::string& bytes) {
-    const std::string path = (dir_ / name).string();
-    std::ofstream(path, std::ios::binary | std::ios::trunc) << bytes;
-    return path;
+    return folder_.write(name, bytes);
   }
-
-  fs::path dir_;
+  lingtest::Folder folder_;
 };
 
 TEST_F(LingDatabaseTest, EveryWordGivesItsRecordsAndBaseForms) {
   ZULingSyntacticAnalyzerBinaryDatabase db;
-  ASSERT_TRUE(db.load(write("fr.bdb", buildBytes(kLexicon))));
+  ASSERT_TRUE(db.load(write("fr.bdb", build(kLexicon))));
   struct Case {
     std::string word;
     std::vector<ZULingClassFeatures> classes;
@@ -117,11 +96,16 @@ TEST_F(LingDatabaseTest, EveryWordGivesItsRecordsAndBaseForms) {
   }
   EXPECT_EQ(db.flag, 1);
   EXPECT_STREQ(ZU::lingWordClassToStr(db.wordClasses("chien")[0].wordClass), "unkonwn");
+  // No base form below the class of links.
+  std::string lemma;
+  EXPECT_FALSE(db.lemma("chat", ZU::WORD_CLASS_BOOKMARK, lemma));
+  EXPECT_FALSE(db.lemma("chat", ZU::WORD_CLASS_INTERSPACE, lemma));
+  EXPECT_TRUE(db.lemma("chat", ZU::WORD_CLASS_LINK_BETWEEN_WORDS, lemma));
 }
 
 TEST_F(LingDatabaseTest, FindGivesTheLongestStoredPrefix) {
   ZULingSyntacticAnalyzerBinaryDatabase db;
-  ASSERT_TRUE(db.load(write("fr.bdb", buildBytes(kLexicon))));
+  ASSERT_TRUE(db.load(write("fr.bdb", build(kLexicon))));
   struct Case {
     std::string key;
     std::size_t start;
@@ -142,20 +126,9 @@ TEST_F(LingDatabaseTest, FindGivesTheLongestStoredPrefix) {
   }
 }
 
-TEST_F(LingDatabaseTest, LemmaIsFalseBelowClassTwo) {
-  ZULingSyntacticAnalyzerBinaryDatabase db;
-  ASSERT_TRUE(db.load(write("fr.bdb", buildBytes(kLexicon))));
-  std::string lemma;
-  EXPECT_FALSE(db.lemma("chat", ZU::WORD_CLASS_BOOKMARK, lemma));
-  EXPECT_FALSE(db.lemma("chat", ZU::WORD_CLASS_INTERSPACE, lemma));
-  EXPECT_TRUE(db.lemma("chat", ZU::WORD_CLASS_LINK_BETWEEN_WORDS, lemma));
-  EXPECT_EQ(lemma, "");
-  EXPECT_FALSE(db.lemma("chien", ZU::WORD_CLASS_NOUN, lemma));
-}
-
 // The layout of a one-word file, byte for byte: base form, record, root, child.
 TEST_F(LingDatabaseTest, WriterLaysOutTheFormat) {
-  const std::string bytes = buildBytes("ab\tnoun/x=ab\n");
+  const std::string bytes = build("ab\tnoun/x=ab\n");
   const std::string expected(
       "\x02\0\0\0"
       "\x01\0\0\0"
@@ -183,7 +156,7 @@ TEST_F(LingDatabaseTest, WriterLaysOutTheFormat) {
 }
 
 TEST_F(LingDatabaseTest, DamagedFilesAreRefusedOrAnswerNotFound) {
-  const std::string good = buildBytes("ab\tnoun/x=ab\n");
+  const std::string good = build("ab\tnoun/x=ab\n");
   constexpr std::size_t kBody = ZULingSyntacticAnalyzerBinaryDatabase::kBodyStart;
   struct Case {
     const char* name;
@@ -238,7 +211,7 @@ TEST_F(LingDatabaseTest, DamagedFilesAreRefusedOrAnswerNotFound) {
 }
 
 TEST_F(LingDatabaseTest, TruncatedAndOutOfDateFilesAreRefused) {
-  const std::string good = buildBytes(kLexicon);
+  const std::string good = build(kLexicon);
   ZULingSyntacticAnalyzerBinaryDatabase db;
   for (std::size_t length = 0; length < good.size(); ++length) {
     ko::log::ScopedCapture capture(ko::log::Warning);
@@ -255,7 +228,7 @@ TEST_F(LingDatabaseTest, TruncatedAndOutOfDateFilesAreRefused) {
   EXPECT_TRUE(capture->contains(
       kCategory, ko::log::Warning,
       "Linguistic database \"" + path + "\" is out of date. So, the database is not loaded."));
-  const std::string missing = (dir_ / "missing.bdb").string();
+  const std::string missing = (folder_.dir / "missing.bdb").string();
   EXPECT_FALSE(db.load(missing));
   EXPECT_TRUE(capture->contains(kCategory, ko::log::Warning,
                                 "Linguistic database \"" + missing + "\" not found."));
@@ -264,7 +237,7 @@ TEST_F(LingDatabaseTest, TruncatedAndOutOfDateFilesAreRefused) {
 // Any byte changed anywhere: the file is refused, or every lookup stays inside the body
 // and keeps find's promises (the sanitizer builds check the reads).
 TEST_F(LingDatabaseTest, EveryChangedByteIsSafe) {
-  const std::string good = buildBytes(kLexicon);
+  const std::string good = build(kLexicon);
   const std::vector<std::string> keys = {"chat", "chats", "chatons", "château", "mange", "été",
                                          "a",    "0",     "zut",     "et",      "c",     "\xC3"};
   ko::log::ScopedCapture capture(ko::log::Warning);
@@ -300,7 +273,7 @@ TEST_F(LingDatabaseTest, BaseFormsKeptByTagThenFrequency) {
   options.tags = {"word10000-base"};  // the least frequent
   mkbdb::Report report;
   ZULingSyntacticAnalyzerBinaryDatabase db;
-  ASSERT_TRUE(db.load(write("big.bdb", buildBytes(text, options, &report))));
+  ASSERT_TRUE(db.load(write("big.bdb", build(text, options, &report))));
   EXPECT_EQ(report.baseForms, 8000u);
   EXPECT_LT(report.baseFormsKept, 8000u);
   EXPECT_LE(report.baseFormBytes, 65536u);
@@ -333,8 +306,8 @@ TEST(LingLexiconTest, MalformedLinesAreRefusedWithTheirLine) {
 }
 
 TEST_F(LingDatabaseTest, SetLanguageSharesReloadsAndDrops) {
-  const std::string french = write("french.bdb", buildBytes(kLexicon));
-  const std::string missing = (dir_ / "nothing.bdb").string();
+  const std::string french = write("french.bdb", build(kLexicon));
+  const std::string missing = (folder_.dir / "nothing.bdb").string();
   auto languages = std::make_shared<const ZU::ZULingLanguageMap>(
       ZU::ZULingLanguageMap{{"French", french}, {"fr_FR", french}, {"Missing", missing}});
   ZU::ZULingDatabaseUser analyzer(languages);
@@ -347,7 +320,7 @@ TEST_F(LingDatabaseTest, SetLanguageSharesReloadsAndDrops) {
   EXPECT_EQ(analyzer.databasePath(), french);
 
   // Were the file read again now, it would be refused.
-  std::string old = buildBytes(kLexicon);
+  std::string old = build(kLexicon);
   old[0] = 1;
   write("french.bdb", old);
   analyzer.setLanguage("fr_FR");

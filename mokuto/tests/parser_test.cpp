@@ -24,13 +24,29 @@ std::shared_ptr<MKTaskInstruction> parse(const std::string& text, bool japanese 
   return job;
 }
 
-template <class Record>
-const Record& actionAs(const MKTaskInstruction& job, std::size_t index) {
-  const auto* record = dynamic_cast<const Record*>(job.actions.at(index).get());
-  if (record == nullptr) {
-    throw std::logic_error("action of another class");
+// An action as the parser leaves it; `fields`, when given, is what fieldsOf shows.
+struct ExpectedAction {
+  MKTaskActionType type;
+  std::uint32_t id;
+  std::string text;
+  std::string fields = "";
+};
+
+// The fields of an action's record, "|" between them.
+std::string fieldsOf(const MKTaskAction& action) {
+  std::ostringstream out;
+  if (const auto* a = dynamic_cast<const MKAnimationAction*>(&action)) {
+    out << a->animation << '|' << a->tag;
+  } else if (const auto* s = dynamic_cast<const MKSoundAction*>(&action)) {
+    out << s->soundSet << '|' << s->soundName << '|' << s->volume;
+  } else if (const auto* c = dynamic_cast<const MKCallAction*>(&action)) {
+    out << c->module << '|' << c->method << '|' << c->arguments << '|' << (c->proxy != nullptr);
+  } else if (const auto* m = dynamic_cast<const MKModeAction*>(&action)) {
+    out << m->mode;
+  } else if (const auto* f = dynamic_cast<const MKAffectationAction*>(&action)) {
+    out << f->name << '|' << f->value;
   }
-  return *record;
+  return out.str();
 }
 
 // Everything the parser writes, in one comparable text.
@@ -42,27 +58,11 @@ std::string describe(const MKTaskInstruction& job) {
   }
   out << "\ninputMode2: " << job.config.inputMode2;
   for (const auto& action : job.actions) {
-    out << "\n" << action->type << ' ' << action->id << ' ' << action->text;
-    if (const auto* a = dynamic_cast<const MKAnimationAction*>(action.get())) {
-      out << " | " << a->animation << " | " << a->tag;
-    } else if (const auto* s = dynamic_cast<const MKSoundAction*>(action.get())) {
-      out << " | " << s->soundSet << " | " << s->soundName << " | " << s->volume;
-    } else if (const auto* c = dynamic_cast<const MKCallAction*>(action.get())) {
-      out << " | " << c->module << " | " << c->method << " | " << c->arguments;
-    } else if (const auto* m = dynamic_cast<const MKModeAction*>(action.get())) {
-      out << " | " << m->mode;
-    } else if (const auto* f = dynamic_cast<const MKAffectationAction*>(action.get())) {
-      out << " | " << f->name << " | " << f->value;
-    }
+    out << "\n"
+        << action->type << ' ' << action->id << ' ' << action->text << " | " << fieldsOf(*action);
   }
   return out.str();
 }
-
-struct ExpectedAction {
-  MKTaskActionType type;
-  std::uint32_t id;
-  std::string text;
-};
 
 struct TextCase {
   const char* name;
@@ -90,6 +90,9 @@ TEST_P(ParsedText, GivesTheSpeechTextAndActions) {
     EXPECT_EQ(job->actions[k]->type, c.actions[k].type) << k;
     EXPECT_EQ(job->actions[k]->id, c.actions[k].id) << k;
     EXPECT_EQ(job->actions[k]->text, c.actions[k].text) << k;
+    if (!c.actions[k].fields.empty()) {
+      EXPECT_EQ(fieldsOf(*job->actions[k]), c.actions[k].fields) << k;
+    }
   }
 }
 
@@ -100,18 +103,18 @@ const std::vector<TextCase> kTextCases = {
     {"start",
      "Hello ^start(animations/Stand/Gestures/Hey_1) world",
      R"(Hello \mrk=1\ world)",
-     {{START, 1, "^start(animations/Stand/Gestures/Hey_1)"}}},
+     {{START, 1, "^start(animations/Stand/Gestures/Hey_1)", "animations/Stand/Gestures/Hey_1|"}}},
     {"blocking",
      "^run(x) ^wait(x)",
      R"(\mrkpause=1\ \mrkpause=2\)",
      {{RUN, 1, "^run(x)"}, {WAIT, 2, "^wait(x)"}}},
     {"allAnimationKinds",
-     "^startTag(a)^runTag(b)^waitTag(c)^stop(d)^stopTag(e)",
+     "^startTag( a )^runTag(b)^waitTag(c)^stop(d)^stopTag(e)",
      R"(\mrk=1\\mrkpause=2\\mrkpause=3\\mrk=4\\mrk=5\)",
-     {{START_TAG, 1, "^startTag(a)"},
+     {{START_TAG, 1, "^startTag(a)", "|a"},
       {RUN_TAG, 2, "^runTag(b)"},
       {WAIT_TAG, 3, "^waitTag(c)"},
-      {STOP, 4, "^stop(d)"},
+      {STOP, 4, "^stop(d)", "d|"},
       {STOP_TAG, 5, "^stopTag(e)"}}},
     {"spacesAroundArguments",
      "a ^start (x) b ^start(  x  ) c",
@@ -146,7 +149,7 @@ const std::vector<TextCase> kTextCases = {
      {{START, 1, "^start(a)"}}},
 
     // Names.
-    {"deprecatedTag", "^tag(hello)", R"(\mrk=1\)", {{START_TAG, 1, "^tag(hello)"}}},
+    {"deprecatedTag", "^tag(hello)", R"(\mrk=1\)", {{START_TAG, 1, "^tag(hello)", "|hello"}}},
     {"unknownName", "^foo(bar)", R"(\mrk=1\)", {{UNKNOWN, 1, "UNKNOWN_INSTRUCTION ^foo(bar)"}}},
     {"emptyName", "^(x)", R"(\mrk=1\)", {{UNKNOWN, 1, "UNKNOWN_INSTRUCTION ^(x)"}}},
     {"caseMatters", "^Start(x)", R"(\mrk=1\)", {{UNKNOWN, 1, "UNKNOWN_INSTRUCTION ^Start(x)"}}},
@@ -169,17 +172,20 @@ const std::vector<TextCase> kTextCases = {
 
     // Sounds.
     {"sound",
-     "^startSound(bells/ding) ^stopSound(bells/ding)",
-     R"(\mrk=1\ \mrk=2\)",
-     {{START_SOUND, 1, "^startSound(bells/ding)"}, {STOP_SOUND, 2, "^stopSound(bells/ding)"}}},
+     "^startSound(bells/ding) ^stopSound(bells/ding) ^waitSound(bells/ding)",
+     R"(\mrk=1\ \mrk=2\ \mrkpause=3\)",
+     {{START_SOUND, 1, "^startSound(bells/ding)", "bells|ding|100"},
+      {STOP_SOUND, 2, "^stopSound(bells/ding)"},
+      {WAIT_SOUND, 3, "^waitSound(bells/ding)"}}},
     {"soundVolume",
-     "^runSound(a/b/c, 100)",
-     R"(\mrkpause=1\)",
-     {{RUN_SOUND, 1, "^runSound(a/b/c, 100)"}}},
+     "^runSound(a/b/c , 100) ^runSound(x/y,+7)",
+     R"(\mrkpause=1\ \mrkpause=2\)",
+     {{RUN_SOUND, 1, "^runSound(a/b/c , 100)", "a/b|c|100"},
+      {RUN_SOUND, 2, "^runSound(x/y,+7)", "x|y|7"}}},
     {"soundVolumeTooHigh",
      "^runSound(a/b/c, 101)",
      R"(\mrk=1\)",
-     {{UNKNOWN, 1, "SECOND_PARAMETER_NOT_VALID ^runSound(a/b/c, 101)"}}},
+     {{UNKNOWN, 1, "SECOND_PARAMETER_NOT_VALID ^runSound(a/b/c, 101)", "a/b|c|100"}}},
     {"soundVolumeNegative",
      "^runSound(a/b, -1)",
      R"(\mrk=1\)",
@@ -196,7 +202,7 @@ const std::vector<TextCase> kTextCases = {
     {"soundWithoutSlash",
      "^startSound(ding)",
      R"(\mrk=1\)",
-     {{UNKNOWN, 1, "INSTRUCTION_BADLY_FORMATTED ^startSound(ding)"}}},
+     {{UNKNOWN, 1, "INSTRUCTION_BADLY_FORMATTED ^startSound(ding)", "||100"}}},
     {"soundWithoutSlashWithVolume",
      "^waitSound(ding, 5)",
      R"(\mrk=1\)",
@@ -204,7 +210,7 @@ const std::vector<TextCase> kTextCases = {
     {"soundWithParenthesis",
      "^startSound(a/b(c)) d",
      R"(\mrk=1\ d)",
-     {{UNKNOWN, 1, "INSTRUCTION_BADLY_FORMATTED ^startSound(a/b(c))"}}},
+     {{UNKNOWN, 1, "INSTRUCTION_BADLY_FORMATTED ^startSound(a/b(c))", "||100"}}},
     {"soundUnclosed", "^startSound(a/b", "^startSound(a/b", {}},
     {"soundUnclosedVolume", "^runSound(a/b, 5", "^runSound(a/b, 5", {}},
 
@@ -212,12 +218,16 @@ const std::vector<TextCase> kTextCases = {
     {"call",
      R"~(^call(ZUMotion.setAngles("Head(Yaw)", 0.5)))~",
      R"(\mrkpause=1\)",
-     {{CALL, 1, R"~(^call(ZUMotion.setAngles("Head(Yaw)", 0.5)))~"}}},
-    {"pCallSpaces", "^pCall( A.b (1, 2) )", R"(\mrk=1\)", {{PCALL, 1, "^pCall(A.b (1, 2))"}}},
+     {{CALL, 1, R"~(^call(ZUMotion.setAngles("Head(Yaw)", 0.5)))~",
+       R"~(ZUMotion|setAngles|["Head(Yaw)", 0.5]|0)~"}}},
+    {"pCallSpaces",
+     "^pCall( A.b (1, 2) ) ^call(A.b())",
+     R"(\mrk=1\ \mrkpause=2\)",
+     {{PCALL, 1, "^pCall(A.b (1, 2))", "A|b|[1, 2]|0"}, {CALL, 2, "^call(A.b())", "A|b|[]|0"}}},
     {"callWithoutDot",
      "^call(foo) x",
      R"(\mrk=1\ x)",
-     {{UNKNOWN, 1, "INSTRUCTION_BADLY_FORMATTED ^call(foo)"}}},
+     {{UNKNOWN, 1, "INSTRUCTION_BADLY_FORMATTED ^call(foo)", "|||0"}}},
     {"callWithoutArguments",
      "^call(ZUMemory.raiseEvent)",
      R"(\mrk=1\)",
@@ -231,13 +241,15 @@ const std::vector<TextCase> kTextCases = {
 
     // Mode and the inputMode2 switch.
     {"mode",
-     "^mode(random) ^mode(disabled)",
-     R"(\mrk=1\ \mrk=2\)",
-     {{MODE, 1, "^mode(random)"}, {MODE, 2, "^mode(disabled)"}}},
+     "^mode(random) ^mode(disabled) ^mode(contextual)",
+     R"(\mrk=1\ \mrk=2\ \mrk=3\)",
+     {{MODE, 1, "^mode(random)", "1"},
+      {MODE, 2, "^mode(disabled)", "0"},
+      {MODE, 3, "^mode(contextual)", "2"}}},
     {"modeCase",
      "^mode(Random)",
      R"(\mrk=1\)",
-     {{UNKNOWN, 1, "BODY_LANGUAGE_MODE_UNKNOWN ^mode(Random)"}}},
+     {{UNKNOWN, 1, "BODY_LANGUAGE_MODE_UNKNOWN ^mode(Random)", "3"}}},
     {"modeEndOfEnum",
      "^mode(endOfEnum)",
      R"(\mrk=1\)",
@@ -245,9 +257,9 @@ const std::vector<TextCase> kTextCases = {
     {"inputMode2", "a ^inputMode2() b ^start(x)", R"(a  b \mrk=1\)", {{START, 1, "^start(x)"}}},
 
     // Affectations.
-    {"affectation", "$x=1 and", R"(\mrk=1\ and)", {{AFFECTATION, 1, "$x=1"}}},
+    {"affectation", "$x=1 and", R"(\mrk=1\ and)", {{AFFECTATION, 1, "$x=1", "x|1"}}},
     {"affectationAtEnd", "set $x=1", R"(set \mrk=1\)", {{AFFECTATION, 1, "$x=1"}}},
-    {"affectationLastEqual", "$a=b=c d", R"(\mrk=1\ d)", {{AFFECTATION, 1, "$a=b=c"}}},
+    {"affectationLastEqual", "$a=b=c d", R"(\mrk=1\ d)", {{AFFECTATION, 1, "$a=b=c", "a=b|c"}}},
     {"affectationEmptyValue", "$x= and", "$x= and", {}},
     {"affectationEmptyName", "$=1", "$=1", {}},
     {"affectationNoEqual", "$$ costs $5", "$$ costs $5", {}},
@@ -287,67 +299,6 @@ INSTANTIATE_TEST_SUITE_P(Cases, ParsedText,
                                           testing::ValuesIn(kTextCases)),
                          textParamName);
 
-TEST(ParsedFields, AnimationOrTag) {
-  const auto job = parse("^start(animations/Stand/Gestures/Hey_1) ^startTag( hello )");
-  const auto& start = actionAs<MKAnimationAction>(*job, 0);
-  EXPECT_EQ(start.animation, "animations/Stand/Gestures/Hey_1");
-  EXPECT_EQ(start.tag, "");
-  const auto& tag = actionAs<MKAnimationAction>(*job, 1);
-  EXPECT_EQ(tag.animation, "");
-  EXPECT_EQ(tag.tag, "hello");
-}
-
-TEST(ParsedFields, Sounds) {
-  ko::log::ScopedCapture quiet;
-  const auto job = parse(
-      "^startSound(bells/ding) ^runSound(a/b/c , 100) ^runSound(x/y,+7) ^runSound(a/b/c, 101) "
-      "^startSound(ding)");
-  const auto& plain = actionAs<MKSoundAction>(*job, 0);
-  EXPECT_EQ(plain.soundSet, "bells");
-  EXPECT_EQ(plain.soundName, "ding");
-  EXPECT_EQ(plain.volume, 100);
-  const auto& full = actionAs<MKSoundAction>(*job, 1);
-  EXPECT_EQ(full.soundSet, "a/b");
-  EXPECT_EQ(full.soundName, "c");
-  EXPECT_EQ(full.volume, 100);
-  EXPECT_EQ(actionAs<MKSoundAction>(*job, 2).volume, 7);
-  const auto& tooLoud = actionAs<MKSoundAction>(*job, 3);
-  EXPECT_EQ(tooLoud.volume, 100);
-  EXPECT_EQ(tooLoud.soundName, "c");
-  const auto& badName = actionAs<MKSoundAction>(*job, 4);
-  EXPECT_EQ(badName.soundSet, "");
-  EXPECT_EQ(badName.soundName, "");
-}
-
-TEST(ParsedFields, Calls) {
-  ko::log::ScopedCapture quiet;
-  const auto job = parse(
-      R"~(^call(ZUMotion.setAngles("Head(Yaw)", 0.5)) ^pCall(ZUMemory.raiseEvent("faceSeen", 1)) ^call(A.b()) ^call(foo))~");
-  const auto& angles = actionAs<MKCallAction>(*job, 0);
-  EXPECT_EQ(angles.module, "ZUMotion");
-  EXPECT_EQ(angles.method, "setAngles");
-  EXPECT_EQ(angles.arguments, R"~(["Head(Yaw)", 0.5])~");
-  EXPECT_EQ(angles.proxy, nullptr);
-  const auto& event = actionAs<MKCallAction>(*job, 1);
-  EXPECT_EQ(event.type, PCALL);
-  EXPECT_EQ(event.module, "ZUMemory");
-  EXPECT_EQ(event.method, "raiseEvent");
-  EXPECT_EQ(event.arguments, R"(["faceSeen", 1])");
-  EXPECT_EQ(actionAs<MKCallAction>(*job, 2).arguments, "[]");
-  EXPECT_EQ(actionAs<MKCallAction>(*job, 3).module, "");
-}
-
-TEST(ParsedFields, ModesAndAffectations) {
-  ko::log::ScopedCapture quiet;
-  const auto job = parse("^mode(random) ^mode(contextual) ^mode(Random) $volume=high");
-  EXPECT_EQ(actionAs<MKModeAction>(*job, 0).mode, BODY_LANGUAGE_MODE_RANDOM);
-  EXPECT_EQ(actionAs<MKModeAction>(*job, 1).mode, BODY_LANGUAGE_MODE_CONTEXTUAL);
-  EXPECT_EQ(actionAs<MKModeAction>(*job, 2).mode, BODY_LANGUAGE_MODE_END_OF_ENUM);
-  const auto& affectation = actionAs<MKAffectationAction>(*job, 3);
-  EXPECT_EQ(affectation.name, "volume");
-  EXPECT_EQ(affectation.value, "high");
-}
-
 TEST(ParsedJob, InputMode2SetsTheFlagOnly) {
   auto job = parse("^inputMode2() hello");
   EXPECT_TRUE(job->config.inputMode2);
@@ -361,15 +312,6 @@ TEST(ParsedJob, UsedBookmarksAreTheCallersThenTheActions) {
   EXPECT_EQ(job->usedBookmarks, (std::vector<std::int32_t>{4, 2, 1, 3, 5}));
   EXPECT_EQ(job->text, R"(\mrk=4\ a \mrk=1\ \mrk=2\ \mrkpause=3\ \mrkpause=5\ \mrk=oops\)");
   EXPECT_EQ(job->currentAction, 0u);
-}
-
-TEST(ParsedJob, AutomaticTagsContinueTheCount) {
-  const auto job = parse(R"(^start(a) \mrk=3\ ^start(b) \mrk=5\)");
-  auto tag = std::make_shared<MKAnimationAction>(AUTO_START_TAG);
-  job->addAction(tag);
-  EXPECT_EQ(job->actions[1]->id, 2u);
-  EXPECT_EQ(tag->id, 4u);
-  EXPECT_EQ(job->usedBookmarks, (std::vector<std::int32_t>{3, 5, 1, 2, 4}));
 }
 
 TEST(ParsedJob, ReplacesTheSpeechTextOfTheJob) {

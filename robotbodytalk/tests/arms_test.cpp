@@ -3,253 +3,192 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <chrono>
+#include <future>
 #include <memory>
 #include <string>
 #include <vector>
 
-#include "robotbodytalk/zurobotbodytalk.h"
 #include "robotbodytalk/zurobotbodytalkposture.h"
 #include "support/fake_robot.h"
-#include "support/log_waiter.h"
 #include "zu/zuserviceproxies.h"
 #include "zurobotbodytalkarms.h"
 #include "zurobotbodytalkthread.h"
 
 namespace {
 
-using bodytalktest::BodyTalkHandle;
 using bodytalktest::FakeRobot;
-using bodytalktest::kBound;
-using bodytalktest::LogCapture;
+using bodytalktest::linesOf;
+using bodytalktest::waitForLines;
+using ko::log::Error;
+using ko::log::Warning;
 using ZU::ZURobotBodyTalkArms;
 
-std::shared_ptr<ZU::ZURobotBodyTalkPosture> postureOf(const FakeRobot& robot,
-                                                      ZU::PostureFamily latest,
-                                                      ZU::PostureFamily active) {
-  auto posture = std::make_shared<ZU::ZURobotBodyTalkPosture>(robot.broker);
-  posture->setPostureFamily(active);
-  posture->updateActivePostureFamily();
-  posture->setPostureFamily(latest);
-  return posture;
-}
+constexpr const char* kTooLong = "makes too much time to stop";
 
-// Arms on a worker of their own.
+// Arms on a worker of their own; the posture's active family is `active`, its latest one
+// `latest`.
 struct Arms {
-  Arms(const FakeRobot& robot, double timeScale, const char* part = ZURobotBodyTalkArms::kSpeaking,
+  Arms(double timeScale, const char* part = ZURobotBodyTalkArms::kSpeaking,
        ZU::PostureFamily latest = ZU::Standing, ZU::PostureFamily active = ZU::Standing)
-      : arms(robot.broker, postureOf(robot, latest, active), part,
-             ZU::ZURobotBodyTalkTime(timeScale)),
+      : posture(std::make_shared<ZU::ZURobotBodyTalkPosture>(robot.broker)),
+        arms(robot.broker, posture, part, ZU::ZURobotBodyTalkTime(timeScale)),
         worker(std::make_shared<ko::EventLoop>("ArmsTest", 2), ZU::ZURobotBodyTalkTime(timeScale)) {
+    posture->setPostureFamily(active);
+    posture->updateActivePostureFamily();
+    posture->setPostureFamily(latest);
     worker.setBodyPart(&arms);
   }
-  ~Arms() {
+  ~Arms() { stop(); }
+  void stop() {
     worker.requestStop();
     worker.stop();
   }
+  // The time between the first two lines of that category and level that contain `part`.
+  std::chrono::system_clock::duration gap(ko::log::Level level, const char* part) {
+    EXPECT_TRUE(waitForLines(log, "robotbodytalk", level, part, 2));
+    stop();
+    const auto lines = linesOf(log, "robotbodytalk", level, part);
+    return lines.at(1).time - lines.at(0).time;
+  }
+  FakeRobot robot;
+  ko::log::ScopedCapture log;
+  std::shared_ptr<ZU::ZURobotBodyTalkPosture> posture;
   ZURobotBodyTalkArms arms;
   ZU::ZURobotBodyTalkThread worker;
 };
 
-constexpr const char* kTooLong = "makes too much time to stop";
-
-// ---- what an iteration logs -----------------------------------------------------------------
-
-struct EmptyCase {
-  const char* name;
-  const char* part;
-  ZU::PostureFamily family;
-  const char* message;
-};
-
-class ArmsWithoutAnimations : public ::testing::TestWithParam<EmptyCase> {};
-
-TEST_P(ArmsWithoutAnimations, WarnOncePerSecondNamingThePostureAndThePart) {
-  const EmptyCase& c = GetParam();
+TEST(ArmsIteration, WithoutAnimationsTheyWarnOncePerSecondNamingThePostureAndThePart) {
   constexpr double kScale = 0.02;
-  FakeRobot robot;
-  LogCapture log;
-  Arms arms(robot, kScale, c.part, c.family, c.family);
-  arms.arms.setAnimations({"animations/Stand/BodyTalk/Speaking_1"},
-                          c.family == ZU::Standing ? ZU::Sitting : ZU::Standing);
-  arms.worker.start();
-  ASSERT_TRUE(log->waitFor("robotbodytalk", ko::log::Warning, "No bodytalk animations", 3));
-  arms.worker.requestStop();
-  arms.worker.stop();
-  const auto lines = log->lines("robotbodytalk", ko::log::Warning, "No bodytalk animations");
-  for (std::size_t i = 0; i < lines.size(); ++i) {
-    EXPECT_EQ(lines[i].record.message, c.message);
-    if (i > 0) {
-      EXPECT_GE(lines[i].time - lines[i - 1].time,
-                std::chrono::milliseconds(static_cast<int>(1000 * kScale)));
+  for (const auto& [part, family, message] :
+       {std::tuple{ZURobotBodyTalkArms::kSpeaking, ZU::Standing,
+                   "No bodytalk animations found for the Standing posture and during the speaking "
+                   "part.\nPlease update your \"animations\" package."},
+        std::tuple{ZURobotBodyTalkArms::kListening, ZU::SittingOnChair,
+                   "No bodytalk animations found for the SittingOnChair posture and during the "
+                   "listening part.\nPlease update your \"animations\" package."}}) {
+    SCOPED_TRACE(part);
+    Arms a(kScale, part, family, family);
+    a.arms.setAnimations({"a"}, family == ZU::Standing ? ZU::Sitting : ZU::Standing);
+    a.worker.start();
+    EXPECT_GE(a.gap(Warning, "No bodytalk animations"),
+              std::chrono::milliseconds(static_cast<int>(1000 * kScale)));
+    EXPECT_TRUE(a.log->contains("robotbodytalk", Warning, message));
+    EXPECT_EQ(a.robot.behaviors->log.count("startBehavior"), 0u);
+  }
+}
+
+TEST(ArmsIteration, InAnUnknownPostureTheyTakeTheLatestOnceAndOtherwiseWarn) {
+  for (const ZU::PostureFamily latest : {ZU::Sitting, ZU::Unknown}) {
+    SCOPED_TRACE(latest);
+    Arms a(0.01, ZURobotBodyTalkArms::kSpeaking, latest, ZU::Unknown);
+    a.arms.setAnimations({"a"}, ZU::Sitting);
+    a.arms.setAnimations({"u"}, ZU::Unknown);
+    a.worker.start();
+    if (latest == ZU::Sitting) {
+      ASSERT_TRUE(a.robot.behaviors->log.waitFor("startBehavior", 1));
+      EXPECT_EQ(a.robot.behaviors->started().at(0), "a");
+    } else {
+      ASSERT_TRUE(waitForLines(a.log, "robotbodytalk", Warning, "", 2));
+      EXPECT_EQ(
+          linesOf(a.log, "robotbodytalk", Warning).size(),
+          linesOf(a.log, "robotbodytalk", Warning, "Cannot move the arms in that posture").size());
+      EXPECT_EQ(a.robot.behaviors->log.count("startBehavior"), 0u);
     }
   }
-  EXPECT_EQ(robot.behaviors->log.count("startBehavior"), 0u);
 }
-
-INSTANTIATE_TEST_SUITE_P(
-    Cases, ArmsWithoutAnimations,
-    ::testing::Values(
-        EmptyCase{"SpeakingStanding", ZURobotBodyTalkArms::kSpeaking, ZU::Standing,
-                  "No bodytalk animations found for the Standing posture and during the speaking "
-                  "part.\nPlease update your \"animations\" package."},
-        EmptyCase{"ListeningOnAChair", ZURobotBodyTalkArms::kListening, ZU::SittingOnChair,
-                  "No bodytalk animations found for the SittingOnChair posture and during the "
-                  "listening part.\nPlease update your \"animations\" package."}),
-    [](const auto& p) { return std::string(p.param.name); });
-
-struct PostureCase {
-  const char* name;
-  ZU::PostureFamily latest;
-  bool plays;
-};
-
-class ArmsInAnUnknownPosture : public ::testing::TestWithParam<PostureCase> {};
-
-TEST_P(ArmsInAnUnknownPosture, TakeTheLatestPostureOnceAndOtherwiseWarn) {
-  const PostureCase& c = GetParam();
-  FakeRobot robot;
-  LogCapture log;
-  Arms arms(robot, 0.01, ZURobotBodyTalkArms::kSpeaking, c.latest, ZU::Unknown);
-  arms.arms.setAnimations({"a"}, ZU::Sitting);
-  arms.arms.setAnimations({"u"}, ZU::Unknown);
-  arms.worker.start();
-  if (c.plays) {
-    ASSERT_TRUE(robot.behaviors->log.waitFor("startBehavior", 1));
-    EXPECT_EQ(robot.behaviors->started().at(0), "a");
-  } else {
-    ASSERT_TRUE(log->waitFor("robotbodytalk", ko::log::Warning, "", 2));
-    EXPECT_EQ(
-        log->count("robotbodytalk", ko::log::Warning, ""),
-        log->count("robotbodytalk", ko::log::Warning, "Cannot move the arms in that posture"));
-    EXPECT_EQ(robot.behaviors->log.count("startBehavior"), 0u);
-  }
-}
-
-INSTANTIATE_TEST_SUITE_P(Cases, ArmsInAnUnknownPosture,
-                         ::testing::Values(PostureCase{"LatestKnown", ZU::Sitting, true},
-                                           PostureCase{"LatestUnknown", ZU::Unknown, false}),
-                         [](const auto& p) { return std::string(p.param.name); });
 
 TEST(ArmsIteration, AFailedStartIsLoggedAndTheNextComesAfterARest) {
   constexpr double kScale = 0.02;
-  FakeRobot robot;
-  LogCapture log;
-  robot.behaviors->failStartOf("a");
-  Arms arms(robot, kScale);
-  arms.arms.setAnimations({"a"}, ZU::Standing);
-  arms.worker.start();
-  ASSERT_TRUE(
-      log->waitFor("robotbodytalk", ko::log::Warning, "Behavior 0 raised an exception: ", 2));
-  const auto lines =
-      log->lines("robotbodytalk", ko::log::Warning, "Behavior 0 raised an exception: ");
-  EXPECT_NE(lines[0].record.message.find("already running"), std::string::npos);
-  EXPECT_GE(lines[1].time - lines[0].time,
+  Arms a(kScale);
+  a.robot.behaviors->failOn("startBehavior", "a");
+  a.arms.setAnimations({"a"}, ZU::Standing);
+  a.worker.start();
+  EXPECT_GE(a.gap(Warning, "Behavior 0 raised an exception: "),
             std::chrono::milliseconds(static_cast<int>(1000 * kScale)));
+  EXPECT_TRUE(a.log->containsPart("robotbodytalk", Warning, "\"a\" is out of reach"));
 }
 
-// ---- the wait for the end of an animation ---------------------------------------------------
-
+// One iteration on the test's thread: it ends only by the time limit.
 TEST(ArmsIteration, ANotificationForAnotherBehaviourDoesNotWakeThem) {
-  FakeRobot robot;
-  LogCapture log;
-  Arms arms(robot, 0.02);  // the 10 s limit is 200 ms
-  arms.arms.setAnimations({"a"}, ZU::Standing);
-  arms.worker.start();
-  ASSERT_TRUE(robot.behaviors->log.waitFor("startBehavior", 1));
-  arms.worker.notifyBehaviorStopped("b");
-  arms.worker.notifyBehaviorStopped("");
-  ASSERT_TRUE(log->waitFor("robotbodytalk", ko::log::Error, kTooLong));
-  EXPECT_TRUE(log->has("robotbodytalk", ko::log::Error,
-                       "Error: the bodytalk animation \"a\" makes too much time to stop"));
+  Arms a(0.02);  // the 10 s limit is 200 ms
+  a.arms.setAnimations({"a"}, ZU::Standing);
+  a.arms.setRunning(true);
+  auto iteration = std::async(std::launch::async, [&a] { a.arms.doOneIteration(); });
+  ASSERT_TRUE(a.robot.behaviors->log.waitFor("startBehavior", 1));
+  a.worker.notifyBehaviorStopped("b");
+  a.worker.notifyBehaviorStopped("");
+  ASSERT_EQ(iteration.wait_for(bodytalktest::kBound), std::future_status::ready);
+  EXPECT_TRUE(a.log->contains("robotbodytalk", Error,
+                              "Error: the bodytalk animation \"a\" makes too much time to stop"));
 }
 
 TEST(ArmsIteration, StoppingTheBodyTalkStopsTheAnimationAndEndsTheWaitAtOnce) {
-  FakeRobot robot;
-  LogCapture log;
-  BodyTalkHandle bodyTalk(robot.broker, 1.0);
-  bodyTalk->getPosture()->init();
-  bodyTalk->setSpeakingAnimations(ZU::Standing, {"a"});
-  bodyTalk->start(ZU::ZURobotBodyTalk::kSpeaking, {true, false}, true);
-  ASSERT_TRUE(robot.behaviors->log.waitFor("startBehavior", 1));
-  bodyTalk->stop();
-  EXPECT_TRUE(bodyTalk->areWorkersStopped());
-  ASSERT_EQ(robot.behaviors->log.count("stopBehavior"), 1u);
-  EXPECT_EQ(robot.behaviors->log.calls("stopBehavior")[0].args.at(0).asString(), "a");
-  EXPECT_EQ(log->count("robotbodytalk", ko::log::Error, kTooLong), 0u);
+  bodytalktest::BodyTalkOnFakeRobot t(1.0);
+  t.bodyTalk->setSpeakingAnimations(ZU::Standing, {"a"});
+  t.bodyTalk->start(ZU::ZURobotBodyTalk::kSpeaking, {true, false}, true);
+  ASSERT_TRUE(t.robot.behaviors->log.waitFor("startBehavior", 1));
+  t.bodyTalk->stop();
+  EXPECT_TRUE(t.bodyTalk->areWorkersStopped());
+  EXPECT_EQ(t.robot.behaviors->behaviorsOf("stopBehavior"), std::vector<std::string>{"a"});
+  EXPECT_TRUE(linesOf(t.log, "robotbodytalk", Error, kTooLong).empty());
 }
-
-// ---- the list -----------------------------------------------------------------------------
 
 TEST(ArmsList, ThreeEntriesPlayTheFirstAndTheThirdThenTheListIsShuffled) {
-  FakeRobot robot;
-  LogCapture log;
-  Arms arms(robot, 1.0);
-  arms.arms.setAnimations({"a", "b", "c"}, ZU::Standing);
-  ASSERT_TRUE(robot.behaviors->log.waitFor("preloadBehavior", 3));
-  const auto order = arms.arms.getAnimations(ZU::Standing);
-  const auto shuffles = arms.arms.getShuffleCount();
-  EXPECT_EQ(shuffles, 1u);
+  Arms a(1.0);
+  const auto& behaviors = *a.robot.behaviors;
+  a.arms.setAnimations({"a", "b", "c"}, ZU::Standing);
+  ASSERT_TRUE(behaviors.log.waitFor("preloadBehavior", 3));
+  const auto order = a.arms.getAnimations(ZU::Standing);
+  EXPECT_EQ(a.arms.getShuffleCount(), 1u);
 
-  arms.worker.start();
-  ASSERT_TRUE(robot.behaviors->log.waitFor("startBehavior", 1));
-  EXPECT_EQ(robot.behaviors->started(), (std::vector<std::string>{order[0]}));
-  arms.worker.notifyBehaviorStopped(order[0]);
-  ASSERT_TRUE(robot.behaviors->log.waitFor("startBehavior", 2));
-  EXPECT_EQ(robot.behaviors->started(), (std::vector<std::string>{order[0], order[2]}));
-  EXPECT_EQ(arms.arms.getShuffleCount(), shuffles);
+  a.worker.start();
+  ASSERT_TRUE(behaviors.log.waitFor("startBehavior", 1));
+  a.worker.notifyBehaviorStopped(order[0]);
+  ASSERT_TRUE(behaviors.log.waitFor("startBehavior", 2));
+  EXPECT_EQ(behaviors.started(), (std::vector<std::string>{order[0], order[2]}));
+  EXPECT_EQ(a.arms.getShuffleCount(), 1u);
   // The played entry and the one skipped over are preloaded again.
-  ASSERT_TRUE(robot.behaviors->log.waitFor("preloadBehavior", 5));
-  std::vector<std::string> preloaded;
-  for (const auto& call : robot.behaviors->log.calls("preloadBehavior"))
-    preloaded.push_back(call.args.at(0).asString());
-  std::vector<std::string> again(preloaded.begin() + 3, preloaded.end());
+  ASSERT_TRUE(behaviors.log.waitFor("preloadBehavior", 5));
+  auto again = behaviors.behaviorsOf("preloadBehavior");
+  again.erase(again.begin(), again.begin() + 3);
   std::sort(again.begin(), again.end());
-  std::vector<std::string> expected{order[0], order[1]};
-  std::sort(expected.begin(), expected.end());
-  EXPECT_EQ(again, expected);
+  EXPECT_EQ(again,
+            (std::vector<std::string>{std::min(order[0], order[1]), std::max(order[0], order[1])}));
 
-  arms.worker.notifyBehaviorStopped(order[2]);
-  ASSERT_TRUE(robot.behaviors->log.waitFor("startBehavior", 3));
-  EXPECT_EQ(arms.arms.getShuffleCount(), shuffles + 1);
-  EXPECT_EQ(robot.behaviors->started().at(2), arms.arms.getAnimations(ZU::Standing).at(1));
-  EXPECT_EQ(log->count("robotbodytalk", ko::log::Error, kTooLong), 0u);
+  a.worker.notifyBehaviorStopped(order[2]);
+  ASSERT_TRUE(behaviors.log.waitFor("startBehavior", 3));
+  EXPECT_EQ(a.arms.getShuffleCount(), 2u);
+  EXPECT_EQ(behaviors.started().at(2), a.arms.getAnimations(ZU::Standing).at(1));
+  EXPECT_TRUE(linesOf(a.log, "robotbodytalk", Error, kTooLong).empty());
 }
 
-TEST(ArmsList, AnEntryThatCannotBePreloadedIsLoggedAndStillPlayed) {
-  FakeRobot robot;
-  LogCapture log;
-  robot.behaviors->failPreloadOf("x");
-  Arms arms(robot, 1.0);
-  arms.arms.setAnimations({"x"}, ZU::Standing);
-  EXPECT_TRUE(log->waitFor("zucommon.zuproxy", ko::log::Warning,
+TEST(ArmsList, AnEntryThatCannotBePreloadedIsLoggedAndStillPlayedAFamilyOutsideIsRefused) {
+  Arms a(1.0);
+  a.robot.behaviors->failOn("preloadBehavior", "x");
+  a.arms.setAnimations({"x"}, ZU::Standing);
+  EXPECT_TRUE(waitForLines(a.log, "zucommon.zuproxy", Warning,
                            "ZUBehaviorManager can't preload the behavior \"x\" exception: "));
-  arms.worker.start();
-  ASSERT_TRUE(robot.behaviors->log.waitFor("startBehavior", 1));
-  EXPECT_EQ(robot.behaviors->started(), (std::vector<std::string>{"x"}));
-}
+  a.worker.start();
+  ASSERT_TRUE(a.robot.behaviors->log.waitFor("startBehavior", 1));
+  EXPECT_EQ(a.robot.behaviors->started(), (std::vector<std::string>{"x"}));
 
-TEST(ArmsList, ASetOutsideThePostureFamiliesIsRefused) {
-  FakeRobot robot;
-  LogCapture log;
-  Arms arms(robot, 1.0);
-  arms.arms.setAnimations({"a"}, 7);
-  EXPECT_TRUE(arms.arms.getAnimations(7).empty());
+  a.arms.setAnimations({"a"}, 7);
+  EXPECT_TRUE(a.arms.getAnimations(7).empty());
   EXPECT_EQ(
-      log->count("robotbodytalk", ko::log::Error, "No animation set for the posture family 7"), 1u);
-  EXPECT_EQ(robot.behaviors->log.count("preloadBehavior"), 0u);
+      linesOf(a.log, "robotbodytalk", Error, "No animation set for the posture family 7").size(),
+      1u);
+  EXPECT_EQ(a.robot.behaviors->behaviorsOf("preloadBehavior"), std::vector<std::string>{"x"});
 }
-
-// ---- the preload --------------------------------------------------------------------------
 
 TEST(Preload, TheFutureHoldsWhetherThePreloadSucceeded) {
   FakeRobot robot;
-  LogCapture log;
-  robot.behaviors->failPreloadOf("missing");
+  ko::log::ScopedCapture log;
+  robot.behaviors->failOn("preloadBehavior", "missing");
   auto proxy = std::make_shared<ZU::ZUBehaviorManagerProxy>(robot.broker);
   EXPECT_TRUE(ZU::preloadABehaviorAsync(proxy, "here").value(10000));
   EXPECT_FALSE(ZU::preloadABehaviorAsync(proxy, "missing").value(10000));
   EXPECT_FALSE(ZU::preloadABehaviorAsync(nullptr, "here").value(10000));
-
   auto stopped = std::make_shared<ko::EventLoop>("Stopped", 1);
   stopped->stop();
   EXPECT_TRUE(ZU::preloadABehaviorAsync(proxy, "here", stopped).hasError(10000));

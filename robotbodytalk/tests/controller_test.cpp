@@ -3,64 +3,47 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <chrono>
 #include <condition_variable>
 #include <cstdlib>
 #include <functional>
 #include <future>
 #include <mutex>
+#include <string>
 #include <thread>
 #include <vector>
 
-#include "robotbodytalk/zurobotbodytalk.h"
 #include "support/fake_robot.h"
-#include "support/log_waiter.h"
-#include "zu/zubroker.h"
 #include "zurobotbodytalkbodypart.h"
-#include "zurobotbodytalkhead.h"
 #include "zurobotbodytalkthread.h"
 
 namespace {
 
 using bodytalktest::BodyTalkHandle;
+using bodytalktest::BodyTalkOnFakeRobot;
 using bodytalktest::FakeRobot;
 using bodytalktest::kBound;
-using bodytalktest::LogCapture;
+using bodytalktest::linesOf;
+using ko::log::Warning;
 using ZU::ZURobotBodyTalk;
 
+constexpr auto kSpeaking = ZURobotBodyTalk::kSpeaking;
+constexpr auto kListening = ZURobotBodyTalk::kListening;
 // Rests of 1 to 5 ms, limits of 10 ms.
 constexpr double kFast = 0.001;
 // Rests of 1000 s and more: whatever comes, comes without a rest.
 constexpr double kFrozen = 1000.0;
 
-// The key times of the n-th move posted to the fake motion service.
-std::vector<double> timesOfMove(const FakeRobot& robot, std::size_t n) {
-  const auto moves = robot.motion->log.calls("angleInterpolationBezier");
-  std::vector<double> times;
-  const ZU::ZUValue& joint = moves.at(n).args.at(1)[0];
-  for (int i = 0; i < joint.arraySize(); ++i)
-    times.push_back(joint[i].asFloat());
-  return times;
+// Whether the n-th move posted is a listening one: those have their first key before 0.4 s,
+// the speaking ones after.
+bool isListeningMove(const FakeRobot& robot, std::size_t n) {
+  return robot.motion->log.calls("angleInterpolationBezier").at(n).args.at(1)[0][0].asFloat() < 0.4;
 }
-
-// Whether these are the key times of one of the listening moves (robot type 1).
-bool isListeningMove(const std::vector<double>& times) {
-  for (const auto& move : ZU::ZURobotBodyTalkHeadListening::makeMoves(1)) {
-    std::vector<double> listening;
-    for (int i = 0; i < move.times[0].arraySize(); ++i)
-      listening.push_back(move.times[0][i].asFloat());
-    if (listening == times)
-      return true;
-  }
-  return false;
-}
-
-// ---- the process's instance ---------------------------------------------------------------
 
 TEST(BodyTalkInstance, TheLastReleaseDestroysTheController) {
   FakeRobot robot;
-  LogCapture log;
+  ko::log::ScopedCapture log;
   ZURobotBodyTalk* first = ZURobotBodyTalk::getInstance(robot.broker, {kFast, nullptr});
-  first->getPosture()->init();
   {
     ZU::ZURobotBodyTalkInstance handle(robot.broker, {0.5, nullptr});
     EXPECT_EQ(handle.bodyTalk, first);
@@ -68,15 +51,16 @@ TEST(BodyTalkInstance, TheLastReleaseDestroysTheController) {
     EXPECT_EQ(handle.bodyTalk->getTimeScale(), kFast);
   }
   EXPECT_EQ(ZURobotBodyTalk::getInstanceCount(), 1);
-  first->start(ZURobotBodyTalk::kSpeaking, {}, true);
+  first->getPosture()->init();
+  first->start(kSpeaking, {}, true);
   EXPECT_TRUE(robot.motion->log.waitFor("setAngles", 1));
-
+  ZURobotBodyTalk::releaseInstance();  // while it runs
   ZURobotBodyTalk::releaseInstance();
   EXPECT_EQ(ZURobotBodyTalk::getInstanceCount(), 0);
-  ZURobotBodyTalk::releaseInstance();
-  EXPECT_EQ(ZURobotBodyTalk::getInstanceCount(), 0);
-  EXPECT_TRUE(log->has("robotbodytalk", ko::log::Warning,
-                       "The body talk was released more often than it was taken"));
+  EXPECT_EQ(linesOf(log, "robotbodytalk", Warning,
+                    "The body talk was released more often than it was taken")
+                .size(),
+            1u);
   // A new controller, with the options of its own first user.
   BodyTalkHandle again(robot.broker, 0.25);
   EXPECT_EQ(again->getTimeScale(), 0.25);
@@ -86,14 +70,13 @@ TEST(BodyTalkInstance, TheLastReleaseDestroysTheController) {
 TEST(BodyTalkInstance, WithoutTheRobotServicesTheControllerIsStillMadeAndHarmless) {
   ::setenv("KO_DEADLOCK_TIMEOUT", "20", 1);
   ZU::ZUBroker::resetDeadlockTimeoutForTesting();
-  LogCapture log;
-  auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
+  ko::log::ScopedCapture log;
   {
-    BodyTalkHandle bodyTalk(broker, kFast);
-    const auto errors = log->lines("robotbodytalk", ko::log::Error, "Can't find service");
+    BodyTalkHandle bodyTalk(ZU::ZUBroker::create(std::make_shared<ko::Session>()), kFast);
+    const auto errors = linesOf(log, "robotbodytalk", ko::log::Error, "Can't find service");
     ASSERT_EQ(errors.size(), 1u);
-    EXPECT_EQ(errors[0].record.function, "ZU::ZURobotBodyTalk::ZURobotBodyTalk");
-    bodyTalk->start(ZURobotBodyTalk::kSpeaking, {}, true);
+    EXPECT_EQ(errors[0].function, "ZU::ZURobotBodyTalk::ZURobotBodyTalk");
+    bodyTalk->start(kSpeaking, {}, true);
     bodyTalk->onBehaviorStopped("animations/Stand/BodyTalk/Speaking_1");
     bodyTalk->setSpeakingAnimations(ZU::Standing, {"animations/Stand/BodyTalk/Speaking_1"});
     bodyTalk->pause();
@@ -107,55 +90,37 @@ TEST(BodyTalkInstance, WithoutTheRobotServicesTheControllerIsStillMadeAndHarmles
   ZU::ZUBroker::resetDeadlockTimeoutForTesting();
 }
 
-// ---- modes and states -------------------------------------------------------------------
+TEST(BodyTalkModes, OnlyARestartSwitchesTheModeAndAResumeKeepsModeAndParts) {
+  BodyTalkOnFakeRobot t(kFast);
+  const auto& moves = t.robot.motion->log;
+  t.bodyTalk->start(kSpeaking, {}, true);
+  ASSERT_TRUE(moves.waitFor("angleInterpolationBezier", 1));
+  EXPECT_FALSE(isListeningMove(t.robot, 0));
+  t.bodyTalk->start(kListening, {}, false);
+  EXPECT_EQ(t.bodyTalk->getMode(), kSpeaking);
+  EXPECT_TRUE(t.bodyTalk->isRunning());
 
-TEST(BodyTalkModes, AStartWithoutRestartChangesNothingARestartSwitchesToListening) {
-  FakeRobot robot;
-  LogCapture log;
-  BodyTalkHandle bodyTalk(robot.broker, kFast);
-  bodyTalk->getPosture()->init();
-  bodyTalk->start(ZURobotBodyTalk::kSpeaking, {}, true);
-  ASSERT_TRUE(robot.motion->log.waitFor("angleInterpolationBezier", 1));
-  EXPECT_FALSE(isListeningMove(timesOfMove(robot, 0)));
+  // The listening head and the listening arms (which have no animations).
+  t.bodyTalk->start(kListening, {}, true);
+  EXPECT_EQ(t.bodyTalk->getMode(), kListening);
+  std::size_t before = moves.count("angleInterpolationBezier");
+  ASSERT_TRUE(moves.waitFor("angleInterpolationBezier", before + 1));
+  EXPECT_TRUE(isListeningMove(t.robot, before));
+  EXPECT_TRUE(bodytalktest::waitForLines(t.log, "robotbodytalk", Warning,
+                                         "Standing posture and during the listening part."));
 
-  bodyTalk->start(ZURobotBodyTalk::kListening, {}, false);
-  EXPECT_EQ(bodyTalk->getMode(), ZURobotBodyTalk::kSpeaking);
-  EXPECT_TRUE(bodyTalk->isRunning());
-  EXPECT_EQ(log->count("robotbodytalk", ko::log::Warning, "during the listening part"), 0u);
-
-  bodyTalk->start(ZURobotBodyTalk::kListening, {}, true);
-  EXPECT_EQ(bodyTalk->getMode(), ZURobotBodyTalk::kListening);
-  const std::size_t before = robot.motion->log.count("angleInterpolationBezier");
-  ASSERT_TRUE(robot.motion->log.waitFor("angleInterpolationBezier", before + 1));
-  EXPECT_TRUE(isListeningMove(timesOfMove(robot, before)));
-  EXPECT_TRUE(log->waitFor("robotbodytalk", ko::log::Warning,
-                           "Standing posture and during the listening part."));
-}
-
-TEST(BodyTalkModes, PauseThenResumeRestartsTheSamePartsWithTheSameFlags) {
-  FakeRobot robot;
-  LogCapture log;
-  BodyTalkHandle bodyTalk(robot.broker, kFast);
-  bodyTalk->getPosture()->init();
-  bodyTalk->start(ZURobotBodyTalk::kListening, {false, true}, true);
-  ASSERT_TRUE(robot.motion->log.waitFor("setAngles", 1));
-
-  bodyTalk->pause();
-  EXPECT_FALSE(bodyTalk->isRunning());
-  EXPECT_TRUE(bodyTalk->isPaused());
-  EXPECT_TRUE(bodyTalk->areWorkersStopped());
-  const std::size_t before = robot.motion->log.count("angleInterpolationBezier");
-
-  bodyTalk->resume();
-  EXPECT_TRUE(bodyTalk->isRunning());
-  EXPECT_FALSE(bodyTalk->isPaused());
-  EXPECT_EQ(bodyTalk->getMode(), ZURobotBodyTalk::kListening);
-  ASSERT_TRUE(robot.motion->log.waitFor("angleInterpolationBezier", before + 1));
-  EXPECT_TRUE(isListeningMove(timesOfMove(robot, before)));
-  bodyTalk->stop();
-  // The arms were never enabled.
-  EXPECT_EQ(log->count("robotbodytalk", ko::log::Warning, "No bodytalk animations"), 0u);
-  EXPECT_EQ(robot.behaviors->log.calls().size(), 0u);
+  // The head alone, paused and resumed.
+  t.bodyTalk->start(kListening, {false, true}, true);
+  const std::size_t armsLines = linesOf(t.log, "robotbodytalk", Warning, "No bodytalk").size();
+  t.bodyTalk->pause();
+  EXPECT_TRUE(t.bodyTalk->isPaused());
+  before = moves.count("angleInterpolationBezier");
+  t.bodyTalk->resume();
+  EXPECT_EQ(t.bodyTalk->getMode(), kListening);
+  ASSERT_TRUE(moves.waitFor("angleInterpolationBezier", before + 1));
+  EXPECT_TRUE(isListeningMove(t.robot, before));
+  t.bodyTalk->stop();
+  EXPECT_EQ(linesOf(t.log, "robotbodytalk", Warning, "No bodytalk").size(), armsLines);
 }
 
 struct StateCase {
@@ -167,10 +132,10 @@ struct StateCase {
 };
 
 void startSpeaking(ZURobotBodyTalk& b) {
-  b.start(ZURobotBodyTalk::kSpeaking, {}, true);
+  b.start(kSpeaking, {}, true);
 }
 void prepareSpeaking(ZURobotBodyTalk& b) {
-  b.prepare(ZURobotBodyTalk::kSpeaking, {}, true);
+  b.prepare(kSpeaking, {}, true);
 }
 void nothing(ZURobotBodyTalk&) {}
 
@@ -178,17 +143,14 @@ class BodyTalkStates : public ::testing::TestWithParam<StateCase> {};
 
 TEST_P(BodyTalkStates, EachOperationLeadsToItsState) {
   const StateCase& c = GetParam();
-  FakeRobot robot;
-  LogCapture log;
-  BodyTalkHandle bodyTalk(robot.broker, kFast);
-  bodyTalk->getPosture()->init();
-  c.before(*bodyTalk);
-  c.operation(*bodyTalk);
-  EXPECT_EQ(bodyTalk->isRunning(), c.running);
-  EXPECT_EQ(bodyTalk->isPaused(), c.paused);
-  EXPECT_EQ(bodyTalk->areWorkersStopped(), !c.running);
+  BodyTalkOnFakeRobot t(kFast);
+  c.before(*t.bodyTalk);
+  c.operation(*t.bodyTalk);
+  EXPECT_EQ(t.bodyTalk->isRunning(), c.running);
+  EXPECT_EQ(t.bodyTalk->isPaused(), c.paused);
+  EXPECT_EQ(t.bodyTalk->areWorkersStopped(), !c.running);
   if (c.running) {
-    EXPECT_TRUE(robot.motion->log.waitFor("angleInterpolationBezier", 1));
+    EXPECT_TRUE(t.robot.motion->log.waitFor("angleInterpolationBezier", 1));
   }
 }
 
@@ -204,34 +166,24 @@ INSTANTIATE_TEST_SUITE_P(
         StateCase{"StopWhenPaused", prepareSpeaking, [](auto& b) { b.stop(); }, false, false},
         StateCase{"StopWhenRunning", startSpeaking, [](auto& b) { b.stop(); }, false, false},
         StateCase{"PrepareWithoutRestartWhenRunning", startSpeaking,
-                  [](auto& b) { b.prepare(ZURobotBodyTalk::kListening, {}, false); }, true, false},
+                  [](auto& b) { b.prepare(kListening, {}, false); }, true, false},
         StateCase{"PrepareWithRestartWhenRunning", startSpeaking, prepareSpeaking, false, true},
         StateCase{"StartWithoutRestartWhenPaused", prepareSpeaking,
-                  [](auto& b) { b.start(ZURobotBodyTalk::kSpeaking, {}, false); }, true, false}),
+                  [](auto& b) { b.start(kSpeaking, {}, false); }, true, false}),
     [](const auto& p) { return std::string(p.param.name); });
 
-// ---- start delays -------------------------------------------------------------------------
-
-TEST(BodyTalkStartDelay, TheSpeakingHeadMovesAtOnce) {
-  FakeRobot robot;
-  LogCapture log;
-  BodyTalkHandle bodyTalk(robot.broker, kFrozen);
-  bodyTalk->getPosture()->init();
-  bodyTalk->start(ZURobotBodyTalk::kSpeaking, {false, true}, true);
-  // Any rest would last 1000 s or more.
-  EXPECT_TRUE(robot.motion->log.waitFor("setAngles", 1));
-}
-
-TEST(BodyTalkStartDelay, TheListeningHeadRestsOneToFiveSecondsFirst) {
-  FakeRobot robot;
-  LogCapture log;
+TEST(BodyTalkStartDelay, TheSpeakingHeadMovesAtOnceTheListeningOneAfterOneToFiveSeconds) {
+  {
+    BodyTalkOnFakeRobot t(kFrozen);  // any rest would last 1000 s or more
+    t.bodyTalk->start(kSpeaking, {false, true}, true);
+    EXPECT_TRUE(t.robot.motion->log.waitFor("setAngles", 1));
+  }
   constexpr double kScale = 0.05;
-  BodyTalkHandle bodyTalk(robot.broker, kScale);
-  bodyTalk->getPosture()->init();
+  BodyTalkOnFakeRobot t(kScale);
   const auto start = std::chrono::steady_clock::now();
-  bodyTalk->start(ZURobotBodyTalk::kListening, {false, true}, true);
-  ASSERT_TRUE(robot.motion->log.waitFor("areResourcesAvailable", 1));
-  const auto first = robot.motion->log.calls("areResourcesAvailable").front().time;
+  t.bodyTalk->start(kListening, {false, true}, true);
+  ASSERT_TRUE(t.robot.motion->log.waitFor("areResourcesAvailable", 1));
+  const auto first = t.robot.motion->log.calls("areResourcesAvailable").front().time;
   EXPECT_GE(first - start, std::chrono::milliseconds(static_cast<int>(1000 * kScale)));
 }
 
@@ -247,9 +199,9 @@ class ScriptedPart : public ZU::ZURobotBodyTalkBodyPart {
   std::string getName() const override { return "Scripted"; }
   void doOneIteration() override {
     std::unique_lock lock(fMutex);
-    fEvents.push_back("iteration");
-    fThreads.push_back(std::this_thread::get_id());
-    fTimes.push_back(std::chrono::steady_clock::now());
+    events.push_back("iteration");
+    threads.push_back(std::this_thread::get_id());
+    times.push_back(std::chrono::steady_clock::now());
     fChanged.notify_all();
     if (blockUntilStopped)
       fChanged.wait_for(lock, kBound, [this] { return fStopped; });
@@ -258,9 +210,7 @@ class ScriptedPart : public ZU::ZURobotBodyTalkBodyPart {
   int getStartDelay() override { return fDelay; }
   int getPause() override {
     std::lock_guard lock(fMutex);
-    const int pause = fNext < fPauses.size() ? fPauses[fNext] : fPauses.back();
-    ++fNext;
-    return pause;
+    return fPauses[std::min(fNext++, fPauses.size() - 1)];
   }
   void stop() override {
     record("stop");
@@ -268,121 +218,100 @@ class ScriptedPart : public ZU::ZURobotBodyTalkBodyPart {
     fStopped = true;
     fChanged.notify_all();
   }
-
-  bool waitForIterations(std::size_t n) {
-    std::unique_lock lock(fMutex);
-    return fChanged.wait_for(lock, kBound, [&] { return fThreads.size() >= n; });
-  }
-  // Waits until `n` iterations have ended (their afterIteration done).
-  bool waitForEndedIterations(std::size_t n) {
+  // Waits until `n` events of that kind have come; then the records may be read.
+  bool waitFor(const std::string& event, std::size_t n) {
     std::unique_lock lock(fMutex);
     return fChanged.wait_for(lock, kBound, [&] {
-      return static_cast<std::size_t>(std::count(fEvents.begin(), fEvents.end(), "after")) >= n;
+      return static_cast<std::size_t>(std::count(events.begin(), events.end(), event)) >= n;
     });
-  }
-  std::vector<std::string> events() const {
-    std::lock_guard lock(fMutex);
-    return fEvents;
-  }
-  std::vector<std::thread::id> threads() const {
-    std::lock_guard lock(fMutex);
-    return fThreads;
-  }
-  std::vector<std::chrono::steady_clock::time_point> times() const {
-    std::lock_guard lock(fMutex);
-    return fTimes;
   }
 
   bool blockUntilStopped = false;
+  std::vector<std::string> events;
+  std::vector<std::thread::id> threads;
+  std::vector<std::chrono::steady_clock::time_point> times;
 
  private:
   void record(const char* event) {
     std::lock_guard lock(fMutex);
-    fEvents.push_back(event);
+    events.push_back(event);
     fChanged.notify_all();
   }
 
   const std::vector<int> fPauses;
   const int fDelay;
-  mutable std::mutex fMutex;
+  std::mutex fMutex;
   std::condition_variable fChanged;
-  std::vector<std::string> fEvents;
-  std::vector<std::thread::id> fThreads;
-  std::vector<std::chrono::steady_clock::time_point> fTimes;
   std::size_t fNext = 0;
   bool fStopped = false;
 };
 
-std::shared_ptr<ko::EventLoop> workerLoop() {
-  return std::make_shared<ko::EventLoop>("BodyTalkTest", 2);
-}
+struct Worker : ZU::ZURobotBodyTalkThread {
+  Worker(ScriptedPart& part, double scale)
+      : ZU::ZURobotBodyTalkThread(std::make_shared<ko::EventLoop>("BodyTalkTest", 2),
+                                  ZU::ZURobotBodyTalkTime(scale)) {
+    setBodyPart(&part);
+  }
+};
 
 TEST(BodyTalkThread, APartWithoutPauseIteratesBackToBackInOneRun) {
-  auto loop = workerLoop();
   ScriptedPart part({1, 0, 0, 0, 1}, 0);
-  ZU::ZURobotBodyTalkThread worker(loop, ZU::ZURobotBodyTalkTime(kFrozen));
-  EXPECT_EQ(worker.name(), "BodyTalk loop without body part set");
-  worker.setBodyPart(&part);
+  Worker worker(part, kFrozen);
   EXPECT_EQ(worker.name(), "BodyTalk loop of the Scripted");
   worker.start();
-  ASSERT_TRUE(part.waitForEndedIterations(4));
+  ASSERT_TRUE(part.waitFor("after", 4));
   worker.requestStop();
   worker.stop();
   EXPECT_FALSE(worker.isRunning());
   EXPECT_FALSE(part.isRunning());
-
-  const auto threads = part.threads();
-  ASSERT_EQ(threads.size(), 4u);  // the fifth would come 1000 s later
-  for (const auto& id : threads)
-    EXPECT_EQ(id, threads.front());
-  EXPECT_EQ(part.events(),
+  ASSERT_EQ(part.threads.size(), 4u);  // the fifth would come 1000 s later
+  EXPECT_EQ(std::count(part.threads.begin(), part.threads.end(), part.threads[0]), 4);
+  EXPECT_EQ(part.events,
             (std::vector<std::string>{"iteration", "after", "iteration", "after", "iteration",
                                       "after", "iteration", "after", "stop"}));
+  worker.setBodyPart(nullptr);
+  EXPECT_EQ(worker.name(), "BodyTalk loop without body part set");
 }
 
 TEST(BodyTalkThread, AStartDelayPutsTheFirstIterationThatLate) {
   constexpr double kScale = 0.05;
-  auto loop = workerLoop();
   ScriptedPart part({1}, 2);
-  ZU::ZURobotBodyTalkThread worker(loop, ZU::ZURobotBodyTalkTime(kScale));
-  worker.setBodyPart(&part);
+  Worker worker(part, kScale);
   const auto start = std::chrono::steady_clock::now();
   worker.start();
-  ASSERT_TRUE(part.waitForIterations(2));
-  const auto times = part.times();
-  EXPECT_GE(times[0] - start, std::chrono::milliseconds(static_cast<int>(2000 * kScale)));
-  EXPECT_GE(times[1] - times[0], std::chrono::milliseconds(static_cast<int>(1000 * kScale)));
+  ASSERT_TRUE(part.waitFor("iteration", 2));
+  worker.requestStop();
+  worker.stop();
+  EXPECT_GE(part.times[0] - start, std::chrono::milliseconds(static_cast<int>(2000 * kScale)));
+  EXPECT_GE(part.times[1] - part.times[0],
+            std::chrono::milliseconds(static_cast<int>(1000 * kScale)));
 }
 
 TEST(BodyTalkThread, AStopRequestEndsTheIterationInProgressAndTheLoop) {
-  auto loop = workerLoop();
   ScriptedPart part({0}, 0);
   part.blockUntilStopped = true;
-  ZU::ZURobotBodyTalkThread worker(loop, ZU::ZURobotBodyTalkTime(1.0));
-  worker.setBodyPart(&part);
+  Worker worker(part, 1.0);
   worker.start();
-  ASSERT_TRUE(part.waitForIterations(1));
+  ASSERT_TRUE(part.waitFor("iteration", 1));
   auto stopped = std::async(std::launch::async, [&] {
     worker.requestStop();
     worker.stop();
   });
   ASSERT_EQ(stopped.wait_for(kBound), std::future_status::ready);
   EXPECT_FALSE(worker.isRunning());
-  EXPECT_EQ(part.threads().size(), 1u);
+  EXPECT_EQ(part.threads.size(), 1u);
 }
 
 TEST(BodyTalkThread, DestroyingAWorkerClearsItsPartWithoutStoppingIt) {
-  auto loop = workerLoop();
   ScriptedPart part({1}, 0);
   {
-    ZU::ZURobotBodyTalkThread worker(loop, ZU::ZURobotBodyTalkTime(kFrozen));
-    worker.setBodyPart(&part);
+    Worker worker(part, kFrozen);
     worker.start();
-    ASSERT_TRUE(part.waitForIterations(1));
+    ASSERT_TRUE(part.waitFor("after", 1));
     EXPECT_TRUE(part.isRunning());
   }
   EXPECT_FALSE(part.isRunning());
-  EXPECT_EQ(part.events(), (std::vector<std::string>{"iteration", "after"}));
+  EXPECT_EQ(part.events, (std::vector<std::string>{"iteration", "after"}));
 }
 
 }  // namespace

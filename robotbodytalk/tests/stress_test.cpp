@@ -14,13 +14,11 @@
 
 #include "robotbodytalk/zurobotbodytalk.h"
 #include "support/fake_robot.h"
-#include "support/log_waiter.h"
 
 namespace {
 
 using bodytalktest::BodyTalkHandle;
 using bodytalktest::FakeRobot;
-using bodytalktest::LogCapture;
 using ZU::ZURobotBodyTalk;
 
 constexpr int kRounds = 300;
@@ -78,7 +76,7 @@ void randomOperation(ZURobotBodyTalk& bodyTalk, const FakeRobot& robot, std::mt1
 TEST(BodyTalkStress, ThreadsDrivingTheBodyTalkAtRandomNeverDeadlockNorLeaveAWorkerRunning) {
   std::srand(7);
   FakeRobot robot;
-  LogCapture log;
+  ko::log::ScopedCapture log;
   robot.motion->moveMs = 2;
   BodyTalkHandle bodyTalk(robot.broker, 0.001);
   bodyTalk->getPosture()->init();

@@ -7,38 +7,31 @@
 namespace bodytalktest {
 
 void CallLog::add(std::string method, std::vector<ZU::ZUValue> args) {
-  {
-    std::lock_guard lock(fMutex);
-    fCalls.push_back({std::move(method), std::move(args), std::chrono::steady_clock::now()});
-  }
-  fAdded.notify_all();
-}
-
-std::vector<Call> CallLog::calls() const {
   std::lock_guard lock(fMutex);
-  return fCalls;
+  fCalls.push_back({std::move(method), std::move(args), std::chrono::steady_clock::now()});
 }
 
 std::vector<Call> CallLog::calls(const std::string& method) const {
   std::lock_guard lock(fMutex);
   std::vector<Call> out;
   std::copy_if(fCalls.begin(), fCalls.end(), std::back_inserter(out),
-               [&](const Call& c) { return c.method == method; });
+               [&](const Call& c) { return method.empty() || c.method == method; });
   return out;
 }
 
-std::size_t CallLog::count(const std::string& method) const {
-  return calls(method).size();
+std::vector<ko::log::Record> linesOf(ko::log::ScopedCapture& log, std::string_view category,
+                                     ko::log::Level level, std::string_view part) {
+  std::vector<ko::log::Record> out;
+  for (auto& r : log->records()) {
+    if (r.category == category && r.level == level && r.message.find(part) != std::string::npos)
+      out.push_back(std::move(r));
+  }
+  return out;
 }
 
-bool CallLog::waitFor(const std::string& method, std::size_t count,
-                      std::chrono::milliseconds bound) const {
-  std::unique_lock lock(fMutex);
-  return fAdded.wait_for(lock, bound, [&] {
-    return static_cast<std::size_t>(std::count_if(fCalls.begin(), fCalls.end(), [&](const Call& c) {
-             return c.method == method;
-           })) >= count;
-  });
+bool waitForLines(ko::log::ScopedCapture& log, std::string_view category, ko::log::Level level,
+                  std::string_view part, std::size_t count) {
+  return ko::test::eventually([&] { return linesOf(log, category, level, part).size() >= count; });
 }
 
 // ---- motion ---------------------------------------------------------------------------------
@@ -51,8 +44,6 @@ FakeMotion::FakeMotion(const std::shared_ptr<ZU::ZUBroker>& broker, const std::s
                              {"angleInterpolationBezier", &FakeMotion::angleInterpolationBezier},
                              {"setAngles", &FakeMotion::setAngles}});
 }
-
-FakeMotion::~FakeMotion() = default;
 
 bool FakeMotion::areResourcesAvailable(const ZU::ZUValue& resourceNames) {
   log.add("areResourcesAvailable", {resourceNames});
@@ -69,8 +60,7 @@ std::vector<float> FakeMotion::getAngles(const ZU::ZUValue& names, bool useSenso
 void FakeMotion::angleInterpolationBezier(const ZU::ZUValue& jointNames, const ZU::ZUValue& times,
                                           const ZU::ZUValue& controlPoints) {
   log.add("angleInterpolationBezier", {jointNames, times, controlPoints});
-  const auto task = currentTask();
-  if (task)
+  if (const auto task = currentTask())
     task->waitForStopRequest(moveMs.load());
 }
 
@@ -94,27 +84,59 @@ void FakeMotion::stop(int id) {
 FakeBehaviorManager::FakeBehaviorManager(const std::shared_ptr<ZU::ZUBroker>& broker,
                                          const std::string& name)
     : ZU::ZUModule(broker, name) {
-  bindMethods("FakeBehaviorManager", {{"preloadBehavior", &FakeBehaviorManager::preloadBehavior},
-                                      {"startBehavior", &FakeBehaviorManager::startBehavior},
-                                      {"stopBehavior", &FakeBehaviorManager::stopBehavior}});
+  using M = FakeBehaviorManager;
+  bindMethods("FakeBehaviorManager", {{"getInstalledBehaviors", &M::getInstalledBehaviors},
+                                      {"getBehaviorTags", &M::getBehaviorTags},
+                                      {"resolveBehaviorName", &M::resolveBehaviorName},
+                                      {"preloadBehavior", &M::preloadBehavior},
+                                      {"startBehavior", &M::startBehavior},
+                                      {"stopBehavior", &M::stopBehavior}});
+}
+
+void FakeBehaviorManager::xFailIfAsked(const std::string& method, const std::string& behavior) {
+  std::lock_guard lock(fMutex);
+  if (fFailing.count({method, behavior}))
+    ZU_THROW_ERROR(getName(), method, "\"" + behavior + "\" is out of reach");
+}
+
+std::vector<std::string> FakeBehaviorManager::getInstalledBehaviors() {
+  log.add("getInstalledBehaviors", {});
+  xFailIfAsked("getInstalledBehaviors", "");
+  std::lock_guard lock(fMutex);
+  std::vector<std::string> paths;
+  for (const auto& [path, tags] : fLibrary)
+    paths.push_back(path);
+  return paths;
+}
+
+std::vector<std::string> FakeBehaviorManager::getBehaviorTags(const std::string& behavior) {
+  log.add("getBehaviorTags", {behavior});
+  std::function<void(const std::string&)> hook;
+  {
+    std::lock_guard lock(fMutex);
+    hook = fTagQueryHook;
+  }
+  if (hook)
+    hook(behavior);
+  xFailIfAsked("getBehaviorTags", behavior);
+  std::lock_guard lock(fMutex);
+  const auto found = fLibrary.find(behavior);
+  return found == fLibrary.end() ? std::vector<std::string>{} : found->second;
+}
+
+std::string FakeBehaviorManager::resolveBehaviorName(const std::string& name) {
+  std::lock_guard lock(fMutex);
+  return fLibrary.count(name) ? name : "";
 }
 
 bool FakeBehaviorManager::preloadBehavior(const std::string& behavior) {
   log.add("preloadBehavior", {behavior});
-  std::lock_guard lock(fMutex);
-  if (fFailPreload.count(behavior))
-    ZU_THROW_ERROR(getName(), "preloadBehavior", "Behavior \"" + behavior + "\" is not installed");
+  xFailIfAsked("preloadBehavior", behavior);
   return true;
 }
 
 void FakeBehaviorManager::startBehavior(const std::string& behavior) {
-  {
-    std::lock_guard lock(fMutex);
-    if (fFailStart.count(behavior)) {
-      ZU_THROW_ERROR(getName(), "startBehavior",
-                     "Behavior \"" + behavior + "\" is already running");
-    }
-  }
+  xFailIfAsked("startBehavior", behavior);
   log.add("startBehavior", {behavior});
 }
 
@@ -122,19 +144,24 @@ void FakeBehaviorManager::stopBehavior(const std::string& behavior) {
   log.add("stopBehavior", {behavior});
 }
 
-void FakeBehaviorManager::failStartOf(const std::string& behavior) {
+void FakeBehaviorManager::setLibrary(std::map<std::string, std::vector<std::string>> library) {
   std::lock_guard lock(fMutex);
-  fFailStart.insert(behavior);
+  fLibrary = std::move(library);
 }
 
-void FakeBehaviorManager::failPreloadOf(const std::string& behavior) {
+void FakeBehaviorManager::failOn(const std::string& method, const std::string& behavior) {
   std::lock_guard lock(fMutex);
-  fFailPreload.insert(behavior);
+  fFailing.insert({method, behavior});
 }
 
-std::vector<std::string> FakeBehaviorManager::started() const {
+void FakeBehaviorManager::setTagQueryHook(std::function<void(const std::string&)> hook) {
+  std::lock_guard lock(fMutex);
+  fTagQueryHook = std::move(hook);
+}
+
+std::vector<std::string> FakeBehaviorManager::behaviorsOf(const std::string& method) const {
   std::vector<std::string> out;
-  for (const auto& call : log.calls("startBehavior"))
+  for (const auto& call : log.calls(method))
     out.push_back(call.args.at(0).asString());
   return out;
 }
@@ -203,13 +230,6 @@ FakeRobot::~FakeRobot() {
        std::vector<std::shared_ptr<ZU::ZUModule>>{model, posture, behaviors, motion, memory}) {
     module->exit();
   }
-}
-
-BodyTalkHandle::BodyTalkHandle(const std::shared_ptr<ZU::ZUBroker>& broker, double timeScale)
-    : fBodyTalk(ZU::ZURobotBodyTalk::getInstance(broker, {timeScale, nullptr})) {}
-
-BodyTalkHandle::~BodyTalkHandle() {
-  ZU::ZURobotBodyTalk::releaseInstance();
 }
 
 }  // namespace bodytalktest

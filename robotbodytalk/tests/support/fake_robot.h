@@ -1,20 +1,26 @@
 #pragma once
-// Stand-ins for the robot's services that the body talk calls, for its tests: each records
-// the calls it receives (method, arguments as ZUValues, time) and answers as the test set
-// it up, at once. Calls arrive on the body talk's worker threads and the event loop; the
-// test thread configures, reads and waits (every wait is bounded).
+// Stand-ins for the robot's services that the body talk and the loader call, for their
+// tests: each records the calls it receives (method, arguments as ZUValues, time) and
+// answers as the test set it up, at once. Calls arrive on the body talk's worker threads,
+// the event loop and the loader's thread; the test thread configures, reads and waits
+// (every wait is bounded). Log lines are read from a ko::log::ScopedCapture.
 
 #include <atomic>
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
+#include <functional>
+#include <map>
 #include <memory>
 #include <mutex>
 #include <set>
 #include <string>
+#include <string_view>
+#include <utility>
 #include <vector>
 
+#include "ko/log.hpp"
 #include "ko/session.hpp"
+#include "ko_test_helpers.hpp"
 #include "robotbodytalk/zurobotbodytalk.h"
 #include "zu/zubroker.h"
 #include "zu/zumodule.h"
@@ -33,23 +39,29 @@ struct Call {
 class CallLog {
  public:
   void add(std::string method, std::vector<ZU::ZUValue> args);
-  std::vector<Call> calls() const;
-  std::vector<Call> calls(const std::string& method) const;
-  std::size_t count(const std::string& method) const;
-  // Waits at most `bound` until `count` calls of `method` have come.
-  bool waitFor(const std::string& method, std::size_t count,
-               std::chrono::milliseconds bound = kBound) const;
+  // Every call, or those of one method, in arrival order.
+  std::vector<Call> calls(const std::string& method = "") const;
+  std::size_t count(const std::string& method) const { return calls(method).size(); }
+  // Waits (bounded) until `count` calls of `method` have come.
+  bool waitFor(const std::string& method, std::size_t count) const {
+    return ko::test::eventually([&] { return this->count(method) >= count; });
+  }
 
  private:
   mutable std::mutex fMutex;
-  mutable std::condition_variable fAdded;
   std::vector<Call> fCalls;
 };
+
+// The lines of a capture with that category and level that contain `part`.
+std::vector<ko::log::Record> linesOf(ko::log::ScopedCapture& log, std::string_view category,
+                                     ko::log::Level level, std::string_view part = "");
+// Waits (bounded) until `count` such lines have come.
+bool waitForLines(ko::log::ScopedCapture& log, std::string_view category, ko::log::Level level,
+                  std::string_view part, std::size_t count = 1);
 
 class FakeMotion : public ZU::ZUModule {
  public:
   FakeMotion(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name);
-  ~FakeMotion() override;
 
   bool areResourcesAvailable(const ZU::ZUValue& resourceNames);
   std::vector<float> getAngles(const ZU::ZUValue& names, bool useSensors);
@@ -67,25 +79,37 @@ class FakeMotion : public ZU::ZUModule {
   CallLog log;
 };
 
+// A behaviour manager over a library that the test sets (path to tags).
 class FakeBehaviorManager : public ZU::ZUModule {
  public:
   FakeBehaviorManager(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name);
 
+  std::vector<std::string> getInstalledBehaviors();
+  // Runs `onTagQuery` first.
+  std::vector<std::string> getBehaviorTags(const std::string& behavior);
+  // The path itself when it is in the library; "" otherwise.
+  std::string resolveBehaviorName(const std::string& name);
   bool preloadBehavior(const std::string& behavior);
   void startBehavior(const std::string& behavior);
   void stopBehavior(const std::string& behavior);
 
-  // These raise a ZUError.
-  void failStartOf(const std::string& behavior);
-  void failPreloadOf(const std::string& behavior);
-  // The behaviours started, in order.
-  std::vector<std::string> started() const;
+  void setLibrary(std::map<std::string, std::vector<std::string>> library);
+  // That method raises a ZUError for that behaviour ("" for getInstalledBehaviors).
+  void failOn(const std::string& method, const std::string& behavior);
+  void setTagQueryHook(std::function<void(const std::string&)> hook);
+  // The behaviours of that method's calls, in order (startBehavior: the starts that
+  // succeeded).
+  std::vector<std::string> behaviorsOf(const std::string& method) const;
+  std::vector<std::string> started() const { return behaviorsOf("startBehavior"); }
   CallLog log;
 
  private:
+  void xFailIfAsked(const std::string& method, const std::string& behavior);
+
   mutable std::mutex fMutex;
-  std::set<std::string> fFailStart;
-  std::set<std::string> fFailPreload;
+  std::map<std::string, std::vector<std::string>> fLibrary;
+  std::set<std::pair<std::string, std::string>> fFailing;
+  std::function<void(const std::string&)> fTagQueryHook;
 };
 
 class FakeRobotModel : public ZU::ZUModule {
@@ -120,7 +144,7 @@ class FakeMemory : public ZU::ZUModule {
   CallLog log;
 };
 
-// A process with the services that the body talk calls, under their robot names.
+// A process with these services under their robot names.
 struct FakeRobot {
   explicit FakeRobot(int robotType = 1);
   ~FakeRobot();
@@ -140,8 +164,9 @@ struct FakeRobot {
 // the end (stopping it).
 class BodyTalkHandle {
  public:
-  BodyTalkHandle(const std::shared_ptr<ZU::ZUBroker>& broker, double timeScale);
-  ~BodyTalkHandle();
+  BodyTalkHandle(const std::shared_ptr<ZU::ZUBroker>& broker, double timeScale)
+      : fBodyTalk(ZU::ZURobotBodyTalk::getInstance(broker, {timeScale, nullptr})) {}
+  ~BodyTalkHandle() { ZU::ZURobotBodyTalk::releaseInstance(); }
   BodyTalkHandle(const BodyTalkHandle&) = delete;
   BodyTalkHandle& operator=(const BodyTalkHandle&) = delete;
   ZU::ZURobotBodyTalk* operator->() const { return fBodyTalk; }
@@ -151,9 +176,16 @@ class BodyTalkHandle {
   ZU::ZURobotBodyTalk* fBodyTalk;
 };
 
-// The float that a table literal becomes.
-inline double f32(double value) {
-  return static_cast<double>(static_cast<float>(value));
-}
+// The fake robot, a capture of every log line and the body talk on that robot, its posture
+// watcher started: what most body talk tests begin with.
+struct BodyTalkOnFakeRobot {
+  explicit BodyTalkOnFakeRobot(double timeScale, int robotType = 1)
+      : robot(robotType), bodyTalk(robot.broker, timeScale) {
+    bodyTalk->getPosture()->init();
+  }
+  FakeRobot robot;
+  ko::log::ScopedCapture log;
+  BodyTalkHandle bodyTalk;
+};
 
 }  // namespace bodytalktest
