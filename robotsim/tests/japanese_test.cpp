@@ -61,20 +61,17 @@ INSTANTIATE_TEST_SUITE_P(
                     "<mark name=\"0\"/>ハクブツカン<mark name=\"1\"/>, <break strength=\"x-weak\" "
                     "time=\"300ms\"/><mark name=\"2\"/>ロボット"}));
 
-TEST(JapaneseReadings, UnreadableKanjiAreLoggedOnceAndLeftOut) {
+// An unreadable kanji is left out and logged once; a missing dictionary is named.
+TEST(JapaneseReadings, ReadingProblemsAreNamed) {
   JapaneseReadings reader(JapaneseReadings::kDictionary);
   ko::log::ScopedCapture cap(ko::log::Warning);
-  const auto read = reader.read(parseSpeechText("𠮷と𠮷"));
-  EXPECT_EQ(toEspeakSsml(read), "<speak>ト</speak>");
+  EXPECT_EQ(toEspeakSsml(reader.read(parseSpeechText("𠮷と𠮷"))), "<speak>ト</speak>");
   std::size_t lines = 0;
   for (const auto& record : cap->records())
     lines += record.message.find("No reading for the kanji 𠮷 (U+20BB7)") != std::string::npos;
   EXPECT_EQ(lines, 1U);
-}
-
-TEST(JapaneseReadings, AMissingDictionaryIsNamed) {
   try {
-    JapaneseReadings reader("/nonexistent/ipadic-utf8");
+    JapaneseReadings missing("/nonexistent/ipadic-utf8");
     ADD_FAILURE() << "no error";
   } catch (const std::runtime_error& e) {
     EXPECT_NE(std::string(e.what()).find("mecab-ipadic-utf8"), std::string::npos) << e.what();
