@@ -198,21 +198,6 @@ Spoken speak(const std::string& text,
   return spoken;
 }
 
-// espeak-ng reads kana only: written in kanji or in kana, a sentence lasts the same.
-TEST(JapaneseSpeaking, AKanjiSentenceLastsAsLongAsInKana) {
-  for (const auto& [kanji, kana] : std::vector<std::pair<std::string, std::string>>{
-           {"今日はいい天気ですね。", "きょうはいいてんきですね。"},
-           {"博物館に行きました。", "はくぶつかんにいきました。"},
-           {"昨日友達と公園で遊びました。", "きのうともだちとこうえんであそびました。"},
-           {"東京タワーは333メートルです。",
-            "とうきょうタワーはさんびゃくさんじゅうさんメートルです。"}}) {
-    const double a = speak(kanji).durationUs;
-    const double b = speak(kana).durationUs;
-    EXPECT_NEAR(a / b, 1.0, 0.15) << kanji << " " << a / 1e3 << " ms, " << kana << " " << b / 1e3
-                                  << " ms";
-  }
-}
-
 // Each bookmark comes when the word written after it begins, as the same text without
 // bookmarks speaks it; the words are the caller's.
 TEST(JapaneseSpeaking, EachBookmarkComesWithTheWordAfterIt) {
