@@ -279,7 +279,8 @@ TEST_F(BehaviorManagerService, RefusedStartsAreErrors) {
   proxy.startBehavior(kLongHead);
   EXPECT_THAT(errorOf([&] { proxy.startBehavior(kLongHead); }), HasSubstr("is already running"));
   EXPECT_THAT(errorOf([&] { proxy.startBehavior("Hey_1"); }), HasSubstr("is not installed"));
-  EXPECT_THAT(errorOf([&] { proxy.runBehavior("animations/Stand/No"); }), HasSubstr("not installed"));
+  EXPECT_THAT(errorOf([&] { proxy.runBehavior("animations/Stand/No"); }),
+              HasSubstr("not installed"));
   proxy.stopBehavior(kLongHead);
   EXPECT_TRUE(recorder->waitFor(kLongHead));
   EXPECT_THAT(recorder->all(), ElementsAre(kLongHead));
@@ -417,8 +418,8 @@ TEST(StarterLibrary, EveryBehaviourIsValid) {
           ++tagCounts[tag];
       }
     }
-    for (const char* tag : {"hello", "hey", "bonjour", "こんにちは", "yes", "no", "me", "you", "two",
-                            "three", "four", "five", "pick", "oppose", "yeah", "medidate"})
+    for (const char* tag : {"hello", "hey", "bonjour", "こんにちは", "yes", "no", "me", "you",
+                            "two", "three", "four", "five", "pick", "oppose", "yeah", "medidate"})
       EXPECT_GT(tagCounts[tag], 0) << family << ": " << tag;
     EXPECT_GE(tagCounts["hello"], 2) << family;
     for (const auto& [kind, count] : std::initializer_list<std::pair<const char*, int>>{

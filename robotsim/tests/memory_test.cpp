@@ -30,9 +30,9 @@ using namespace std::chrono_literals;
 bool waitFor(const RecordingModule& module, const std::string& key, std::size_t count) {
   return module.waitForEvents(
       [&](const auto& events) {
-        return std::count_if(events.begin(), events.end(),
-                             [&](const auto& e) { return e.key == key; }) >=
-               static_cast<std::ptrdiff_t>(count);
+        return std::count_if(events.begin(), events.end(), [&](const auto& e) {
+                 return e.key == key;
+               }) >= static_cast<std::ptrdiff_t>(count);
       },
       10s);
 }
@@ -44,8 +44,7 @@ std::shared_ptr<ZU::ZUBroker> newBroker() {
 class MemoryTest : public ::testing::Test {
  protected:
   std::shared_ptr<ZU::ZUBroker> broker = newBroker();
-  std::shared_ptr<ZUMemory> memoryModule =
-      ZU::ZUModule::createModule<ZUMemory>(broker, "ZUMemory");
+  std::shared_ptr<ZUMemory> memoryModule = ZU::ZUModule::createModule<ZUMemory>(broker, "ZUMemory");
   std::shared_ptr<RecordingModule> first =
       ZU::ZUModule::createModule<RecordingModule>(broker, "First");
   std::shared_ptr<RecordingModule> second =
@@ -160,10 +159,11 @@ TEST_F(MemoryTest, FailingOrMissingSubscribersAreLoggedAndSkipped) {
   ASSERT_TRUE(waitFor(*third, "e", 1));
   for (const char* line :
        {"First.failingCallback failed on event e", "Module Gone is gone: event e not delivered",
-        "Module NeverThere is gone: event e not delivered", "Second.noSuchMethod failed on event e"}) {
-    EXPECT_TRUE(ko::test::eventually(
-        [&] { return cap->containsPart("robotsim.memory", ko::log::Error, line); }))
-        << line;
+        "Module NeverThere is gone: event e not delivered",
+        "Second.noSuchMethod failed on event e"}) {
+    EXPECT_TRUE(ko::test::eventually([&] {
+      return cap->containsPart("robotsim.memory", ko::log::Error, line);
+    })) << line;
   }
   // The failing subscribers' queues go on.
   memory.subscribeToEvent("f", "First", "onEvent");

@@ -26,7 +26,8 @@ TEST(Robot, EveryServiceAnswersByItsName) {
   ko::log::ScopedCapture capture(ko::log::Warning);
   robotsim::Robot robot(timingRobot());
   const auto& broker = robot.broker();
-  EXPECT_EQ(ZU::ZURobotModelProxy(broker)._getRobotType(), robotsim::ZURobotModel::kDefaultRobotType);
+  EXPECT_EQ(ZU::ZURobotModelProxy(broker)._getRobotType(),
+            robotsim::ZURobotModel::kDefaultRobotType);
   EXPECT_EQ(ZU::ZUTextToSpeechProxy(broker).getLanguage(), "English");
   EXPECT_FALSE(ZU::ZUBehaviorManagerProxy(broker).getInstalledBehaviors().empty());
   EXPECT_TRUE(ZU::ZUMotionProxy(broker).areResourcesAvailable({"Head"}));
@@ -57,8 +58,8 @@ TEST(Robot, ServicesAreWithdrawnWhenTheRobotGoesOrCannotStart) {
 // refused.
 TEST(Robot, PostureFamilyChangesRaiseTheirEventOnce) {
   robotsim::Robot robot(timingRobot());
-  const auto listener = ZU::ZUModule::createModule<robotsim::testing::RecordingModule>(
-      robot.broker(), "Listener");
+  const auto listener =
+      ZU::ZUModule::createModule<robotsim::testing::RecordingModule>(robot.broker(), "Listener");
   ZU::ZURobotPostureProxy posture(robot.broker());
   EXPECT_EQ(posture.getPostureFamily(), "Standing");
   ZU::ZUMemoryProxy(robot.broker()).subscribeToEvent("PostureFamilyChanged", "Listener", "onEvent");
