@@ -1,5 +1,6 @@
-// The audio player driven through its proxy as the director drives it: sound sets, plays
-// that last the real duration of their WAV files, posted plays stopped and waited for.
+// The audio player of the simulated robot driven through its proxy as the director drives
+// it: sound sets, plays that last the real duration of their WAV files, posted plays
+// stopped and waited for.
 
 #include <chrono>
 #include <cmath>
@@ -12,14 +13,11 @@
 #include <gtest/gtest.h>
 #include <sndfile.h>
 
-#include "ko/log.hpp"
-#include "ko/session.hpp"
+#include "ko/path.hpp"
+#include "robotsim/robot.h"
 #include "robotsim/soundlibrary.h"
-#include "robotsim/timeline.h"
-#include "robotsim/zuaudioplayer.h"
 #include "support/scratch_folder.h"
 #include "support/timeline_waiter.h"
-#include "zu/zubroker.h"
 #include "zu/zuerror.h"
 #include "zu/zuproxy.h"
 #include "zu/zuserviceproxies.h"
@@ -29,11 +27,9 @@ namespace {
 
 namespace fs = std::filesystem;
 using simtest::ScratchFolder;
-using simtest::TimelineWaiter;
 using testing::ElementsAre;
 using testing::HasSubstr;
 
-constexpr auto kBound = std::chrono::seconds(10);
 constexpr int kBoundMs = 10000;
 
 // A WAV file of `frames` frames of a quiet tone.
@@ -52,16 +48,14 @@ void writeWav(const fs::path& file, int rate, int channels, sf_count_t frames) {
   sf_close(sound);
 }
 
-struct DurationCase {
-  const char* name;
-  int rate;
-  int channels;
-  sf_count_t frames;
-  double seconds;
-};
-
 TEST(SoundFiles, DurationsComeFromTheFiles) {
-  const DurationCase cases[] = {
+  const struct {
+    const char* name;
+    int rate;
+    int channels;
+    sf_count_t frames;
+    double seconds;
+  } cases[] = {
       {"short.wav", 8000, 1, 2000, 0.25},
       {"stereo.wav", 16000, 2, 4000, 0.25},
       {"odd.wav", 44100, 1, 22050, 0.5},
@@ -83,149 +77,140 @@ TEST(SoundFiles, DurationsComeFromTheFiles) {
   EXPECT_EQ(set.rejected.count("broken.wav"), 1u);
   EXPECT_EQ(set.rejected.count("readme.txt"), 0u);
   EXPECT_THROW(readSoundSet(folder.path() / "nothing"), SoundFileError);
+  // The starter sounds are short bells.
+  const fs::path bells = fs::path(ko::path::findData("zefoko", "sounds")) / "bells";
+  for (const std::string bell : {"ding", "dong", "chime"}) {
+    EXPECT_GE(soundFileDuration(bells / (bell + ".wav")), 0.1) << bell;
+    EXPECT_LE(soundFileDuration(bells / (bell + ".wav")), 1.0) << bell;
+  }
+}
+
+// The simulated robot with the sound sets written in `folder`: "tones" with a 0.2 s "beep"
+// and a 10 s "Long".
+RobotOptions robotWithTones(const ScratchFolder& folder) {
+  writeWav(folder.path() / "tones" / "beep.wav", 8000, 1, 1600);
+  writeWav(folder.path() / "tones" / "Long.WAV", 8000, 1, 80000);
+  RobotOptions options;
+  options.soundsRoot = options.behaviorsRoot = folder.path().string();
+  options.speech.backend = ZUTextToSpeechOptions::Backend::Timing;
+  return options;
 }
 
 class AudioPlayerService : public testing::Test {
  protected:
-  AudioPlayerService() {
-    writeWav(folder_.path() / "tones" / "beep.wav", 8000, 1, 1600);   // 0.2 s
-    writeWav(folder_.path() / "tones" / "Long.WAV", 8000, 1, 80000);  // 10 s
-    session_ = std::make_shared<ko::Session>();
-    broker_ = ZU::ZUBroker::create(session_);
-    timeline_ = std::make_shared<Timeline>();
-    waiter_ = std::make_unique<TimelineWaiter>(*timeline_);
-    player_ = ZU::ZUModule::createModule<ZUAudioPlayer>(broker_, "ZUAudioPlayer", timeline_,
-                                                        folder_.path().string());
-    proxy_ = std::make_unique<ZU::ZUAudioPlayerProxy>(broker_);
-    generic_ = std::make_unique<ZU::ZUProxy>("ZUAudioPlayer", broker_);
+  std::size_t count(const char* operation) const {
+    return robot.timeline()->entries("ZUAudioPlayer", operation).size();
   }
 
-  ScratchFolder folder_;
-  std::shared_ptr<ko::Session> session_;
-  std::shared_ptr<ZU::ZUBroker> broker_;
-  std::shared_ptr<Timeline> timeline_;
-  std::unique_ptr<TimelineWaiter> waiter_;
-  std::shared_ptr<ZUAudioPlayer> player_;
-  std::unique_ptr<ZU::ZUAudioPlayerProxy> proxy_;
-  std::unique_ptr<ZU::ZUProxy> generic_;
+  ScratchFolder folder;
+  Robot robot{robotWithTones(folder)};
+  simtest::TimelineWaiter waiter{*robot.timeline()};
+  ZU::ZUAudioPlayerProxy proxy{robot.broker()};
+  ZU::ZUProxy generic{"ZUAudioPlayer", robot.broker()};  // what the service never calls
 };
 
 TEST_F(AudioPlayerService, LoadsAndUnloadsSoundSets) {
-  proxy_->loadSoundSet("tones");
-  proxy_->loadSoundSet("tones");  // again: read anew
-  EXPECT_THAT(generic_->call<std::vector<std::string>>("getLoadedSoundSetsList"),
+  proxy.loadSoundSet("tones");
+  proxy.loadSoundSet("tones");  // again: read anew
+  EXPECT_THAT(generic.call<std::vector<std::string>>("getLoadedSoundSetsList"),
               ElementsAre("tones"));
   for (const std::string bad : {"bells", "", "../tones", "tones/beep.wav"}) {
     try {
-      proxy_->loadSoundSet(bad);
+      proxy.loadSoundSet(bad);
       ADD_FAILURE() << bad << " loaded";
     } catch (const ZU::ZUError& e) {
       EXPECT_EQ(e.description(), "Unknown sound set \"" + bad + "\"");
     }
   }
-  generic_->call<void>("unloadSoundSet", "tones");
-  EXPECT_TRUE(generic_->call<std::vector<std::string>>("getLoadedSoundSetsList").empty());
-  EXPECT_THROW(generic_->call<void>("unloadSoundSet", "tones"), ZU::ZUError);
+  generic.call<void>("unloadSoundSet", "tones");
+  EXPECT_TRUE(generic.call<std::vector<std::string>>("getLoadedSoundSetsList").empty());
+  EXPECT_THROW(generic.call<void>("unloadSoundSet", "tones"), ZU::ZUError);
 }
 
 TEST_F(AudioPlayerService, ARunSoundPlaysTheWholeFile) {
-  proxy_->loadSoundSet("tones");
+  proxy.loadSoundSet("tones");
   // As "^runSound(tones/beep, 50)" plays it: synchronous, returning at the end.
-  proxy_->playSoundSetFile("tones", "beep", 0, 0.5, 0, 0);
-  const auto plays = timeline_->entries("ZUAudioPlayer", "playSoundSetFile");
+  proxy.playSoundSetFile("tones", "beep", 0, 0.5, 0, 0);
+  const auto plays = robot.timeline()->entries("ZUAudioPlayer", "playSoundSetFile");
   ASSERT_EQ(plays.size(), 1u);
   EXPECT_DOUBLE_EQ(plays[0].result.to<double>(), 0.2);
-  EXPECT_EQ(timeline_->entries("ZUAudioPlayer", "soundEnded").size(), 1u);
-  EXPECT_LE(plays[0].us, timeline_->entries("ZUAudioPlayer", "soundEnded")[0].us);
-
+  ASSERT_EQ(count("soundEnded"), 1u);
   // The name may carry its extension, in any case; the short form plays the whole file too.
-  generic_->call<void>("playSoundSetFile", "tones", "beep.wav");
-  proxy_->playSoundSetFile("tones", "beep.WAV", 0, 1.0, 0, 0);
-  EXPECT_EQ(timeline_->entries("ZUAudioPlayer", "soundEnded").size(), 3u);
+  generic.call<void>("playSoundSetFile", "tones", "beep.wav");
+  proxy.playSoundSetFile("tones", "beep.WAV", 0, 1.0, 0, 0);
+  EXPECT_EQ(count("soundEnded"), 3u);
 }
 
+// A posted play ends at its end or at its stop, even a stop that comes before it begins.
 TEST_F(AudioPlayerService, PostedPlaysAreWaitedForAndStopped) {
-  proxy_->loadSoundSet("tones");
-  const int beep = proxy_->post_playSoundSetFile("tones", "beep", 0, 0.3, 0, 0);
-  EXPECT_FALSE(proxy_->wait(beep, 0));  // 0: no limit; false: the play ended
-  EXPECT_TRUE(waiter_->waitFor("ZUAudioPlayer", "soundEnded"));
+  proxy.loadSoundSet("tones");
+  const int beep = proxy.post_playSoundSetFile("tones", "beep", 0, 0.3, 0, 0);
+  EXPECT_FALSE(proxy.wait(beep, 0));  // 0: no limit; false: the play ended
+  EXPECT_TRUE(waiter.waitFor("ZUAudioPlayer", "soundEnded"));
 
-  const int id = proxy_->post_playSoundSetFile("tones", "Long", 0, 0.3, 0, 0);
-  ASSERT_TRUE(waiter_->waitFor("ZUAudioPlayer", "playSoundSetFile", 2));
-  EXPECT_TRUE(proxy_->wait(id, 1));  // still playing
-  proxy_->stop(id);
-  EXPECT_FALSE(proxy_->wait(id, kBoundMs));
-  EXPECT_TRUE(waiter_->waitFor("ZUAudioPlayer", "soundStopped"));
-}
+  const int id = proxy.post_playSoundSetFile("tones", "Long", 0, 0.3, 0, 0);
+  ASSERT_TRUE(waiter.waitFor("ZUAudioPlayer", "playSoundSetFile", 2));
+  EXPECT_TRUE(proxy.wait(id, 1));  // still playing
+  proxy.stop(id);
+  EXPECT_FALSE(proxy.wait(id, kBoundMs));
+  EXPECT_TRUE(waiter.waitFor("ZUAudioPlayer", "soundStopped"));
 
-TEST_F(AudioPlayerService, AStopBeforeThePlayBeginsEndsIt) {
-  proxy_->loadSoundSet("tones");
-  const int id = proxy_->post_playSoundSetFile("tones", "Long", 0, 1.0, 0, 1);  // looping
-  proxy_->stop(id);
-  EXPECT_FALSE(proxy_->wait(id, kBoundMs));
+  // A stop that comes before the play begins ends it as it begins: the player's four
+  // threads play loops while the fifth play waits for one.
+  std::vector<int> loops;
+  for (int n = 0; n < 4; ++n)
+    loops.push_back(proxy.post_playSoundSetFile("tones", "Long", 0, 1.0, 0, 1));
+  ASSERT_TRUE(waiter.waitFor("ZUAudioPlayer", "playSoundSetFile", 6));
+  const int waiting = proxy.post_playSoundSetFile("tones", "Long", 0, 1.0, 0, 1);
+  proxy.stop(waiting);
+  proxy.stop(loops[0]);
+  EXPECT_FALSE(proxy.wait(waiting, kBoundMs));
+  generic.call<void>("stopAll");
 }
 
 TEST_F(AudioPlayerService, StopAllEndsEveryPlay) {
-  proxy_->loadSoundSet("tones");
-  const int posted = proxy_->post_playSoundSetFile("tones", "beep", 0, 1.0, 0, 1);  // looping
+  proxy.loadSoundSet("tones");
+  const int posted = proxy.post_playSoundSetFile("tones", "beep", 0, 1.0, 0, 1);  // looping
   auto direct = std::async(std::launch::async, [this] {
-    ZU::ZUAudioPlayerProxy(broker_).playSoundSetFile("tones", "Long", 0, 1.0, 0, 0);
+    ZU::ZUAudioPlayerProxy(robot.broker()).playSoundSetFile("tones", "Long", 0, 1.0, 0, 0);
   });
-  ASSERT_TRUE(waiter_->waitFor("ZUAudioPlayer", "playSoundSetFile", 2));
-  generic_->call<void>("stopAll");
-  EXPECT_FALSE(proxy_->wait(posted, kBoundMs));
-  ASSERT_EQ(direct.wait_for(kBound), std::future_status::ready);
+  ASSERT_TRUE(waiter.waitFor("ZUAudioPlayer", "playSoundSetFile", 2));
+  generic.call<void>("stopAll");
+  EXPECT_FALSE(proxy.wait(posted, kBoundMs));
+  ASSERT_EQ(direct.wait_for(std::chrono::milliseconds(kBoundMs)), std::future_status::ready);
   direct.get();
-  EXPECT_EQ(timeline_->entries("ZUAudioPlayer", "soundStopped").size(), 2u);
+  EXPECT_EQ(count("soundStopped"), 2u);
 }
 
+// Each refusal is an error to the caller, and on the timeline with its reason.
 TEST_F(AudioPlayerService, BadPlaysAreErrors) {
-  struct BadPlay {
+  const struct {
     const char* set;
     const char* file;
     double position;
     const char* reason;
-  };
-  const BadPlay cases[] = {
+  } cases[] = {
       {"tones", "boop", 0, "No sound \"boop\" in the sound set \"tones\""},
       {"bells", "ding", 0, "Sound set \"bells\" is not loaded"},
       {"tones", "beep", -1, "The position must be a number of seconds from 0"},
   };
-  proxy_->loadSoundSet("tones");
+  proxy.loadSoundSet("tones");
   for (const auto& c : cases) {
     try {
-      generic_->call<void>("playSoundSetFile", c.set, c.file, c.position, 1.0, 0.0, false);
+      generic.call<void>("playSoundSetFile", c.set, c.file, c.position, 1.0, 0.0, false);
       ADD_FAILURE() << c.reason;
     } catch (const ZU::ZUError& e) {
       EXPECT_THAT(e.description(), HasSubstr(c.reason));
     }
   }
   // A posted play that fails ends its task with the error; nothing keeps playing.
-  const int id = proxy_->post_playSoundSetFile("tones", "boop", 0, 1.0, 0, 0);
-  EXPECT_FALSE(proxy_->wait(id, kBoundMs));
-  EXPECT_TRUE(timeline_->entries("ZUAudioPlayer", "playSoundSetFile").empty());
-  // Each refusal is on the timeline, with its reason.
-  const auto refused = timeline_->entries("ZUAudioPlayer", "playFailed");
+  const int id = proxy.post_playSoundSetFile("tones", "boop", 0, 1.0, 0, 0);
+  EXPECT_FALSE(proxy.wait(id, kBoundMs));
+  EXPECT_EQ(count("playSoundSetFile"), 0u);
+  const auto refused = robot.timeline()->entries("ZUAudioPlayer", "playFailed");
   ASSERT_EQ(refused.size(), std::size(cases) + 1);
   for (std::size_t k = 0; k < std::size(cases); ++k)
     EXPECT_THAT(refused[k].result.to<std::string>(), HasSubstr(cases[k].reason));
-}
-
-TEST(StarterSounds, BellsAreShortRealSounds) {
-  auto session = std::make_shared<ko::Session>();
-  auto broker = ZU::ZUBroker::create(session);
-  auto timeline = std::make_shared<Timeline>();
-  auto player = ZU::ZUModule::createModule<ZUAudioPlayer>(broker, "ZUAudioPlayer", timeline);
-  ZU::ZUAudioPlayerProxy proxy(broker);
-  proxy.loadSoundSet("bells");
-  for (const std::string name : {"ding", "dong", "chime"}) {
-    proxy.playSoundSetFile("bells", name, 0, 0.5, 0, 0);
-    const auto plays = timeline->entries("ZUAudioPlayer", "playSoundSetFile");
-    ASSERT_FALSE(plays.empty());
-    const double seconds = plays.back().result.to<double>();
-    EXPECT_GE(seconds, 0.1) << name;
-    EXPECT_LE(seconds, 1.0) << name;
-  }
 }
 
 }  // namespace

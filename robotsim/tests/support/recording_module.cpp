@@ -23,6 +23,8 @@ void RecordingModule::onEvent(const std::string& memoryKey, const ZU::ZUValue& v
                                     std::chrono::steady_clock::now()});
   }
   fChanged.notify_all();
+  if (fHook)
+    fHook(*this, memoryKey);
 }
 
 void RecordingModule::failingCallback(const std::string& memoryKey, const ZU::ZUValue& /*value*/,

@@ -1,8 +1,9 @@
 #pragma once
 // RecordingModule: a module for the speech and memory tests that stands where the
 // service's module stands. It records the memory events it receives (key, value,
-// message, receiving thread, time) and the blocking-bookmark calls of the speech engine,
-// and can hold those calls on a latch until the test releases them.
+// message, receiving thread, time), runs a test's hook on each, records the
+// blocking-bookmark calls of the speech engine, and can hold those calls on a latch until
+// the test releases them.
 //
 // Callbacks arrive on the memory service's delivery threads and the speech engine's
 // blocking-call threads; the test thread reads and waits. One mutex and condition
@@ -16,6 +17,7 @@
 #include <mutex>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 #include "zu/zumodule.h"
@@ -45,6 +47,10 @@ class RecordingModule : public ZU::ZUModule {
   void _mrkpauseCallback(int bookmark);
 
   // ---- test side ----
+  // Runs `hook` after each event is recorded, in the delivering thread; set it before the
+  // module subscribes.
+  using Hook = std::function<void(const RecordingModule& self, const std::string& key)>;
+  void setHook(Hook hook) { fHook = std::move(hook); }
   void holdBlockingBookmarks();
   void releaseBlockingBookmarks();
   std::vector<ReceivedEvent> events() const;
@@ -62,6 +68,7 @@ class RecordingModule : public ZU::ZUModule {
   std::vector<ReceivedEvent> fEvents;
   std::vector<int> fBlocking;
   bool fHold = false;
+  Hook fHook;
 };
 
 // Whether a speech status [id, word] is among the events.
