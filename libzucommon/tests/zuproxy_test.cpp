@@ -115,20 +115,4 @@ TEST_F(ProxyTest, PostedCallsAreControlledThroughTheRemoteBuiltIns) {
   EXPECT_TRUE(greeter_->stopSeen);
 }
 
-TEST_F(ProxyTest, CallsFromManyThreadsAtOnce) {
-  const ZU::ZUProxy proxy("Greeter", process_.broker);
-  std::vector<std::thread> threads;
-  std::atomic<int> wrong{0};
-  for (int t = 0; t < 4; ++t) {
-    threads.emplace_back([&, t] {
-      for (int i = 0; i < 200; ++i)
-        if (proxy.call<int>("add", t, i) != t + i)
-          ++wrong;
-    });
-  }
-  for (auto& th : threads)
-    th.join();
-  EXPECT_EQ(wrong, 0);
-}
-
 }  // namespace

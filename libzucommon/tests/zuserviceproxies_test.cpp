@@ -4,9 +4,9 @@
 #include <gtest/gtest.h>
 
 #include <functional>
+#include <map>
 #include <memory>
 #include <mutex>
-#include <ostream>
 #include <string>
 #include <vector>
 
@@ -17,6 +17,7 @@
 namespace {
 
 using ko::AnyValue;
+using ::testing::ElementsAre;
 using ZU::ZUValue;
 
 // A stand-in for one robot service: publishes the methods it is given and records every
@@ -25,9 +26,7 @@ class FakeService : public ZU::ZUModule {
  public:
   using Handler = std::function<AnyValue(const std::vector<AnyValue>&)>;
   struct Method {
-    std::string name;
-    std::string parameters;
-    std::string returns;
+    std::string name, parameters, returns;
     Handler handler;
   };
 
@@ -38,7 +37,11 @@ class FakeService : public ZU::ZUModule {
       advertiseMethod(
           m.name, m.parameters, m.returns,
           [this, name = m.name, handler = m.handler](const std::vector<AnyValue>& args) {
-            record(name, args);
+            std::string signature;
+            for (const auto& a : args)
+              signature += a.signature();
+            std::lock_guard lock(fMutex);
+            fCalls.push_back(name + "(" + signature + ") " + AnyValue::list(args).toString());
             return handler(args);
           });
     }
@@ -50,13 +53,6 @@ class FakeService : public ZU::ZUModule {
   }
 
  private:
-  void record(const std::string& name, const std::vector<AnyValue>& args) {
-    std::string signature = "(";
-    for (const auto& a : args)
-      signature += a.signature();
-    std::lock_guard lock(fMutex);
-    fCalls.push_back(name + signature + ") " + AnyValue::list(args).toString());
-  }
   mutable std::mutex fMutex;
   std::vector<std::string> fCalls;
 };
@@ -65,387 +61,190 @@ FakeService::Handler reply(AnyValue value) {
   return [value](const std::vector<AnyValue>&) { return value; };
 }
 
-template <class T>
-std::string print(const T& result) {
-  return AnyValue::from(result).toString();
+FakeService::Handler raise(const char* service, const char* method, const char* text) {
+  return [=](const std::vector<AnyValue>&) -> AnyValue { ZU_THROW_ERROR(service, method, text); };
 }
 
-using Broker = std::shared_ptr<ZU::ZUBroker>;
+// Every robot service with the methods that the program calls, as its fake publishes them.
+class ServiceProxyTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    const std::map<std::string, std::vector<FakeService::Method>> services = {
+        {"ZUMemory",
+         {{"declareEvent", "(ss)", "v", reply({})},
+          {"raiseEvent", "(sm)", "v", reply({})},
+          {"subscribeToEvent", "(sss)", "v", reply({})},
+          {"subscribeToMicroEvent", "(ssss)", "v", reply({})},
+          {"unsubscribeToEvent", "(ss)", "v", reply({})}}},
+        {"ZUTextToSpeech",
+         {{"say", "(s)", "v", reply({})},
+          {"setParameter", "(sf)", "v", reply({})},
+          {"enableNotifications", "()", "v", reply({})},
+          {"getLanguage", "()", "s", reply("French")}}},
+        {"ZUBehaviorManager",
+         {{"resolveBehaviorName", "(s)", "s", reply("animations/Stand/Gestures/Hey_1")},
+          {"preloadBehavior", "(s)", "b", reply(true)},
+          {"getInstalledBehaviors", "()", "[s]", reply(AnyValue::list({"a/Hey_1", "a/Hey_2"}))},
+          {"getBehaviorTags", "(s)", "[s]", reply(AnyValue::list({"hello", "hi"}))},
+          {"startBehavior", "(s)", "v", reply({})},
+          {"stopBehavior", "(s)", "v", reply({})},
+          {"runBehavior", "(s)", "v", reply({})},
+          {"isBehaviorRunning", "(s)", "b", reply(false)}}},
+        {"ZUMotion",
+         {{"areResourcesAvailable", "([s])", "b", reply(true)},
+          {"getAngles", "(mb)", "[f]", reply(AnyValue::list({AnyValue(0.25f)}))},
+          {"angleInterpolationBezier", "(mmm)", "v", reply({})},
+          {"setAngles", "(mmf)", "v", reply({})},
+          {"getBreathEnabled", "(s)", "b", reply(true)},
+          {"setBreathEnabled", "(sb)", "v", reply({})}}},
+        {"ZUAudioPlayer",
+         {{"loadSoundSet", "(s)", "v", raise("ZUAudioPlayer", "loadSoundSet", "unknown set")},
+          {"playSoundSetFile", "(ssidii)", "v", reply({})}}},
+        {"ZURobotPosture", {{"getPostureFamily", "()", "s", reply("Sitting")}}},
+        {"ZURobotModel", {{"_getRobotType", "()", "i", reply(2)}}},
+        {"ZUAutonomousMoves",
+         {{"_moveForward", "()", "v", reply({})},
+          {"_moveBackward", "()", "v", reply({})},
+          {"_moveSides", "()", "v", reply({})}}},
+    };
+    for (const auto& [name, methods] : services)
+      fakes_[name] = ZU::ZUModule::createModule<FakeService>(process_.broker, name, methods);
+  }
+  std::vector<std::string> calls(const std::string& service) { return fakes_[service]->calls(); }
 
-struct ServiceCase {
-  const char* name;
-  const char* service;
-  // The method that the fake publishes; none for the built-in task methods.
-  const char* method;
-  const char* parameters;
-  const char* returns;
-  AnyValue answer;
-  // Makes the proxy, calls it and prints the result.
-  std::function<std::string(const Broker&)> call;
-  const char* expectedCall;  // "" when the fake records nothing
-  const char* expectedResult;
+  zutest::Process process_;
+  std::map<std::string, std::shared_ptr<FakeService>> fakes_;
 };
 
-void PrintTo(const ServiceCase& c, std::ostream* os) {
-  *os << '"' << c.name << '"';
+// Each member calls its remote method by name with its arguments as ko values, and converts
+// the result; a post answers a task id that the service's built-in wait knows.
+TEST_F(ServiceProxyTest, EachMemberCallsItsMethodByNameAndConvertsTheResult) {
+  const auto& b = process_.broker;
+  const ZU::ZUMemoryProxy memory(b);
+  memory.declareEvent("ZUMokuto/EndOfMokuto", "ZUMokuto");
+  memory.raiseEvent("ZUMokuto/EndOfMokuto", ZUValue(3));
+  memory.subscribeToEvent("PostureFamilyChanged", "ZUMokuto", "_postureCallback");
+  memory.subscribeToMicroEvent("WordRecognized", "ZUMokuto", "message", "_dialogCallback");
+  memory.unsubscribeToEvent("PostureFamilyChanged", "ZUMokuto");
+  EXPECT_THAT(
+      calls("ZUMemory"),
+      ElementsAre(
+          R"(declareEvent(ss) ["ZUMokuto/EndOfMokuto", "ZUMokuto"])",
+          R"(raiseEvent(si) ["ZUMokuto/EndOfMokuto", 3])",
+          R"(subscribeToEvent(sss) ["PostureFamilyChanged", "ZUMokuto", "_postureCallback"])",
+          R"(subscribeToMicroEvent(ssss) ["WordRecognized", "ZUMokuto", "message", "_dialogCallback"])",
+          R"(unsubscribeToEvent(ss) ["PostureFamilyChanged", "ZUMokuto"])"));
+
+  const ZU::ZUTextToSpeechProxy tts(b);
+  tts.say("Hello");
+  EXPECT_FALSE(tts.wait(tts.post_say("Hello \\mrk=1\\ world"), 0));
+  EXPECT_FALSE(tts.isRunning(77));
+  EXPECT_FALSE(tts.wait(77, 0));
+  tts.stop(77);
+  tts.setParameter("inputMode", 2.0f);
+  tts.enableNotifications();
+  EXPECT_EQ(tts.getLanguage(), "French");
+  EXPECT_THAT(calls("ZUTextToSpeech"),
+              ElementsAre(R"(say(s) ["Hello"])", R"(say(s) ["Hello \\mrk=1\\ world"])",
+                          R"(setParameter(sf) ["inputMode", 2])", "enableNotifications() []",
+                          "getLanguage() []"));
+
+  const ZU::ZUBehaviorManagerProxy bm(b);
+  EXPECT_EQ(bm.resolveBehaviorName("Hey_1"), "animations/Stand/Gestures/Hey_1");
+  EXPECT_TRUE(bm.preloadBehavior("a/Hey_1"));
+  EXPECT_FALSE(bm.wait(bm.post_preloadBehavior("a/Hey_2"), 0));
+  EXPECT_THAT(bm.getInstalledBehaviors(), ElementsAre("a/Hey_1", "a/Hey_2"));
+  EXPECT_THAT(bm.getBehaviorTags("a/Hey_1"), ElementsAre("hello", "hi"));
+  bm.startBehavior("a/Hey_1");
+  bm.stopBehavior("a/Hey_1");
+  EXPECT_FALSE(bm.wait(bm.post_stopBehavior("a/Hey_2"), 0));
+  bm.runBehavior("a/End");
+  EXPECT_FALSE(bm.wait(bm.post_runBehavior("a/End2"), 0));
+  EXPECT_FALSE(bm.isBehaviorRunning("a/Hey_1"));
+  EXPECT_THAT(calls("ZUBehaviorManager"),
+              ElementsAre(R"(resolveBehaviorName(s) ["Hey_1"])",
+                          R"(preloadBehavior(s) ["a/Hey_1"])", R"(preloadBehavior(s) ["a/Hey_2"])",
+                          "getInstalledBehaviors() []", R"(getBehaviorTags(s) ["a/Hey_1"])",
+                          R"(startBehavior(s) ["a/Hey_1"])", R"(stopBehavior(s) ["a/Hey_1"])",
+                          R"(stopBehavior(s) ["a/Hey_2"])", R"(runBehavior(s) ["a/End"])",
+                          R"(runBehavior(s) ["a/End2"])", R"(isBehaviorRunning(s) ["a/Hey_1"])"));
+
+  const ZU::ZUMotionProxy motion(b);
+  const ZUValue joints = ZUValue::makeArray({"HeadYaw"});
+  const ZUValue times = ZUValue::makeArray({ZUValue::makeArray({0.5f})});
+  const ZUValue points = ZUValue::makeArray({ZUValue::makeArray({0.25f})});
+  EXPECT_TRUE(motion.areResourcesAvailable({"Head"}));
+  EXPECT_THAT(motion.getAngles("HeadYaw", false), ElementsAre(0.25f));
+  motion.angleInterpolationBezier(joints, times, points);
+  EXPECT_FALSE(motion.wait(motion.post_angleInterpolationBezier(points, joints, times), 10000));
+  motion.setAngles("HeadYaw", 0.25f, 1.0f);
+  EXPECT_FALSE(motion.wait(77, 0));
+  motion.stop(77);
+  EXPECT_TRUE(motion.getBreathEnabled("Arms"));
+  motion.setBreathEnabled("Arms", false);
+  EXPECT_THAT(
+      calls("ZUMotion"),
+      ElementsAre(R"(areResourcesAvailable([s]) [["Head"]])", R"(getAngles(sb) ["HeadYaw", false])",
+                  R"(angleInterpolationBezier([s][[f]][[f]]) [["HeadYaw"], [[0.5]], [[0.25]]])",
+                  R"(angleInterpolationBezier([[f]][s][[f]]) [[[0.25]], ["HeadYaw"], [[0.5]]])",
+                  R"(setAngles(sff) ["HeadYaw", 0.25, 1])", R"(getBreathEnabled(s) ["Arms"])",
+                  R"(setBreathEnabled(sb) ["Arms", false])"));
+
+  const ZU::ZUAudioPlayerProxy audio(b);
+  audio.playSoundSetFile("bells", "ding", 1, 0.5, 2, 3);
+  EXPECT_FALSE(audio.wait(audio.post_playSoundSetFile("bells", "dong", 0, 1.0, 0, 0), 0));
+  audio.stop(77);
+  EXPECT_EQ(zutest::errorOf([&] { audio.loadSoundSet("x"); }), "unknown set");
+  EXPECT_THAT(calls("ZUAudioPlayer"),
+              ElementsAre(R"(playSoundSetFile(ssidii) ["bells", "ding", 1, 0.5, 2, 3])",
+                          R"(playSoundSetFile(ssidii) ["bells", "dong", 0, 1, 0, 0])",
+                          R"(loadSoundSet(s) ["x"])"));
+
+  EXPECT_EQ(ZU::ZURobotPostureProxy(b).getPostureFamily(), "Sitting");
+  EXPECT_EQ(ZU::ZURobotModelProxy(b)._getRobotType(), 2);
+  const ZU::ZUAutonomousMovesProxy moves(b);
+  moves._moveForward();
+  moves._moveBackward();
+  moves._moveSides();
+  EXPECT_THAT(calls("ZUAutonomousMoves"),
+              ElementsAre("_moveForward() []", "_moveBackward() []", "_moveSides() []"));
 }
 
-class ServiceProxyTest : public ::testing::TestWithParam<ServiceCase> {};
-
-TEST_P(ServiceProxyTest, CallsTheRemoteMethodByNameAndConvertsTheResult) {
-  const ServiceCase& c = GetParam();
-  zutest::Process process;
-  std::vector<FakeService::Method> methods;
-  if (*c.method)
-    methods.push_back({c.method, c.parameters, c.returns, reply(c.answer)});
-  auto fake =
-      ZU::ZUModule::createModule<FakeService>(process.broker, c.service, std::move(methods));
-
-  EXPECT_EQ(c.call(process.broker), c.expectedResult);
-  if (*c.expectedCall)
-    EXPECT_THAT(fake->calls(), ::testing::ElementsAre(c.expectedCall));
-  else
-    EXPECT_TRUE(fake->calls().empty());
-}
-
-// Posts wait for their task through the service's built-in wait and print its answer.
-INSTANTIATE_TEST_SUITE_P(
-    Services, ServiceProxyTest,
-    ::testing::Values(
-        // ZUMemory
-        ServiceCase{"declareEvent", "ZUMemory", "declareEvent", "(ss)", "v", AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUMemoryProxy(b).declareEvent("ZUMokuto/EndOfMokuto", "ZUMokuto");
-                      return std::string("void");
-                    },
-                    R"(declareEvent(ss) ["ZUMokuto/EndOfMokuto", "ZUMokuto"])", "void"},
-        ServiceCase{"raiseEvent", "ZUMemory", "raiseEvent", "(sm)", "v", AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUMemoryProxy(b).raiseEvent("ZUMokuto/EndOfMokuto", ZUValue(3));
-                      return std::string("void");
-                    },
-                    R"(raiseEvent(si) ["ZUMokuto/EndOfMokuto", 3])", "void"},
-        ServiceCase{
-            "subscribeToEvent", "ZUMemory", "subscribeToEvent", "(sss)", "v", AnyValue(),
-            [](const Broker& b) {
-              ZU::ZUMemoryProxy(b).subscribeToEvent("PostureFamilyChanged", "ZUMokuto",
-                                                    "_postureFamilyChangedCallback");
-              return std::string("void");
-            },
-            R"(subscribeToEvent(sss) ["PostureFamilyChanged", "ZUMokuto", "_postureFamilyChangedCallback"])",
-            "void"},
-        ServiceCase{
-            "subscribeToMicroEvent", "ZUMemory", "subscribeToMicroEvent", "(ssss)", "v", AnyValue(),
-            [](const Broker& b) {
-              ZU::ZUMemoryProxy(b).subscribeToMicroEvent("WordRecognized", "ZUMokuto",
-                                                         "_dialogMatchedInputCallback",
-                                                         "_dialogMatchedInputCallback");
-              return std::string("void");
-            },
-            R"(subscribeToMicroEvent(ssss) ["WordRecognized", "ZUMokuto", "_dialogMatchedInputCallback", "_dialogMatchedInputCallback"])",
-            "void"},
-        ServiceCase{"unsubscribeToEvent", "ZUMemory", "unsubscribeToEvent", "(ss)", "v", AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUMemoryProxy(b).unsubscribeToEvent("PostureFamilyChanged", "ZUMokuto");
-                      return std::string("void");
-                    },
-                    R"(unsubscribeToEvent(ss) ["PostureFamilyChanged", "ZUMokuto"])", "void"},
-        // ZUTextToSpeech
-        ServiceCase{"say", "ZUTextToSpeech", "say", "(s)", "v", AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUTextToSpeechProxy(b).say("Hello");
-                      return std::string("void");
-                    },
-                    R"(say(s) ["Hello"])", "void"},
-        ServiceCase{"postSay", "ZUTextToSpeech", "say", "(s)", "v", AnyValue(),
-                    [](const Broker& b) {
-                      const ZU::ZUTextToSpeechProxy tts(b);
-                      const int id = tts.post_say("Hello \\mrk=1\\ world");
-                      return print(tts.wait(id, 0));
-                    },
-                    R"(say(s) ["Hello \\mrk=1\\ world"])", "false"},
-        ServiceCase{"ttsIsRunning", "ZUTextToSpeech", "", "", "", AnyValue(),
-                    [](const Broker& b) { return print(ZU::ZUTextToSpeechProxy(b).isRunning(77)); },
-                    "", "false"},
-        ServiceCase{"ttsWait", "ZUTextToSpeech", "", "", "", AnyValue(),
-                    [](const Broker& b) { return print(ZU::ZUTextToSpeechProxy(b).wait(77, 0)); },
-                    "", "false"},
-        ServiceCase{"ttsStop", "ZUTextToSpeech", "", "", "", AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUTextToSpeechProxy(b).stop(77);
-                      return std::string("void");
-                    },
-                    "", "void"},
-        ServiceCase{"setParameter", "ZUTextToSpeech", "setParameter", "(sf)", "v", AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUTextToSpeechProxy(b).setParameter("inputMode", 2.0f);
-                      return std::string("void");
-                    },
-                    R"(setParameter(sf) ["inputMode", 2])", "void"},
-        ServiceCase{"enableNotifications", "ZUTextToSpeech", "enableNotifications", "()", "v",
-                    AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUTextToSpeechProxy(b).enableNotifications();
-                      return std::string("void");
-                    },
-                    "enableNotifications() []", "void"},
-        ServiceCase{"getLanguage", "ZUTextToSpeech", "getLanguage", "()", "s", AnyValue("French"),
-                    [](const Broker& b) { return print(ZU::ZUTextToSpeechProxy(b).getLanguage()); },
-                    "getLanguage() []", R"("French")"},
-        // ZUBehaviorManager
-        ServiceCase{"resolveBehaviorName", "ZUBehaviorManager", "resolveBehaviorName", "(s)", "s",
-                    AnyValue("animations/Stand/Gestures/Hey_1"),
-                    [](const Broker& b) {
-                      return print(ZU::ZUBehaviorManagerProxy(b).resolveBehaviorName("Hey_1"));
-                    },
-                    R"(resolveBehaviorName(s) ["Hey_1"])", R"("animations/Stand/Gestures/Hey_1")"},
-        ServiceCase{"preloadBehavior", "ZUBehaviorManager", "preloadBehavior", "(s)", "b",
-                    AnyValue(true),
-                    [](const Broker& b) {
-                      return print(ZU::ZUBehaviorManagerProxy(b).preloadBehavior("a/Hey_1"));
-                    },
-                    R"(preloadBehavior(s) ["a/Hey_1"])", "true"},
-        ServiceCase{"postPreloadBehavior", "ZUBehaviorManager", "preloadBehavior", "(s)", "b",
-                    AnyValue(true),
-                    [](const Broker& b) {
-                      const ZU::ZUBehaviorManagerProxy bm(b);
-                      return print(bm.wait(bm.post_preloadBehavior("a/Hey_1"), 0));
-                    },
-                    R"(preloadBehavior(s) ["a/Hey_1"])", "false"},
-        ServiceCase{"getInstalledBehaviors", "ZUBehaviorManager", "getInstalledBehaviors", "()",
-                    "[s]", AnyValue::list({"a/Hey_1", "a/Hey_2"}),
-                    [](const Broker& b) {
-                      return print(ZU::ZUBehaviorManagerProxy(b).getInstalledBehaviors());
-                    },
-                    "getInstalledBehaviors() []", R"(["a/Hey_1", "a/Hey_2"])"},
-        ServiceCase{"getBehaviorTags", "ZUBehaviorManager", "getBehaviorTags", "(s)", "[s]",
-                    AnyValue::list({"hello", "hi"}),
-                    [](const Broker& b) {
-                      return print(ZU::ZUBehaviorManagerProxy(b).getBehaviorTags("a/Hey_1"));
-                    },
-                    R"(getBehaviorTags(s) ["a/Hey_1"])", R"(["hello", "hi"])"},
-        ServiceCase{"startBehavior", "ZUBehaviorManager", "startBehavior", "(s)", "v", AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUBehaviorManagerProxy(b).startBehavior("a/Hey_1");
-                      return std::string("void");
-                    },
-                    R"(startBehavior(s) ["a/Hey_1"])", "void"},
-        ServiceCase{"stopBehavior", "ZUBehaviorManager", "stopBehavior", "(s)", "v", AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUBehaviorManagerProxy(b).stopBehavior("a/Hey_1");
-                      return std::string("void");
-                    },
-                    R"(stopBehavior(s) ["a/Hey_1"])", "void"},
-        ServiceCase{"postStopBehavior", "ZUBehaviorManager", "stopBehavior", "(s)", "v", AnyValue(),
-                    [](const Broker& b) {
-                      const ZU::ZUBehaviorManagerProxy bm(b);
-                      return print(bm.wait(bm.post_stopBehavior("a/Hey_1"), 0));
-                    },
-                    R"(stopBehavior(s) ["a/Hey_1"])", "false"},
-        ServiceCase{"runBehavior", "ZUBehaviorManager", "runBehavior", "(s)", "v", AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUBehaviorManagerProxy(b).runBehavior("a/End");
-                      return std::string("void");
-                    },
-                    R"(runBehavior(s) ["a/End"])", "void"},
-        ServiceCase{"postRunBehavior", "ZUBehaviorManager", "runBehavior", "(s)", "v", AnyValue(),
-                    [](const Broker& b) {
-                      const ZU::ZUBehaviorManagerProxy bm(b);
-                      return print(bm.wait(bm.post_runBehavior("a/End"), 0));
-                    },
-                    R"(runBehavior(s) ["a/End"])", "false"},
-        ServiceCase{"isBehaviorRunning", "ZUBehaviorManager", "isBehaviorRunning", "(s)", "b",
-                    AnyValue(false),
-                    [](const Broker& b) {
-                      return print(ZU::ZUBehaviorManagerProxy(b).isBehaviorRunning("a/Hey_1"));
-                    },
-                    R"(isBehaviorRunning(s) ["a/Hey_1"])", "false"},
-        // ZUMotion
-        ServiceCase{"areResourcesAvailable", "ZUMotion", "areResourcesAvailable", "([s])", "b",
-                    AnyValue(true),
-                    [](const Broker& b) {
-                      return print(ZU::ZUMotionProxy(b).areResourcesAvailable({"Head"}));
-                    },
-                    R"(areResourcesAvailable([s]) [["Head"]])", "true"},
-        ServiceCase{
-            "getAngles", "ZUMotion", "getAngles", "(mb)", "[f]", AnyValue::list({AnyValue(0.25f)}),
-            [](const Broker& b) { return print(ZU::ZUMotionProxy(b).getAngles("HeadYaw", false)); },
-            R"(getAngles(sb) ["HeadYaw", false])", "[0.25]"},
-        ServiceCase{
-            "angleInterpolationBezier", "ZUMotion", "angleInterpolationBezier", "(mmm)", "v",
-            AnyValue(),
-            [](const Broker& b) {
-              ZU::ZUMotionProxy(b).angleInterpolationBezier(
-                  ZUValue::makeArray({"HeadYaw"}), ZUValue::makeArray({ZUValue::makeArray({0.5f})}),
-                  ZUValue::makeArray({ZUValue::makeArray({0.25f})}));
-              return std::string("void");
-            },
-            R"(angleInterpolationBezier([s][[f]][[f]]) [["HeadYaw"], [[0.5]], [[0.25]]])", "void"},
-        ServiceCase{"postAngleInterpolationBezier", "ZUMotion", "angleInterpolationBezier", "(mmm)",
-                    "v", AnyValue(),
-                    [](const Broker& b) {
-                      const ZU::ZUMotionProxy motion(b);
-                      const int id = motion.post_angleInterpolationBezier(
-                          ZUValue::makeArray({"HeadPitch"}),
-                          ZUValue::makeArray({ZUValue::makeArray({1.0f})}),
-                          ZUValue::makeArray({ZUValue::makeArray({0.0f})}));
-                      return print(motion.wait(id, 10000));
-                    },
-                    R"(angleInterpolationBezier([s][[f]][[f]]) [["HeadPitch"], [[1]], [[0]]])",
-                    "false"},
-        ServiceCase{"setAngles", "ZUMotion", "setAngles", "(mmf)", "v", AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUMotionProxy(b).setAngles("HeadYaw", 0.25f, 1.0f);
-                      return std::string("void");
-                    },
-                    R"(setAngles(sff) ["HeadYaw", 0.25, 1])", "void"},
-        ServiceCase{"motionWait", "ZUMotion", "", "", "", AnyValue(),
-                    [](const Broker& b) { return print(ZU::ZUMotionProxy(b).wait(77, 10000)); }, "",
-                    "false"},
-        ServiceCase{"motionStop", "ZUMotion", "", "", "", AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUMotionProxy(b).stop(77);
-                      return std::string("void");
-                    },
-                    "", "void"},
-        ServiceCase{
-            "getBreathEnabled", "ZUMotion", "getBreathEnabled", "(s)", "b", AnyValue(true),
-            [](const Broker& b) { return print(ZU::ZUMotionProxy(b).getBreathEnabled("Arms")); },
-            R"(getBreathEnabled(s) ["Arms"])", "true"},
-        ServiceCase{"setBreathEnabled", "ZUMotion", "setBreathEnabled", "(sb)", "v", AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUMotionProxy(b).setBreathEnabled("Arms", false);
-                      return std::string("void");
-                    },
-                    R"(setBreathEnabled(sb) ["Arms", false])", "void"},
-        // ZUAudioPlayer
-        ServiceCase{"loadSoundSet", "ZUAudioPlayer", "loadSoundSet", "(s)", "v", AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUAudioPlayerProxy(b).loadSoundSet("bells");
-                      return std::string("void");
-                    },
-                    R"(loadSoundSet(s) ["bells"])", "void"},
-        ServiceCase{"playSoundSetFile", "ZUAudioPlayer", "playSoundSetFile", "(ssidii)", "v",
-                    AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUAudioPlayerProxy(b).playSoundSetFile("bells", "ding", 0, 0.5, 0, 0);
-                      return std::string("void");
-                    },
-                    R"(playSoundSetFile(ssidii) ["bells", "ding", 0, 0.5, 0, 0])", "void"},
-        ServiceCase{"postPlaySoundSetFile", "ZUAudioPlayer", "playSoundSetFile", "(ssidii)", "v",
-                    AnyValue(),
-                    [](const Broker& b) {
-                      const ZU::ZUAudioPlayerProxy audio(b);
-                      return print(audio.wait(
-                          audio.post_playSoundSetFile("bells", "ding", 0, 1.0, 0, 0), 0));
-                    },
-                    R"(playSoundSetFile(ssidii) ["bells", "ding", 0, 1, 0, 0])", "false"},
-        ServiceCase{"audioStop", "ZUAudioPlayer", "", "", "", AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUAudioPlayerProxy(b).stop(77);
-                      return std::string("void");
-                    },
-                    "", "void"},
-        ServiceCase{"audioWait", "ZUAudioPlayer", "", "", "", AnyValue(),
-                    [](const Broker& b) { return print(ZU::ZUAudioPlayerProxy(b).wait(77, 0)); },
-                    "", "false"},
-        // ZURobotPosture, ZURobotModel, ZUAutonomousMoves
-        ServiceCase{
-            "getPostureFamily", "ZURobotPosture", "getPostureFamily", "()", "s",
-            AnyValue("Sitting"),
-            [](const Broker& b) { return print(ZU::ZURobotPostureProxy(b).getPostureFamily()); },
-            "getPostureFamily() []", R"("Sitting")"},
-        ServiceCase{"getRobotType", "ZURobotModel", "_getRobotType", "()", "i", AnyValue(2),
-                    [](const Broker& b) { return print(ZU::ZURobotModelProxy(b)._getRobotType()); },
-                    "_getRobotType() []", "2"},
-        ServiceCase{"moveForward", "ZUAutonomousMoves", "_moveForward", "()", "v", AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUAutonomousMovesProxy(b)._moveForward();
-                      return std::string("void");
-                    },
-                    "_moveForward() []", "void"},
-        ServiceCase{"moveBackward", "ZUAutonomousMoves", "_moveBackward", "()", "v", AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUAutonomousMovesProxy(b)._moveBackward();
-                      return std::string("void");
-                    },
-                    "_moveBackward() []", "void"},
-        ServiceCase{"moveSides", "ZUAutonomousMoves", "_moveSides", "()", "v", AnyValue(),
-                    [](const Broker& b) {
-                      ZU::ZUAutonomousMovesProxy(b)._moveSides();
-                      return std::string("void");
-                    },
-                    "_moveSides() []", "void"}),
-    [](const auto& param) { return std::string(param.param.name); });
-
-TEST(ServiceProxyTest, AServiceThatIsGoneRaisesModuleDestroyed) {
-  zutest::Process process;
-  auto tts = ZU::ZUModule::createModule<FakeService>(
-      process.broker, "ZUTextToSpeech",
-      std::vector<FakeService::Method>{{"getLanguage", "()", "s", reply(AnyValue("French"))},
-                                       {"say", "(s)", "v", reply(AnyValue())}});
-  const ZU::ZUTextToSpeechProxy proxy(process.broker);
-  EXPECT_EQ(proxy.getLanguage(), "French");
-
-  tts->exit();
-  tts.reset();
+TEST_F(ServiceProxyTest, AServiceThatIsGoneRaisesModuleDestroyed) {
+  const ZU::ZUTextToSpeechProxy proxy(process_.broker);
+  fakes_["ZUTextToSpeech"]->exit();
+  fakes_.erase("ZUTextToSpeech");
   for (const auto& call : std::vector<std::function<void()>>{[&] { proxy.getLanguage(); },
                                                              [&] { proxy.post_say("Hello"); },
                                                              [&] { proxy.wait(1, 0); }}) {
     try {
       call();
-      FAIL() << "no error";
+      ADD_FAILURE() << "no error";
     } catch (const ZU::ZUError& e) {
-      EXPECT_EQ(e.moduleName(), "ZUProxy");
-      EXPECT_EQ(e.description(), "module destroyed");
+      EXPECT_EQ(e.moduleName() + ": " + e.description(), "ZUProxy: module destroyed");
     }
   }
+  EXPECT_EQ(zutest::errorOf([&] { ZU::ZUTextToSpeechProxy again(process_.broker); }),
+            "Can't find service: ZUTextToSpeech");
 }
 
-TEST(ServiceProxyTest, AMissingServiceLeavesNoProxy) {
-  zutest::Process process;
-  EXPECT_EQ(zutest::errorOf([&] { ZU::ZUMotionProxy motion(process.broker); }),
-            "Can't find service: ZUMotion");
-}
-
-TEST(ServiceProxyTest, TheRemoteErrorReachesTheCaller) {
+TEST(PreloadTest, PreloadsAndWaitsAndLogsAFailureAsAWarning) {
   zutest::Process process;
   auto fake = ZU::ZUModule::createModule<FakeService>(
-      process.broker, "ZUAudioPlayer",
+      process.broker, "ZUBehaviorManager",
       std::vector<FakeService::Method>{
-          {"loadSoundSet", "(s)", "v", [](const std::vector<AnyValue>&) -> AnyValue {
-             ZU_THROW_ERROR("ZUAudioPlayer", "loadSoundSet", "unknown sound set");
+          {"preloadBehavior", "(s)", "b", [](const std::vector<AnyValue>& args) -> AnyValue {
+             if (args[0].to<std::string>() == "animations/Hey_9")
+               ZU_THROW_ERROR("ZUBehaviorManager", "preloadBehavior", "no such behavior");
+             return true;
            }}});
-  EXPECT_EQ(zutest::errorOf([&] { ZU::ZUAudioPlayerProxy(process.broker).loadSoundSet("x"); }),
-            "unknown sound set");
-}
+  const auto proxy = std::make_shared<ZU::ZUBehaviorManagerProxy>(process.broker);
+  EXPECT_TRUE(ZU::preloadABehavior(proxy, "animations/Stand/Gestures/Hey_1"));
+  EXPECT_THAT(fake->calls(),
+              ElementsAre(R"(preloadBehavior(s) ["animations/Stand/Gestures/Hey_1"])"));
 
-class PreloadTest : public ::testing::Test {
- protected:
-  void publish(FakeService::Handler handler) {
-    fake_ = ZU::ZUModule::createModule<FakeService>(
-        process_.broker, "ZUBehaviorManager",
-        std::vector<FakeService::Method>{{"preloadBehavior", "(s)", "b", std::move(handler)}});
-    proxy_ = std::make_shared<ZU::ZUBehaviorManagerProxy>(process_.broker);
-  }
-  zutest::Process process_;
-  std::shared_ptr<FakeService> fake_;
-  std::shared_ptr<ZU::ZUBehaviorManagerProxy> proxy_;
-};
-
-TEST_F(PreloadTest, PreloadsAndWaits) {
-  publish(reply(AnyValue(true)));
-  EXPECT_TRUE(ZU::preloadABehavior(proxy_, "animations/Stand/Gestures/Hey_1"));
-  EXPECT_THAT(fake_->calls(),
-              ::testing::ElementsAre(R"(preloadBehavior(s) ["animations/Stand/Gestures/Hey_1"])"));
-}
-
-TEST_F(PreloadTest, AFailureIsLoggedAsAWarning) {
-  publish([](const std::vector<AnyValue>&) -> AnyValue {
-    ZU_THROW_ERROR("ZUBehaviorManager", "preloadBehavior", "no such behavior");
-  });
   ko::log::ScopedCapture cap;
-  EXPECT_FALSE(ZU::preloadABehavior(proxy_, "animations/Hey_9"));
+  EXPECT_FALSE(ZU::preloadABehavior(proxy, "animations/Hey_9"));
   EXPECT_TRUE(cap->contains("zucommon.zuproxy", ko::log::Warning,
                             "ZUBehaviorManager can't preload the behavior \"animations/Hey_9\" "
                             "exception: \tZUBehaviorManager::preloadBehavior\n\tno such behavior"));
