@@ -82,7 +82,7 @@ TEST_F(TaskTest, StopSetsTheFlagThatTheTaskReadsThroughItsCurrentTask) {
   EXPECT_EQ(greeter_->currentTask(), nullptr);
 }
 
-TEST_F(TaskTest, PCallWithoutAMethodNameRaises) {
+TEST_F(TaskTest, PCallWithoutAMethodNameOrByAnUnknownIdRaises) {
   const ZU::ZUProxy proxy("Greeter", process_.broker);
   for (const AnyValue& args : {callList({}), AnyValue(), callList({42, 1})}) {
     try {
@@ -94,6 +94,8 @@ TEST_F(TaskTest, PCallWithoutAMethodNameRaises) {
     // Called by name, as another service would.
     EXPECT_EQ(zutest::errorOf([&] { proxy.call<int>("pCall", args); }), "missing function name");
   }
+  EXPECT_EQ(zutest::errorOf([&] { greeter_->pCallById(9999, callList({})); }),
+            "Cant find methodId #9999 on module:Greeter");
 }
 
 TEST_F(TaskTest, PCallPicksTheOverloadThatTakesTheArguments) {
@@ -103,11 +105,6 @@ TEST_F(TaskTest, PCallPicksTheOverloadThatTakesTheArguments) {
   EXPECT_NE(first, second);
   EXPECT_FALSE(greeter_->wait(second, 0));
   EXPECT_THAT(greeter_->said(), ::testing::ElementsAre("hello", R"(hi with ["mode", 2])"));
-}
-
-TEST_F(TaskTest, PostedCallByAnUnknownIdIsRefused) {
-  EXPECT_EQ(zutest::errorOf([&] { greeter_->pCallById(9999, callList({})); }),
-            "Cant find methodId #9999 on module:Greeter");
 }
 
 TEST_F(TaskTest, ACallThatFailsOrWhoseArgumentsDoNotConvertEndsItsTaskAndIsLogged) {
