@@ -290,6 +290,25 @@ TEST_F(RemoteTest, MessagesThatMakeNoSenseGetAnErrorReply) {
   strict->closeLink();
 }
 
+TEST_F(RemoteTest, ConnectedProcessesPublishTheirServicesAgainWhenTheListeningOneComesBack) {
+  DynamicObjectBuilder script;
+  script.advertiseMethod("twice", [](int n) { return 2 * n; });
+  peer->registerService("Script", script.object());
+  // Shared with the listener, which may be called after the test's end.
+  const auto lost = std::make_shared<test::Counter>();
+  const auto linked = std::make_shared<test::Counter>();
+  peer->setLinkListener([lost, linked](bool up) { (up ? *linked : *lost).increment(); });
+
+  hub->closeLink();
+  ASSERT_TRUE(lost->waitFor(1));
+  auto again = std::make_shared<Session>();
+  again->listen(endpoint, fastOptions("hub again"));
+  ASSERT_TRUE(linked->waitFor(1));
+  ASSERT_TRUE(test::eventually([&] { return again->service("Script").hasValue(100); }));
+  EXPECT_EQ(again->service("Script").value(10000)->call<int>("twice", 4), 8);
+  again->closeLink();
+}
+
 }  // namespace
 }  // namespace ko
 

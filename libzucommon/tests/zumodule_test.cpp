@@ -102,6 +102,8 @@ TEST_F(ModuleTest, ACallByAnUnknownIdIsRefused) {
   } catch (const ko::FutureError& e) {
     EXPECT_THAT(e.what(), HasSubstr("Cant call methodId:9999 on module:Greeter"));
   }
+  EXPECT_THAT(object->asyncById(9999, {}).error(10000),
+              HasSubstr("Cant call methodId:9999 on module:Greeter"));
 }
 
 class BareModule : public ZU::ZUModuleCore {
