@@ -10,34 +10,38 @@ namespace {
 using ko::AnyValue;
 using ko::Kind;
 
-TEST(AnyValue, KindsOfConstructedValues) {
-  EXPECT_EQ(AnyValue().kind(), Kind::Void);
-  EXPECT_EQ(AnyValue::none().kind(), Kind::None);
-  EXPECT_EQ(AnyValue(true).kind(), Kind::Int);
+TEST(AnyValue, KindsAndSignaturesOfValuesAndTypes) {
+  const struct {
+    AnyValue value;
+    Kind kind;
+    const char* signature;
+  } cases[] = {
+      {AnyValue(), Kind::Void, "v"},
+      {AnyValue::none(), Kind::None, "_"},
+      {AnyValue(true), Kind::Int, "b"},
+      {AnyValue(1), Kind::Int, "i"},
+      {AnyValue(std::int16_t{3}), Kind::Int, "w"},
+      {AnyValue(std::uint64_t{1}), Kind::Int, "L"},
+      {AnyValue(2.5f), Kind::Float, "f"},
+      {AnyValue(1.0), Kind::Float, "d"},
+      {AnyValue("abc"), Kind::String, "s"},
+      {AnyValue(AnyValue::List{1, 2}), Kind::List, "[i]"},
+      {AnyValue(AnyValue::List{1, "x"}), Kind::List, "[m]"},
+      {AnyValue::map({{"a", 1}}), Kind::Map, "{si}"},
+      {AnyValue::tuple({1, "a"}), Kind::Tuple, "(is)"},
+      {AnyValue::dynamic(1), Kind::Dynamic, "m"},
+      {AnyValue::raw({1, 2}), Kind::Raw, "r"},
+      {AnyValue::varArgs({1}), Kind::VarArgs, "#m"},
+      {AnyValue::pointerTo(1), Kind::Pointer, "i*"},
+      {AnyValue::opaque(Kind::Signal), Kind::Signal, "~"},
+  };
+  for (const auto& c : cases) {
+    EXPECT_EQ(c.value.kind(), c.kind) << c.signature;
+    EXPECT_EQ(c.value.signature(), c.signature);
+  }
   EXPECT_EQ(AnyValue(true).asInt().size, 0);
-  EXPECT_EQ(AnyValue(std::int16_t{3}).asInt().size, 2);
   EXPECT_EQ(AnyValue(2.5f).asFloat().size, 4);
-  EXPECT_EQ(AnyValue("abc").kind(), Kind::String);
-  EXPECT_EQ(AnyValue(AnyValue::List{1, "x"}).kind(), Kind::List);
-  EXPECT_EQ(AnyValue::map({{"a", 1}}).kind(), Kind::Map);
-  EXPECT_EQ(AnyValue::tuple({1, 2}).kind(), Kind::Tuple);
-  EXPECT_EQ(AnyValue::dynamic(1).kind(), Kind::Dynamic);
-  EXPECT_EQ(AnyValue::raw({1, 2}).kind(), Kind::Raw);
-  EXPECT_EQ(AnyValue::varArgs({1}).kind(), Kind::VarArgs);
-  EXPECT_EQ(AnyValue::pointerTo(1).kind(), Kind::Pointer);
-  EXPECT_EQ(AnyValue::opaque(Kind::Signal).kind(), Kind::Signal);
   EXPECT_THROW(AnyValue::opaque(Kind::Int), ko::ConversionError);
-}
-
-TEST(AnyValue, SignaturesOfValuesAndTypes) {
-  EXPECT_EQ(AnyValue(true).signature(), "b");
-  EXPECT_EQ(AnyValue(1).signature(), "i");
-  EXPECT_EQ(AnyValue(std::uint64_t{1}).signature(), "L");
-  EXPECT_EQ(AnyValue(1.0).signature(), "d");
-  EXPECT_EQ(AnyValue(AnyValue::List{1, 2}).signature(), "[i]");
-  EXPECT_EQ(AnyValue(AnyValue::List{1, "a"}).signature(), "[m]");
-  EXPECT_EQ(AnyValue::map({{"a", 1}}).signature(), "{si}");
-  EXPECT_EQ(AnyValue::tuple({1, "a"}).signature(), "(is)");
   EXPECT_EQ(ko::signatureOf<std::vector<std::string>>(), "[s]");
   EXPECT_EQ((ko::signatureOf<std::map<std::string, int>>()), "{si}");
   EXPECT_EQ(ko::signatureOf<unsigned>(), "I");
@@ -123,13 +127,7 @@ TEST(AnyValue, CopiesAreDeepAndCompareByContent) {
   EXPECT_EQ(a.asList()[0], AnyValue(1));
   EXPECT_EQ(AnyValue(1), AnyValue(std::int64_t{1}));
   EXPECT_NE(AnyValue(1), AnyValue(true));
-}
-
-TEST(AnyValue, FloatOfSizeFourIsNarrowed) {
   EXPECT_EQ(AnyValue::floating(0.1, 4).asFloat().value, static_cast<double>(0.1f));
-}
-
-TEST(AnyValue, ReadableForm) {
   EXPECT_EQ(AnyValue::list({1, "a\"b", true, AnyValue::map({{"k", 0.5}})}).toString(),
             "[1, \"a\\\"b\", true, {\"k\": 0.5}]");
 }

@@ -198,7 +198,7 @@ TEST_F(PeriodicTaskTest, ThrowingCallbackIsLoggedAndTheTaskGoesOn) {
   EXPECT_TRUE(cap->containsPart("ko.periodictask", ko::log::Error, "'thrower' threw: no motion"));
 }
 
-TEST_F(PeriodicTaskTest, BadUseIsRefused) {
+TEST_F(PeriodicTaskTest, BadUseIsRefusedAndAStoppedLoopStopsItsTasks) {
   ko::PeriodicTask task(loop_);
   task.setName("empty");
   EXPECT_THROW(task.start(), ko::Error);
@@ -207,33 +207,13 @@ TEST_F(PeriodicTaskTest, BadUseIsRefused) {
   task.asyncStop();
   EXPECT_FALSE(task.isRunning());
   EXPECT_EQ(task.name(), "empty");
-}
 
-TEST_F(PeriodicTaskTest, StoppingTheLoopStopsItsTasks) {
-  ko::PeriodicTask task(loop_);
   task.setCallback([] {});
   task.setUsPeriod(3600LL * 1000000);
   task.start(false);
   loop_->stop();
   EXPECT_TRUE(eventually([&] { return !task.isRunning(); }));
   EXPECT_THROW(task.start(), ko::Error);
-}
-
-TEST(PeriodicTask, DerivedWorkerOnTheDefaultLoop) {
-  // The shape of a worker that derives from the task and stops it in its destructor.
-  class Worker : public ko::PeriodicTask {
-   public:
-    Worker() {
-      setName("worker");
-      setCallback([this] { runs.increment(); });
-      setUsPeriod(100);
-    }
-    ~Worker() override { stop(); }
-    Counter runs;
-  };
-  Worker w;
-  w.start(false);
-  EXPECT_TRUE(w.runs.waitFor(2));
 }
 
 }  // namespace

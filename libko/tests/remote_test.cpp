@@ -94,6 +94,7 @@ TEST_F(RemoteTest, ValuesGoAndComeBackExactly) {
   EXPECT_EQ(calc->property("level").value(10000).to<int>(), 3);
   calc->setProperty("level", AnyValue(4)).value(10000);
   EXPECT_EQ(calc->property("level").value(10000).to<int>(), 4);
+  EXPECT_TRUE(calc->property("add").hasError(10000));
 }
 
 TEST_F(RemoteTest, FailuresComeBackAsTheirText) {

@@ -5,7 +5,6 @@
 
 #include <functional>
 #include <memory>
-#include <ostream>
 #include <string>
 #include <vector>
 
@@ -20,121 +19,82 @@ using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 using zutest::Greeter;
 
-const std::vector<std::string> kBuiltIns = {
-    "version", "ping",      "getMethodList", "getMethodHelp", "getModuleHelp",
-    "wait",    "isRunning", "stop",          "getBrokerName", "getUsage",
-    "exit",    "__pCall",   "pCall"};
-
 class ModuleTest : public ::testing::Test {
  protected:
   zutest::Process process_;
   std::shared_ptr<Greeter> greeter_ =
       ZU::ZUModule::createModule<Greeter>(process_.broker, "Greeter");
+  ZU::ZUProxy proxy_{"Greeter", process_.broker};
 };
 
 TEST_F(ModuleTest, PublishesTheBuiltInsFirstThenTheModulesMethodsInBindingOrder) {
-  std::vector<std::string> expected = kBuiltIns;
-  for (const char* m : {"say", "say", "echo", "add", "fail", "waitForRelease", "waitForStop"})
-    expected.emplace_back(m);
-
+  const std::vector<std::string> expected = {
+      "version",        "ping",       "getMethodList", "getMethodHelp", "getModuleHelp", "wait",
+      "isRunning",      "stop",       "getBrokerName", "getUsage",      "exit",          "__pCall",
+      "pCall",          "say",        "say",           "echo",          "add",           "fail",
+      "waitForRelease", "waitForStop"};
   std::vector<std::string> published;
   for (const auto& m : greeter_->metaObject().methods())
     published.push_back(m.name);
   EXPECT_EQ(published, expected);
-  EXPECT_EQ(greeter_->getMethodList(), expected);
+  EXPECT_EQ(proxy_.call<std::vector<std::string>>("getMethodList"), expected);
 
   const auto says = greeter_->metaObject().findMethod("say");
   ASSERT_EQ(says.size(), 2u);
-  EXPECT_EQ(says[0]->parametersSignature, "(s)");
-  EXPECT_EQ(says[1]->parametersSignature, "(sm)");
+  EXPECT_EQ(says[0]->parametersSignature + says[1]->parametersSignature, "(s)(sm)");
+
+  const ZU::ZUValue help = greeter_->getModuleHelp();
+  EXPECT_EQ(help[0].asString() + "|" + help[1].asString(), "Greeter|A module of the tests.");
+  ASSERT_EQ(help[2].arraySize(), static_cast<int>(expected.size()));
+  EXPECT_EQ(help[2][13].toString(1), greeter_->getMethodHelp("say").toString(1));
 }
 
-struct HelpCase {
-  const char* method;
-  const char* dump;
-};
+TEST_F(ModuleTest, MethodHelpIsTheFiveElementArray) {
+  const std::pair<const char*, const char*> cases[] = {
+      {"wait",
+       R"(["wait", "Wait for the end of a long running method that was called using 'post'", [["id", "The ID of the method that was returned when calling the method using 'post'"], ["timeoutPeriod", "The timeout period in ms. To wait indefinately, use a timeoutPeriod of zero."]], "", "True if the timeout period terminated. False if the method returned."])"},
+      {"stop",
+       R"(["stop", "returns true if the method is currently running", [["id", "the ID of the method to wait for"]], "", ""])"},
+      {"pCall", R"(["pCall", "ZEFOko1 pCall method.", [], "", ""])"},
+      // The first overload of an overloaded name.
+      {"say", R"(["say", "Says a text.", [["text", "The text to say."]], "", ""])"},
+      {"add",
+       R"(["add", "Adds two integers.", [["a", "First."], ["b", "Second."]], "", "a + b"])"}};
+  for (const auto& [method, dump] : cases)
+    EXPECT_EQ(greeter_->getMethodHelp(method).toString(1), dump);
 
-void PrintTo(const HelpCase& c, std::ostream* os) {
-  *os << '"' << c.method << '"';
-}
-
-class MethodHelpTest : public ModuleTest, public ::testing::WithParamInterface<HelpCase> {};
-
-TEST_P(MethodHelpTest, IsTheFiveElementArray) {
-  const ZU::ZUValue help = greeter_->getMethodHelp(GetParam().method);
-  ASSERT_EQ(help.arraySize(), 5);
-  EXPECT_EQ(help.toString(1), GetParam().dump);
-}
-
-INSTANTIATE_TEST_SUITE_P(
-    Methods, MethodHelpTest,
-    ::testing::Values(
-        HelpCase{
-            "version",
-            R"(["version", "Returns the version of the module.", [], "", "A string containing the version of the module."])"},
-        HelpCase{
-            "getMethodHelp",
-            R"(["getMethodHelp", "Retrieves a method's description.", [["methodName", "The name of the method."]], "", "A structure containing the method's description."])"},
-        HelpCase{
-            "wait",
-            R"(["wait", "Wait for the end of a long running method that was called using 'post'", [["id", "The ID of the method that was returned when calling the method using 'post'"], ["timeoutPeriod", "The timeout period in ms. To wait indefinately, use a timeoutPeriod of zero."]], "", "True if the timeout period terminated. False if the method returned."])"},
-        HelpCase{
-            "stop",
-            R"(["stop", "returns true if the method is currently running", [["id", "the ID of the method to wait for"]], "", ""])"},
-        HelpCase{
-            "getUsage",
-            R"(["getUsage", "Gets the method usage string. This summarises how to use the method.", [["name", "The name of the method."]], "", "A string that summarises the usage of the method."])"},
-        HelpCase{"pCall", R"(["pCall", "ZEFOko1 pCall method.", [], "", ""])"},
-        // The first overload of an overloaded name.
-        HelpCase{"say", R"(["say", "Says a text.", [["text", "The text to say."]], "", ""])"},
-        HelpCase{
-            "add",
-            R"(["add", "Adds two integers.", [["a", "First."], ["b", "Second."]], "", "a + b"])"}));
-
-TEST_F(ModuleTest, MethodHelpOfAnUnboundNameRaises) {
   try {
     greeter_->getMethodHelp("sing");
     FAIL() << "no error";
   } catch (const ZU::ZUError& e) {
-    EXPECT_EQ(e.methodName(), "getMethodHelp");
-    EXPECT_EQ(e.description(), "ERROR: unknown method: 'sing'");
+    EXPECT_STREQ(e.what(), "\tGreeter::getMethodHelp\n\tERROR: unknown method: 'sing'");
   }
   // The same through a call by name from another service.
-  const ZU::ZUProxy proxy("Greeter", process_.broker);
-  EXPECT_EQ(zutest::errorOf([&] { proxy.call<ZU::ZUValue>("getMethodHelp", "sing"); }),
+  EXPECT_EQ(zutest::errorOf([&] { proxy_.call<ZU::ZUValue>("getMethodHelp", "sing"); }),
             "ERROR: unknown method: 'sing'");
 }
 
-TEST_F(ModuleTest, ModuleHelpDescribesEveryMethod) {
-  const ZU::ZUValue help = greeter_->getModuleHelp();
-  ASSERT_EQ(help.arraySize(), 3);
-  EXPECT_EQ(help[0].asString(), "Greeter");
-  EXPECT_EQ(help[1].asString(), "A module of the tests.");
-  ASSERT_EQ(help[2].arraySize(), static_cast<int>(kBuiltIns.size()) + 7);
-  EXPECT_EQ(help[2][13].toString(1), greeter_->getMethodHelp("say").toString(1));
-}
+TEST_F(ModuleTest, BuiltInsAnswerThroughCallsByNameAndExitUnregisters) {
+  EXPECT_EQ(proxy_.call<std::string>("version"), "2.1.4");
+  EXPECT_TRUE(proxy_.call<bool>("ping"));
+  EXPECT_EQ(proxy_.call<std::string>("getBrokerName"), "TestBroker");
+  // ZUValue arguments and results travel through ko; overloads are told by their arguments.
+  const auto value = ZU::ZUValue::makeArray({42, 0.5, "abc", ZU::ZUValue::makeBool(true)});
+  EXPECT_EQ(proxy_.call<ZU::ZUValue>("echo", value).toString(1), R"([42, 0.5, "abc", true])");
+  proxy_.call<void>("say", "hello", ZU::ZUValue::makeArray({"mode", 1}));
+  proxy_.call<void>("say", "bye");
+  EXPECT_THAT(greeter_->said(), ElementsAre(R"(hello with ["mode", 1])", "bye"));
 
-TEST_F(ModuleTest, BuiltInsAnswerThroughCallsByName) {
-  const ZU::ZUProxy proxy("Greeter", process_.broker);
-  EXPECT_EQ(proxy.call<std::string>("version"), "2.1.4");
-  EXPECT_TRUE(proxy.call<bool>("ping"));
-  EXPECT_EQ(proxy.call<std::string>("getBrokerName"), "TestBroker");
-  EXPECT_EQ(proxy.call<std::vector<std::string>>("getMethodList").size(), kBuiltIns.size() + 7);
-}
-
-TEST_F(ModuleTest, ExitUnregistersTheModule) {
-  const ZU::ZUProxy proxy("Greeter", process_.broker);
-  proxy.call<void>("exit");
+  proxy_.call<void>("exit");
   EXPECT_EQ(process_.broker->getModuleByName("Greeter"), nullptr);
   EXPECT_THAT(process_.session->services(), ::testing::IsEmpty());
   // This test still holds the module, so the old proxy reaches it.
-  EXPECT_TRUE(proxy.call<bool>("ping"));
+  EXPECT_TRUE(proxy_.call<bool>("ping"));
 }
 
 TEST_F(ModuleTest, ACallByAnUnknownIdIsRefused) {
-  const ko::Future<ko::AnyValue> result = greeter_->metaCall(9999, {});
-  EXPECT_THAT(result.error(), HasSubstr("Cant call methodId:9999 on module:Greeter"));
-
+  EXPECT_THAT(greeter_->metaCall(9999, {}).error(),
+              HasSubstr("Cant call methodId:9999 on module:Greeter"));
   const ko::AnyObject object = ko::GenericObject::makeWeak(greeter_, "Greeter");
   try {
     object->callById(9999, {});
@@ -142,15 +102,8 @@ TEST_F(ModuleTest, ACallByAnUnknownIdIsRefused) {
   } catch (const ko::FutureError& e) {
     EXPECT_THAT(e.what(), HasSubstr("Cant call methodId:9999 on module:Greeter"));
   }
-}
-
-TEST_F(ModuleTest, ZUValueParametersAndResultsTravelThroughKo) {
-  const ZU::ZUProxy proxy("Greeter", process_.broker);
-  ZU::ZUValue value = ZU::ZUValue::makeArray({42, 0.5, "abc", ZU::ZUValue::makeBool(true)});
-  EXPECT_EQ(proxy.call<ZU::ZUValue>("echo", value).toString(1), R"([42, 0.5, "abc", true])");
-  proxy.call<void>("say", "hello", ZU::ZUValue::makeArray({"mode", 1}));
-  proxy.call<void>("say", "bye");
-  EXPECT_THAT(greeter_->said(), ElementsAre(R"(hello with ["mode", 1])", "bye"));
+  EXPECT_THAT(object->asyncById(9999, {}).error(10000),
+              HasSubstr("Cant call methodId:9999 on module:Greeter"));
 }
 
 class BareModule : public ZU::ZUModuleCore {
@@ -158,77 +111,49 @@ class BareModule : public ZU::ZUModuleCore {
   using ZUModuleCore::ZUModuleCore;
 };
 
-struct DefaultCase {
-  const char* name;
-  std::function<std::string(ZU::ZUModuleCore&)> run;
-  std::string result;
-  const char* category;
-  const char* function;
-  const char* message;
-};
-
-void PrintTo(const DefaultCase& c, std::ostream* os) {
-  *os << '"' << c.name << '"';
-}
-
-class DefaultOperationTest : public ::testing::TestWithParam<DefaultCase> {};
-
-TEST_P(DefaultOperationTest, LogsFromItsOwnFunction) {
-  const DefaultCase& c = GetParam();
+TEST(ModuleCoreTest, DefaultOperationsLogFromTheirOwnFunction) {
   zutest::Process process;
-  std::shared_ptr<ZU::ZUModuleCore> module;
-  if (std::string(c.category) == "ZUModule")
-    module = std::make_shared<ZU::ZUModule>(process.broker, "Plain");
-  else
-    module = std::make_shared<BareModule>(nullptr, "Bare");
-
+  const auto bare = std::make_shared<BareModule>(nullptr, "Bare");
+  const auto plain = std::make_shared<ZU::ZUModule>(process.broker, "Plain");
+  const struct {
+    std::function<std::string()> run;
+    std::string result;
+    const char* function;  // of the category "zucommon.zumodulecore"
+  } cases[] = {
+      {[&] {
+         bare->execute();
+         return std::string();
+       },
+       "", "execute"},
+      {[&] { return bare->httpGet(); }, "ZUModuleCore::httpGet not implemented", "httpGet"},
+      {[&] { return bare->getUsage("say"); }, "ZUModuleCore::getUsage not implemented", "getUsage"},
+      {[&] { return ZU::ZUValue::TypeToString(bare->moduleHelp().getType()); }, "Invalid",
+       "moduleHelp"},
+      {[&] { return bare->getBrokerName(); }, "ZUModuleCore::getBrokerName not implemented",
+       "getBrokerName"},
+  };
+  for (const auto& c : cases) {
+    ko::log::ScopedCapture cap;
+    EXPECT_EQ(c.run(), c.result);
+    const auto records = cap->records();
+    ASSERT_EQ(records.size(), 1u);
+    EXPECT_EQ(records[0].level, ko::log::Error);
+    EXPECT_EQ(records[0].category, "zucommon.zumodulecore");
+    EXPECT_EQ(records[0].function, std::string("ZU::ZUModuleCore::") + c.function);
+    EXPECT_EQ(records[0].message, std::string("ZUModuleCore::") + c.function + " not implemented");
+  }
   ko::log::ScopedCapture cap;
-  EXPECT_EQ(c.run(*module), c.result);
-  const auto records = cap->records();
-  ASSERT_EQ(records.size(), 1u);
-  EXPECT_EQ(records[0].level, ko::log::Error);
-  EXPECT_EQ(records[0].category, c.category);
-  EXPECT_EQ(records[0].function, c.function);
-  EXPECT_EQ(records[0].message, c.message);
-}
-
-INSTANTIATE_TEST_SUITE_P(
-    Operations, DefaultOperationTest,
-    ::testing::Values(
-        DefaultCase{"execute",
-                    [](ZU::ZUModuleCore& m) {
-                      m.execute();
-                      return std::string();
-                    },
-                    "", "zucommon.zumodulecore", "ZU::ZUModuleCore::execute",
-                    "ZUModuleCore::execute not implemented"},
-        DefaultCase{"httpGet", [](ZU::ZUModuleCore& m) { return m.httpGet(); },
-                    "ZUModuleCore::httpGet not implemented", "zucommon.zumodulecore",
-                    "ZU::ZUModuleCore::httpGet", "ZUModuleCore::httpGet not implemented"},
-        DefaultCase{"getUsage", [](ZU::ZUModuleCore& m) { return m.getUsage("say"); },
-                    "ZUModuleCore::getUsage not implemented", "zucommon.zumodulecore",
-                    "ZU::ZUModuleCore::getUsage", "ZUModuleCore::getUsage not implemented"},
-        DefaultCase{
-            "moduleHelp",
-            [](ZU::ZUModuleCore& m) { return ZU::ZUValue::TypeToString(m.moduleHelp().getType()); },
-            "Invalid", "zucommon.zumodulecore", "ZU::ZUModuleCore::moduleHelp",
-            "ZUModuleCore::moduleHelp not implemented"},
-        DefaultCase{"getBrokerName", [](ZU::ZUModuleCore& m) { return m.getBrokerName(); },
-                    "ZUModuleCore::getBrokerName not implemented", "zucommon.zumodulecore",
-                    "ZU::ZUModuleCore::getBrokerName",
-                    "ZUModuleCore::getBrokerName not implemented"},
-        DefaultCase{"moduleHttpGet", [](ZU::ZUModuleCore& m) { return m.httpGet(); },
-                    "ZUModule::httpGet not implemented", "ZUModule", "ZU::ZUModule::httpGet",
-                    "ZUModule::httpGet not implemented"}),
-    [](const auto& param) { return std::string(param.param.name); });
-
-TEST(ModuleCoreTest, VersionAndTheQuietDefaults) {
-  auto module = std::make_shared<BareModule>(nullptr, "Bare");
-  ko::log::ScopedCapture cap;
-  EXPECT_EQ(module->version(), "2.1.4");
-  module->init();
-  module->exit();  // no broker: nothing to unregister
-  EXPECT_EQ(cap->count(), 0u);
+  EXPECT_EQ(plain->httpGet(), "ZUModule::httpGet not implemented");
+  EXPECT_TRUE(cap->contains("ZUModule", ko::log::Error, "ZUModule::httpGet not implemented"));
+  EXPECT_EQ(cap->records().at(0).function, "ZU::ZUModule::httpGet");
+  // The quiet defaults.
+  EXPECT_EQ(bare->version(), "2.1.4");
+  bare->init();
+  bare->exit();  // no broker: nothing to unregister
+  EXPECT_TRUE(ZU::ZUFunctorBase().call({}).isVoid());
+  EXPECT_TRUE(
+      cap->contains("zucommon.ZUFunctor", ko::log::Error, "ZUFunctor::call not implemented"));
+  EXPECT_EQ(cap->count(), 2u);
 }
 
 TEST(ModuleCoreTest, BindingMistakesRaise) {
@@ -250,14 +175,6 @@ TEST(ModuleCoreTest, BindingMistakesRaise) {
               }),
               HasSubstr("does not belong to this module's class"));
   EXPECT_TRUE(bare->getMethodInfos().empty());
-}
-
-TEST(ModuleCoreTest, TheFunctorBaseOnlyLogs) {
-  ZU::ZUFunctorBase functor;
-  ko::log::ScopedCapture cap;
-  EXPECT_TRUE(functor.call({}).isVoid());
-  EXPECT_TRUE(
-      cap->contains("zucommon.ZUFunctor", ko::log::Error, "ZUFunctor::call not implemented"));
 }
 
 }  // namespace

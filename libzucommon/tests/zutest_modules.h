@@ -2,8 +2,6 @@
 // Modules and helpers shared by the module-layer tests. Every wait is bounded.
 
 #include <atomic>
-#include <chrono>
-#include <condition_variable>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -12,6 +10,7 @@
 
 #include "ko/anyvalue.hpp"
 #include "ko/session.hpp"
+#include "ko_test_helpers.hpp"
 #include "zu/zubroker.h"
 #include "zu/zuerror.h"
 #include "zu/zumodule.h"
@@ -19,29 +18,8 @@
 
 namespace zutest {
 
-inline constexpr auto kBound = std::chrono::seconds(10);
 inline constexpr int kBoundMs = 10000;
-
-// A one-shot gate: wait() blocks until open() (or the bound passes; answers false then).
-class Gate {
- public:
-  void open() {
-    {
-      std::lock_guard lock(fMutex);
-      fOpen = true;
-    }
-    fCondition.notify_all();
-  }
-  bool wait() {
-    std::unique_lock lock(fMutex);
-    return fCondition.wait_for(lock, kBound, [this] { return fOpen; });
-  }
-
- private:
-  std::mutex fMutex;
-  std::condition_variable fCondition;
-  bool fOpen = false;
-};
+using ko::test::Gate;
 
 // A session with its broker, as a process of the robot has them.
 struct Process {
