@@ -6,8 +6,8 @@
 // BM_BookmarkEventToStartBehavior: from the raise of "ZUTextToSpeech/CurrentBookMark" in
 //   ZUMemory (the scripted speech engine raises it; one bookmark at a time).
 // BM_AudioTimeToStartBehavior/<actions>/<load>: from the bookmark's audio time on espeak-ng
-//   in real time (the text's start on the timeline plus the mark's position in the audio),
-//   so the speech engine's own lateness and notification are included; load 0 on the
+//   in real time (when the player's clock reached it), so the speech engine's own lateness
+//   and notification are included; load 0 on the
 //   machine as it is, load 1 with a busy thread per core beside it, at the bench's own nice
 //   level, started by the bench. Counters: median, p99 and max of the whole path, and the
 //   1-minute load average at the end of the run. After the runs, the same per hop:
@@ -304,14 +304,14 @@ void BM_AudioTimeToStartBehavior(benchmark::State& state) {
         const auto start = starts.find(t * kPerText + mark.number - 1);
         if (start == starts.end())
           continue;
-        const std::int64_t audioUs = started.front().us + mark.audioUs;
+        const std::int64_t audioUs = mark.dueUs - origin;
         latenciesMs.push_back(static_cast<double>(start->second - audioUs) / 1000.0);
         const auto raise = raised.find(mark.number);
         const auto report = byBookmark.find(static_cast<std::uint32_t>(mark.number));
         if (raise == raised.end() || report == byBookmark.end() || report->second.beginUs < 0)
           continue;
         const std::int64_t stamps[] = {audioUs,
-                                       started.front().us + mark.playbackUs,
+                                       audioUs + mark.playbackUs - mark.audioUs,
                                        raise->second,
                                        report->second.bookmarkUs - origin,
                                        report->second.beginUs - origin,

@@ -237,6 +237,7 @@ void SpeechPlayer::xPlay(const std::shared_ptr<SpeechUtterance>& shared) {
     }
     SpeechMarkRecord record{mark.number, mark.blocking, audioUs(*position), 0, 0};
     if (realTime) {
+      record.dueUs = microseconds(deadline(origin, record.audioUs).time_since_epoch());
       if (!performance.waitUntil(deadline(origin, record.audioUs))) {
         stopped = true;
         break;
