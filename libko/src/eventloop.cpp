@@ -1,10 +1,10 @@
 #include "ko/eventloop.hpp"
 
 #include <algorithm>
-#include <optional>
 #include <charconv>
 #include <exception>
 #include <mutex>
+#include <optional>
 #include <shared_mutex>
 
 #include <boost/asio/post.hpp>
