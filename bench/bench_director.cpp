@@ -5,21 +5,35 @@
 //
 // BM_BookmarkEventToStartBehavior: from the raise of "ZUTextToSpeech/CurrentBookMark" in
 //   ZUMemory (the scripted speech engine raises it; one bookmark at a time).
-// BM_AudioTimeToStartBehavior: from the bookmark's audio time on espeak-ng in real time (the
-//   text's start on the timeline plus the mark's position in the audio), so the speech
-//   engine's own lateness and notification are included.
+// BM_AudioTimeToStartBehavior/<actions>/<load>: from the bookmark's audio time on espeak-ng
+//   in real time (when the player's clock reached it), so the speech engine's own lateness
+//   and notification are included; load 0 on the
+//   machine as it is, load 1 with a busy thread per core beside it, at the bench's own nice
+//   level, started by the bench. Counters: median, p99 and max of the whole path, and the
+//   1-minute load average at the end of the run. After the runs, the same per hop:
+//     engine   audio time -> the speech engine's player reaches the mark
+//     notify   -> the engine raises "ZUTextToSpeech/CurrentBookMark" in ZUMemory
+//     deliver  -> the director has the bookmark (the memory service's delivery, the callback)
+//     takeUp   -> the director takes the action up
+//     call     -> the behaviour manager's startBehavior
 #include <benchmark/benchmark.h>
 
 #include <algorithm>
+#include <atomic>
 #include <chrono>
 #include <condition_variable>
 #include <cstdint>
+#include <fstream>
 #include <functional>
 #include <future>
+#include <iomanip>
+#include <iostream>
 #include <map>
 #include <memory>
 #include <mutex>
 #include <string>
+#include <thread>
+#include <utility>
 #include <vector>
 
 #include "director_host.h"
@@ -192,9 +206,66 @@ BENCHMARK(BM_BookmarkEventToStartBehavior)
     ->Unit(benchmark::kMillisecond)
     ->UseRealTime();
 
+// A busy thread per core, at the caller's nice level, while it lives.
+class BusyLoad {
+ public:
+  explicit BusyLoad(unsigned threads) {
+    for (unsigned n = 0; n < threads; ++n) {
+      fThreads.emplace_back([this] {
+        std::uint64_t x = 1;
+        while (!fStop.load(std::memory_order_relaxed)) {
+          x = x * 6364136223846793005ULL + 1442695040888963407ULL;
+          benchmark::DoNotOptimize(x);
+        }
+      });
+    }
+  }
+  ~BusyLoad() {
+    fStop = true;
+    for (auto& t : fThreads)
+      t.join();
+  }
+  BusyLoad(const BusyLoad&) = delete;
+  BusyLoad& operator=(const BusyLoad&) = delete;
+
+ private:
+  std::atomic<bool> fStop{false};
+  std::vector<std::thread> fThreads;
+};
+
+double loadAverage() {
+  std::ifstream in("/proc/loadavg");
+  double oneMinute = 0;
+  in >> oneMinute;
+  return oneMinute;
+}
+
+// The director's report of each action, by bookmark, for the text being spoken.
+class Reports : public ZU::DirectorObserver {
+ public:
+  void onAction(const ZU::DirectorActionReport& report) override {
+    std::lock_guard lock(fMutex);
+    fByBookmark[report.bookmark] = report;
+  }
+  std::map<std::uint32_t, ZU::DirectorActionReport> take() {
+    std::lock_guard lock(fMutex);
+    return std::exchange(fByBookmark, {});
+  }
+
+ private:
+  std::mutex fMutex;
+  std::map<std::uint32_t, ZU::DirectorActionReport> fByBookmark;
+};
+
+const char* const kHops[] = {"engine", "notify", "deliver", "takeUp", "call"};
+constexpr std::size_t kHopCount = std::size(kHops);
+// Per run (the benchmark's name): the latencies of each hop, in ms.
+std::vector<std::pair<std::string, std::vector<std::vector<double>>>> gHopRuns;
+
 void BM_AudioTimeToStartBehavior(benchmark::State& state) {
-  constexpr int kPerText = 200;
+  constexpr int kPerText = 100;
   const int texts = static_cast<int>(state.range(0)) / kPerText;
+  const bool loaded = state.range(1) != 0;
   std::shared_ptr<robotsim::ZUTextToSpeech> engine;
   Bench bench([&engine](const auto& broker, const auto& timeline) {
     robotsim::ZUTextToSpeechOptions options;
@@ -205,31 +276,84 @@ void BM_AudioTimeToStartBehavior(benchmark::State& state) {
     return engine;
   });
   engine->setParameter("speed", 300.0F);
+  const auto reports = std::make_shared<Reports>();
+  bench.host->director().setObserver(reports);
   std::vector<double> latenciesMs;
+  std::vector<std::vector<double>> hopsMs(kHopCount);
+  std::unique_ptr<BusyLoad> load;
+  if (loaded)
+    load = std::make_unique<BusyLoad>(std::max(1u, std::thread::hardware_concurrency()));
   for (auto _ : state) {
     for (int t = 0; t < texts; ++t) {
       bench.timeline->clear();
       bench.host->say(Bench::job(kPerText, t * kPerText));
       const auto started = bench.timeline->entries("ZUTextToSpeech", "started");
+      const auto byBookmark = reports->take();
       if (started.empty())
         continue;
+      const std::int64_t origin = bench.timeline->originUs();
       const int id = started.front().arguments.to<std::vector<ko::AnyValue>>().at(0).to<int>();
       const auto starts = bench.startTimes();
+      std::map<int, std::int64_t> raised;
+      for (const auto& entry : bench.timeline->entries("ZUMemory", "raiseEvent")) {
+        const auto arguments = entry.arguments.to<std::vector<ko::AnyValue>>();
+        if (arguments.at(0).to<std::string>() == "ZUTextToSpeech/CurrentBookMark")
+          raised.emplace(arguments.at(1).to<int>(), entry.us);
+      }
       for (const auto& mark : engine->markRecords(id)) {
-        const auto it = starts.find(t * kPerText + mark.number - 1);
-        if (it != starts.end()) {
-          latenciesMs.push_back(
-              static_cast<double>(it->second - (started.front().us + mark.audioUs)) / 1000.0);
-        }
+        const auto start = starts.find(t * kPerText + mark.number - 1);
+        if (start == starts.end())
+          continue;
+        const std::int64_t audioUs = mark.dueUs - origin;
+        latenciesMs.push_back(static_cast<double>(start->second - audioUs) / 1000.0);
+        const auto raise = raised.find(mark.number);
+        const auto report = byBookmark.find(static_cast<std::uint32_t>(mark.number));
+        if (raise == raised.end() || report == byBookmark.end() || report->second.beginUs < 0)
+          continue;
+        const std::int64_t stamps[] = {audioUs,
+                                       audioUs + mark.playbackUs - mark.audioUs,
+                                       raise->second,
+                                       report->second.bookmarkUs - origin,
+                                       report->second.beginUs - origin,
+                                       start->second};
+        for (std::size_t h = 0; h < kHopCount; ++h)
+          hopsMs[h].push_back(static_cast<double>(stamps[h + 1] - stamps[h]) / 1000.0);
       }
     }
   }
+  state.counters["load1"] = loadAverage();
+  load.reset();
   report(state, latenciesMs);
+  gHopRuns.emplace_back(loaded ? "loaded" : "quiet", std::move(hopsMs));
 }
 BENCHMARK(BM_AudioTimeToStartBehavior)
-    ->Arg(1000)
+    ->ArgNames({"actions", "load"})
+    ->Args({400, 0})
+    ->Args({400, 1})
     ->Iterations(1)
     ->Unit(benchmark::kSecond)
     ->UseRealTime();
 
+void printHops(std::ostream& os) {
+  for (const auto& [name, hops] : gHopRuns) {
+    os << "\n" << name << " per hop, ms (median / p99 / max):\n";
+    for (std::size_t h = 0; h < kHopCount; ++h) {
+      os << "  " << std::left << std::setw(8) << kHops[h] << std::right << std::fixed
+         << std::setprecision(3) << std::setw(8) << percentile(hops[h], 0.5) << " /"
+         << std::setw(8) << percentile(hops[h], 0.99) << " /" << std::setw(8)
+         << percentile(hops[h], 1.0) << "\n";
+    }
+  }
+}
+
 }  // namespace
+
+int main(int argc, char** argv) {
+  benchmark::Initialize(&argc, argv);
+  if (benchmark::ReportUnrecognizedArguments(argc, argv))
+    return 1;
+  benchmark::RunSpecifiedBenchmarks();
+  benchmark::Shutdown();
+  printHops(std::cout);
+  return 0;
+}

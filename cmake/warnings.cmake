@@ -21,5 +21,7 @@ function(mokuto_test name)
   add_executable(${name} ${T_SOURCES})
   mokuto_warnings(${name})
   target_link_libraries(${name} PRIVATE ${T_LIBS} GTest::gmock GTest::gtest_main)
-  gtest_discover_tests(${name} NO_PRETTY_VALUES DISCOVERY_TIMEOUT 60 PROPERTIES TIMEOUT 120)
+  # The framework's threads keep normal scheduling in tests, unless a test asks.
+  gtest_discover_tests(${name} NO_PRETTY_VALUES DISCOVERY_TIMEOUT 60
+    PROPERTIES TIMEOUT 120 ENVIRONMENT KO_REALTIME_PRIORITY=0)
 endfunction()

@@ -4,6 +4,7 @@
 #include <charconv>
 #include <exception>
 #include <mutex>
+#include <optional>
 #include <shared_mutex>
 
 #include <boost/asio/post.hpp>
@@ -88,7 +89,7 @@ void EventLoop::Impl::removeStopListener(std::uint64_t token) {
   stopListeners.erase(token);
 }
 
-EventLoop::EventLoop(std::string name, std::size_t threadCount)
+EventLoop::EventLoop(std::string name, std::size_t threadCount, Scheduling scheduling)
     : impl_(std::make_shared<Impl>(std::move(name))) {
   if (threadCount == 0)
     threadCount = std::max(2u, std::thread::hardware_concurrency());
@@ -96,8 +97,11 @@ EventLoop::EventLoop(std::string name, std::size_t threadCount)
   impl_->work.emplace(impl_->io.get_executor());
   impl_->threads.reserve(threadCount);
   for (std::size_t i = 0; i < threadCount; ++i) {
-    impl_->threads.emplace_back([impl = impl_] {
+    impl_->threads.emplace_back([impl = impl_, scheduling] {
       const FrameworkThreadScope framework;
+      std::optional<os::RealtimeScope> realtime;
+      if (scheduling == Scheduling::Realtime)
+        realtime.emplace();
       tlCurrentLoop = impl.get();
       impl->io.run();
       tlCurrentLoop = nullptr;

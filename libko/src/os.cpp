@@ -3,13 +3,20 @@
 #if defined(__GLIBC__)
 #include <malloc.h>
 #endif
+#include <pthread.h>
+#include <sched.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <atomic>
+#include <charconv>
 #include <chrono>
 #include <climits>
 #include <cstdlib>
+#include <system_error>
+
+#include "ko/log.hpp"
 
 namespace ko::os {
 
@@ -38,6 +45,81 @@ bool keepFreedMemory(std::size_t retainedBytes) {
   (void)retainedBytes;
   return false;
 #endif
+}
+
+namespace {
+
+constexpr const char* kCategory = "ko.os";
+constexpr const char* kVariable = "KO_REALTIME_PRIORITY";
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+constexpr int kDefaultPriority = 0;
+#else
+constexpr int kDefaultPriority = 1;
+#endif
+
+std::atomic<int> gPriorityOverride{-1};
+std::atomic<bool> gRefusalLogged{false};
+
+int priorityFromEnvironment() {
+  const std::string text = getenv(kVariable);
+  if (text.empty())
+    return kDefaultPriority;
+  int value = -1;
+  const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), value);
+  if (error != std::errc() || end != text.data() + text.size() || value < 0 ||
+      value > sched_get_priority_max(SCHED_FIFO)) {
+    KO_LOG_WARNING(kCategory) << kVariable << "='" << text
+                              << "' is not a priority from 0 to "
+                              << sched_get_priority_max(SCHED_FIFO) << "; using "
+                              << kDefaultPriority;
+    return kDefaultPriority;
+  }
+  return value;
+}
+
+}  // namespace
+
+int realtimePriority() {
+  const int override = gPriorityOverride.load();
+  if (override >= 0)
+    return override;
+  static const int fromEnvironment = priorityFromEnvironment();
+  return fromEnvironment;
+}
+
+void setRealtimePriority(int priority) {
+  gPriorityOverride.store(priority < 0 ? -1 : priority);
+}
+
+RealtimeScope::RealtimeScope() {
+  const int priority = realtimePriority();
+  if (priority <= 0)
+    return;
+  sched_param current{};
+  if (pthread_getschedparam(pthread_self(), &fPolicy, &current) != 0 || fPolicy == SCHED_FIFO ||
+      fPolicy == SCHED_RR) {
+    return;
+  }
+  fPriority = current.sched_priority;
+  sched_param wanted{};
+  wanted.sched_priority = priority;
+  const int error = pthread_setschedparam(pthread_self(), SCHED_FIFO, &wanted);
+  if (error == 0) {
+    fRaised = true;
+  } else if (!gRefusalLogged.exchange(true)) {
+    KO_LOG_WARNING(kCategory) << "The real-time priority " << priority << " (" << kVariable
+                              << ") is refused: " << std::system_category().message(error)
+                              << "; the framework's latency-critical threads keep normal "
+                                 "scheduling";
+  }
+}
+
+RealtimeScope::~RealtimeScope() {
+  if (!fRaised)
+    return;
+  sched_param own{};
+  own.sched_priority = fPriority;
+  pthread_setschedparam(pthread_self(), fPolicy, &own);
 }
 
 }  // namespace ko::os

@@ -394,6 +394,9 @@ SaySummary SayTimeline::end(bool stopped, ZU::MKID* id) {
                                        {"stopped", summary.stopped},
                                        {"instructionErrors", summary.instructionErrors},
                                        {"syncMedianUs", sync(summary.syncMedianUs)},
+                                       {"syncP99Us", summary.syncCount >= kSyncP99Count
+                                                         ? sync(summary.syncP99Us)
+                                                         : ko::AnyValue::none()},
                                        {"syncMaxUs", sync(summary.syncMaxUs)}}));
   return summary;
 }
@@ -420,7 +423,10 @@ void SayTimeline::printSummary(std::ostream& os, ZU::MKID id, const SaySummary& 
   } else if (s.syncCount > 0) {
     os << "  sync, from a bookmark's audio time to its action's start (" << s.syncCount
        << (s.syncCount == 1 ? " action" : " actions") << "): median "
-       << milliseconds(s.syncMedianUs) << ", max " << milliseconds(s.syncMaxUs) << "\n";
+       << milliseconds(s.syncMedianUs);
+    if (s.syncCount >= kSyncP99Count)
+      os << ", p99 " << milliseconds(s.syncP99Us);
+    os << ", max " << milliseconds(s.syncMaxUs) << "\n";
   } else {
     os << "  sync: no executed action at a bookmark\n";
   }
@@ -621,6 +627,8 @@ SaySummary SayTimeline::xSummary() const {
     const std::size_t n = delays.size();
     summary.syncCount = static_cast<int>(n);
     summary.syncMedianUs = n % 2 ? delays[n / 2] : (delays[n / 2 - 1] + delays[n / 2]) / 2;
+    if (n >= kSyncP99Count)
+      summary.syncP99Us = delays[(n * 99 + 99) / 100 - 1];  // the nearest rank
     summary.syncMaxUs = delays.back();
   }
   return summary;

@@ -49,6 +49,9 @@ std::string soundFileName(std::string name);
 // The reason in a log line of a failed call: the error's own description, first line.
 std::string failureReason(const std::string& message);
 
+// The number of actions from which the summary gives the p99 of the sync.
+constexpr int kSyncP99Count = 20;
+
 struct SaySummary {
   int executed = 0;
   int failed = 0;
@@ -65,6 +68,7 @@ struct SaySummary {
   // bookmark's audio time to the action's start.
   int syncCount = 0;
   std::int64_t syncMedianUs = 0;
+  std::int64_t syncP99Us = 0;  // from kSyncP99Count actions on; 0 below
   std::int64_t syncMaxUs = 0;
   std::int64_t durationUs = 0;
 };

@@ -233,6 +233,9 @@ void DirectorTask::process(const std::shared_ptr<MKTaskInstruction>& instruction
   const auto text = std::make_shared<Text>(instruction, std::move(observer));
   MKTaskInstruction& job = *instruction;
   const MKID id = job.id;
+  // This thread wakes at every bookmark: while it directs the text, it runs at the real-time
+  // priority of the threads that bring the bookmarks, and gets its own back at the end.
+  const ko::os::RealtimeScope realtime;
 
   std::unique_lock lock(job.mutex);
   if (text->observer) {

@@ -1,14 +1,11 @@
 #include "speechplayer.h"
 
-#include <pthread.h>
-#include <sched.h>
-
 #include <algorithm>
 #include <cmath>
-#include <cstring>
 #include <utility>
 
 #include "ko/log.hpp"
+#include "ko/os.hpp"
 #include "ko/reaper.hpp"
 
 namespace robotsim {
@@ -16,18 +13,6 @@ namespace robotsim {
 namespace {
 
 using SteadyClock = std::chrono::steady_clock;
-
-// The player is an audio thread: it asks for a real-time priority, so that a busy machine
-// delays its bookmarks as little as possible. Without the right to it, it plays as it is.
-void raisePlayerPriority() {
-  sched_param param{};
-  param.sched_priority = sched_get_priority_min(SCHED_FIFO);
-  const int error = pthread_setschedparam(pthread_self(), SCHED_FIFO, &param);
-  if (error != 0) {
-    KO_LOG_VERBOSE("robotsim.texttospeech")
-        << "The speech player runs without real-time priority: " << std::strerror(error);
-  }
-}
 
 std::int64_t microseconds(SteadyClock::duration d) {
   return std::chrono::duration_cast<std::chrono::microseconds>(d).count();
@@ -81,6 +66,27 @@ void SpeechPlayer::xNotify(std::function<void()> job) {
     fNotifyQueued.notify_one();
 }
 
+void SpeechPlayer::xNotifyNow(std::function<void()> job) {
+  {
+    std::lock_guard lock(fNotifyMutex);
+    if (!fNotifierGone) {
+      if (fNotifying || !fNotifications.empty()) {
+        fNotifications.push_back(std::move(job));
+        fNotifyQueued.notify_one();
+        return;
+      }
+      fNotifying = true;
+    }
+  }
+  xRunNotification(job);
+  {
+    std::lock_guard lock(fNotifyMutex);
+    fNotifying = false;
+  }
+  // News queued meanwhile waits for the notifier.
+  fNotifyQueued.notify_one();
+}
+
 void SpeechPlayer::xRunNotification(const std::function<void()>& job) noexcept {
   try {
     job();
@@ -93,20 +99,24 @@ void SpeechPlayer::xRunNotification(const std::function<void()>& job) noexcept {
 
 void SpeechPlayer::xRunNotifier() {
   const ko::FrameworkThreadScope framework;
-  raisePlayerPriority();
+  const ko::os::RealtimeScope realtime;
   for (;;) {
     std::function<void()> job;
     {
       std::unique_lock lock(fNotifyMutex);
-      fNotifyQueued.wait(lock, [this] { return fNotifyQuit || !fNotifications.empty(); });
+      fNotifyQueued.wait(
+          lock, [this] { return !fNotifying && (fNotifyQuit || !fNotifications.empty()); });
       if (fNotifications.empty()) {
         fNotifierGone = true;
         return;
       }
       job = std::move(fNotifications.front());
       fNotifications.pop_front();
+      fNotifying = true;
     }
     xRunNotification(job);
+    std::lock_guard lock(fNotifyMutex);
+    fNotifying = false;
   }
 }
 
@@ -162,7 +172,8 @@ void SpeechPlayer::stopAll() {
 
 void SpeechPlayer::xRun() {
   const ko::FrameworkThreadScope framework;
-  raisePlayerPriority();
+  // An audio thread: a busy machine delays its bookmarks as little as it may.
+  const ko::os::RealtimeScope realtime;
   for (;;) {
     std::shared_ptr<SpeechUtterance> utterance;
     {
@@ -237,6 +248,7 @@ void SpeechPlayer::xPlay(const std::shared_ptr<SpeechUtterance>& shared) {
     }
     SpeechMarkRecord record{mark.number, mark.blocking, audioUs(*position), 0, 0};
     if (realTime) {
+      record.dueUs = microseconds(deadline(origin, record.audioUs).time_since_epoch());
       if (!performance.waitUntil(deadline(origin, record.audioUs))) {
         stopped = true;
         break;
@@ -263,7 +275,7 @@ void SpeechPlayer::xPlay(const std::shared_ptr<SpeechUtterance>& shared) {
         origin += held;
       holds.emplace_back(*position, samplesOf(record.heldUs));
     } else {
-      xNotify([this, shared, number = mark.number] { fListener.onBookmark(*shared, number); });
+      xNotifyNow([this, shared, number = mark.number] { fListener.onBookmark(*shared, number); });
     }
     utterance.marks.push_back(record);
     xNotify([this, shared, record] { fListener.onMarkDone(*shared, record); });

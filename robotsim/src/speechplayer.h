@@ -4,9 +4,13 @@
 //
 // One thread of its own plays; it sleeps until each mark's deadline on the steady clock,
 // then hands the news to a second thread, the notifier, which tells the listener in
-// order, so that the time of the next mark never waits for a listener. At a blocking mark
-// the player stops its clock until the notifier's hold is released. Both threads ask for
-// a real-time priority, and are framework threads (ko/reaper.hpp). A listener that throws
+// order, so that the time of the next mark never waits for a listener. A bookmark passed,
+// whose news is awaited the most and which the listener only queues as an event, the
+// player tells itself when the notifier has nothing before it: one thread less between
+// the audio and the bookmark's event, in the same order. At a blocking mark the player
+// stops its clock until the notifier's hold is released. Both threads run at the
+// framework's real-time priority (ko/os.hpp), and are framework threads (ko/reaper.hpp).
+// A listener that throws
 // is logged; the notifier goes on. Any thread may queue a text or stop one; a text queued
 // after the shutdown ends at once, stopped, and is told in the queuing thread.
 
@@ -87,6 +91,8 @@ class SpeechPlayer {
   void xRun();
   void xRunNotifier();
   void xNotify(std::function<void()> job);
+  // In this thread when no news is queued or being told, else as xNotify.
+  void xNotifyNow(std::function<void()> job);
   static void xRunNotification(const std::function<void()>& job) noexcept;
   void xPlay(const std::shared_ptr<SpeechUtterance>& utterance);
   void xEnd(const std::shared_ptr<SpeechUtterance>& utterance, bool stopped, std::int64_t playedUs,
@@ -109,6 +115,7 @@ class SpeechPlayer {
   std::deque<std::function<void()>> fNotifications;
   bool fNotifyQuit = false;
   bool fNotifierGone = false;
+  bool fNotifying = false;  // news is being told, by the notifier or by xNotifyNow
   std::mutex fShutdownMutex;
   std::thread fNotifier;
   std::thread fThread;

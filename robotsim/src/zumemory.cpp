@@ -22,7 +22,8 @@ ZUMemory::ZUMemory(const std::shared_ptr<ZU::ZUBroker>& broker, const std::strin
     : ZU::ZUModule(broker, name),
       fOptions(std::move(options)),
       fDeliveryLoop(std::make_shared<ko::EventLoop>(
-          name + ".delivery", fOptions.deliveryThreads > 0 ? fOptions.deliveryThreads : 1)) {
+          name + ".delivery", fOptions.deliveryThreads > 0 ? fOptions.deliveryThreads : 1,
+          ko::EventLoop::Scheduling::Realtime)) {
   xBindMethods();
 }
 

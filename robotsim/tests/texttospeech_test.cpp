@@ -331,6 +331,19 @@ TEST_P(TextToSpeechBackends, NoneOf200BookmarksIsLost) {
   for (std::size_t i = 1; i < marks.size(); ++i)
     EXPECT_GE(marks[i].audioUs, marks[i - 1].audioUs);
   EXPECT_FALSE(cap->containsPart("robotsim.texttospeech", ko::log::Warning, "not reported"));
+  // Raised in the order the player met them, whichever thread told each: the start, the
+  // bookmarks, the end.
+  std::vector<std::string> raised;
+  for (const auto& entry : robot.timeline->entries("ZUMemory", "raiseEvent")) {
+    const auto arguments = entry.arguments.asList();
+    raised.push_back(arguments.at(0).to<std::string>() == kStatus
+                         ? arguments.at(1).asList().at(1).to<std::string>()
+                         : "mark");
+  }
+  std::vector<std::string> order{"started"};
+  order.insert(order.end(), expected.size(), "mark");
+  order.emplace_back("done");
+  EXPECT_EQ(raised, order);
 }
 
 TEST_P(TextToSpeechBackends, TextsPlayOneAfterTheOther) {

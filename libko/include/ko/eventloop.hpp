@@ -30,8 +30,16 @@ namespace ko {
 
 class EventLoop {
  public:
+  enum class Scheduling {
+    Normal,
+    // The threads of a loop on a latency-critical path (the delivery of events) run at
+    // the framework's real-time priority (os.hpp, RealtimeScope).
+    Realtime,
+  };
+
   // `threadCount` 0 picks the machine's hardware concurrency, at least 2.
-  explicit EventLoop(std::string name = "EventLoop", std::size_t threadCount = 0);
+  explicit EventLoop(std::string name = "EventLoop", std::size_t threadCount = 0,
+                     Scheduling scheduling = Scheduling::Normal);
   ~EventLoop();
   EventLoop(const EventLoop&) = delete;
   EventLoop& operator=(const EventLoop&) = delete;

@@ -24,4 +24,33 @@ int gettid();
 // settings (the process then runs as before).
 bool keepFreedMemory(std::size_t retainedBytes = std::size_t{64} << 20);
 
+// The real-time priority of the framework's latency-critical threads: the threads that
+// deliver events and the speech player's. KO_REALTIME_PRIORITY 0 keeps them under normal
+// scheduling, 1 to 99 runs them under SCHED_FIFO at that priority. Unset or empty: 1, the
+// lowest real-time priority, except in sanitizer builds, where it is 0; another value is
+// reported once and taken as unset. The variable is read once per process.
+int realtimePriority();
+// Replaces the variable for this process (tests); a negative value goes back to it.
+void setRealtimePriority(int priority);
+
+// While it lives, the calling thread runs under SCHED_FIFO at realtimePriority(), unless
+// that is 0 or the thread already runs under a real-time policy; its own scheduling comes
+// back at the end of the scope. When the process may not (no CAP_SYS_NICE, RLIMIT_RTPRIO
+// below the priority), the first refusal in the process is logged as a warning, and the
+// thread keeps its scheduling. Nothing else changes: the thread never spins.
+class RealtimeScope {
+ public:
+  RealtimeScope();
+  ~RealtimeScope();
+  RealtimeScope(const RealtimeScope&) = delete;
+  RealtimeScope& operator=(const RealtimeScope&) = delete;
+  // Whether the scope raised the thread.
+  bool raised() const noexcept { return fRaised; }
+
+ private:
+  bool fRaised = false;
+  int fPolicy = 0;
+  int fPriority = 0;
+};
+
 }  // namespace ko::os

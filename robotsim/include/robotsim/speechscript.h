@@ -52,6 +52,9 @@ struct SpeechMarkRecord {
   std::int64_t audioUs = 0;     // the mark's position in the audio
   std::int64_t playbackUs = 0;  // when the player reached it
   std::int64_t heldUs = 0;      // how long a blocking mark held the speech
+  // When the playback clock reached its audio time, in ko::os::ustime() microseconds, the
+  // clock's stops (synthesis behind, blocking marks) included; 0 unless played in real time.
+  std::int64_t dueUs = 0;
 };
 
 // A word as espeak-ng spoke it: its bytes in the caller's text and its audio time.
