@@ -28,6 +28,7 @@
 // joins the threads the same way; like exit(), it may run on any thread but the module's
 // own (the framework sees to it, see ko/reaper.hpp).
 
+#include <chrono>
 #include <cstdint>
 #include <filesystem>
 #include <limits>
@@ -44,6 +45,7 @@
 
 namespace robotsim {
 
+class FaultPlan;
 class SpeechPlayer;
 class SpeechRecording;
 class SpeechSynthesizer;
@@ -68,6 +70,8 @@ struct ZUTextToSpeechOptions {
   // Whether the audio is kept for saveRecording.
   bool recordAudio = true;
   std::shared_ptr<Timeline> timeline;
+  // The bookmark faults of this plan strike the events and blocking calls (null: none).
+  std::shared_ptr<FaultPlan> faults;
 };
 
 class ZUTextToSpeech : public ZU::ZUModule {
@@ -124,6 +128,8 @@ class ZUTextToSpeech : public ZU::ZUModule {
   void xBindMethods();
   void xRecord(const std::string& operation, ko::AnyValue arguments, ko::AnyValue result = {});
   void xRaise(const std::string& key, const ZU::ZUValue& value);
+  // The bookmark event, raised now or, from another thread, `delay` later.
+  void xRaiseBookmark(std::int32_t number, std::chrono::steady_clock::duration delay);
   bool xNotificationsEnabled() const;
   void xStopText(int id);
   void xStopThreads();
