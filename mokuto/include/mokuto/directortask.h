@@ -36,6 +36,7 @@
 #include "ko/signal.hpp"
 #include "mokuto/mktaskaction.h"
 #include "mokuto/mktaskinstruction.h"
+#include "mokuto/mokutoclock.h"
 
 namespace ZU {
 
@@ -84,11 +85,12 @@ class DirectorObserver {
 
 class DirectorTask {
  public:
-  // `bodyTalk` and `mkidRegister` belong to the module and outlive the director. Raises
-  // ZUError (ZUMokuto::Constructor) "Module ZUTextToSpeech not found" without a speech
-  // engine; the other services are reported and their calls fail (logged) later.
+  // `bodyTalk` and `mkidRegister` belong to the module and outlive the director; `clock`
+  // waits out the director's limits (null: real time). Raises ZUError
+  // (ZUMokuto::Constructor) "Module ZUTextToSpeech not found" without a speech engine; the
+  // other services are reported and their calls fail (logged) later.
   DirectorTask(const std::shared_ptr<ZUBroker>& broker, ZURobotBodyTalk* bodyTalk,
-               MKIDRegister& mkidRegister);
+               MKIDRegister& mkidRegister, std::shared_ptr<MokutoClock> clock = nullptr);
   ~DirectorTask();
   DirectorTask(const DirectorTask&) = delete;
   DirectorTask& operator=(const DirectorTask&) = delete;
@@ -170,10 +172,13 @@ class DirectorTask {
   void xStopASound(const MKSoundAction& action);
   void xWaitASound(const MKSoundAction& action);
   void xStopAllSounds();
+  // Empties the table of sounds; answers their play identifiers.
+  std::vector<int> xTakeRunningSounds();
   void xNotifyAutonomousMoves(const std::string& tag);
 
   MKIDRegister& mkidRegister;
   ZURobotBodyTalk* const bodyTalk;
+  const std::shared_ptr<MokutoClock> fClock;
   const std::shared_ptr<ko::Session> fSession;
 
   std::shared_ptr<ZUTextToSpeechProxy> tts;
