@@ -9,7 +9,6 @@
 #include <vector>
 
 #include "directortask_text.h"
-#include "ko/json.hpp"
 #include "ko/log.hpp"
 #include "mokuto/directortask.h"
 #include "robotbodytalk/zurobotbodytalk.h"
@@ -169,13 +168,7 @@ void DirectorTask::xCall(const MKCallAction& call) {
   try {
     if (!call.proxy)
       ZU_THROW_ERROR(call.module, call.method, "Module " + call.module + " not found");
-    std::vector<ko::AnyValue> arguments;
-    const ko::AnyValue decoded = ko::fromJson(call.arguments);
-    try {
-      arguments = decoded.to<std::vector<ko::AnyValue>>();
-    } catch (const ko::ConversionError&) {
-      ZU_THROW_ERROR(call.module, call.method, "the arguments are not a list");
-    }
+    const std::vector<ko::AnyValue> arguments = call.argumentList();
     if (call.type == CALL)
       call.proxy->callArgs<ko::AnyValue>(call.method, arguments);
     else

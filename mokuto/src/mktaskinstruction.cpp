@@ -5,6 +5,9 @@
 #include <stdexcept>
 #include <utility>
 
+#include "ko/json.hpp"
+#include "zu/zuerror.h"
+
 namespace ZU {
 
 MKTaskAction::MKTaskAction(MKTaskActionType actionType)
@@ -27,6 +30,16 @@ std::string MKTaskAction::bookmark() const {
   std::string out;
   appendBookmark(out);
   return out;
+}
+
+std::vector<ko::AnyValue> MKCallAction::argumentList() const {
+  try {
+    return ko::fromJson(arguments).to<std::vector<ko::AnyValue>>();
+  } catch (const ko::JsonError& e) {
+    ZU_THROW_ERROR(module, method, std::string("the arguments are no JSON: ") + e.what());
+  } catch (const ko::ConversionError&) {
+    ZU_THROW_ERROR(module, method, "the arguments are not a list");
+  }
 }
 
 void MKTaskAction::markAsError(std::string_view code) {
