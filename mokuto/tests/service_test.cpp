@@ -34,6 +34,7 @@
 #include "robotsim/zurobotstate.h"
 #include "robotsim/zutexttospeech.h"
 #include "scripted_speech.h"
+#include "service_rig.h"
 #include "zefoko/host.h"
 #include "zu/zumoduleentry.h"
 #include "zu/zuproxy.h"
@@ -662,6 +663,50 @@ TEST_F(ServiceIndex, TagPageListsTheVisibleTags) {
       "border=\"1\"><tr><td><b>Tag name</b></td><td><b>Corresponding behaviors</b><br/><i>(click "
       "to run the behavior)</i></td></tr>";
   EXPECT_EQ(mokuto_->tagPage(), head + table + rows + "</table>" + tail);
+}
+
+// ---- on the whole simulated robot --------------------------------------------------------
+
+TEST(ServiceOnTheRobot, RecognisedWordsRaiseTheirEmotionFromAConfidenceOfOneHalf) {
+  mokutotest::ServiceRig rig;
+  std::size_t raised = 0;
+  for (const double confidence : {0.49, 0.5, 0.9}) {
+    SCOPED_TRACE(confidence);
+    rig.mokuto->_dialogMatchedInputCallback(
+        "WordRecognized", ZU::ZUValue::makeArray({ZU::ZUValue("I am happy"), ZU::ZUValue(confidence)}),
+        "");
+    raised += confidence >= 0.5 ? 1U : 0U;
+    EXPECT_EQ(rig.events("AsrEmotion"), raised);
+  }
+  for (const auto& entry : rig.robot->timeline()->entries("ZUMemory", "raiseEvent")) {
+    const auto arguments = entry.arguments.to<std::vector<ko::AnyValue>>();
+    if (arguments.at(0).to<std::string>() == "AsrEmotion") {
+      EXPECT_GT(arguments.at(1).to<int>(), 0);
+    }
+  }
+}
+
+TEST(ServiceOnTheRobot, TheTimingCheckerFramesTheEndEventAndComesBackWhenSwitchedOnAgain) {
+  mokutotest::ServiceRig rig;
+  ko::log::ScopedCapture log(ko::log::Info);
+  const std::vector<std::string> framed = {"ZUMokuto/StartOfMK", kEnd, "ZUMokuto/StopOfMK"};
+  for (const bool on : {true, false, true}) {
+    SCOPED_TRACE(on);
+    rig.mokuto->_setCheckExecutionTimes(on);
+    rig.robot->timeline()->clear();
+    log->clear();
+    rig.mokuto->say("Hello $a=1");
+    std::vector<std::string> events;
+    for (const auto& entry : rig.robot->timeline()->entries("ZUMemory", "raiseEvent")) {
+      const auto key = entry.arguments.to<std::vector<ko::AnyValue>>().at(0).to<std::string>();
+      if (key.rfind("ZUMokuto/", 0) == 0)
+        events.push_back(key);
+    }
+    EXPECT_EQ(events, on ? framed : std::vector<std::string>{kEnd});
+    EXPECT_EQ(log->containsPart("mokuto.times", ko::log::Info,
+                                "time between 'stop of TTS' and 'stop of MK': "),
+              on);
+  }
 }
 
 // ---- the module library -------------------------------------------------------------------
