@@ -26,6 +26,7 @@
 #include "ko/json.hpp"
 #include "ko/log.hpp"
 #include "ko/os.hpp"
+#include "robotsim/faults.h"
 #include "zu/zuerror.h"
 #include "zu/zuvalue.h"
 #include "zu/zuvalueconverter.h"
@@ -107,6 +108,7 @@ struct SayOptions {
   std::string timeline;
   bool dryRun = false;
   bool quiet = false;
+  std::string faults;
   std::optional<std::string> text;
 };
 
@@ -225,6 +227,7 @@ int say(SayOptions& o) {
     serviceOptions.language = o.language;
     serviceOptions.posture = o.posture;
     serviceOptions.recordAudio = !o.wav.empty();
+    serviceOptions.faults = o.faults;
     // Blocked before the robot's threads start, so that they all inherit the mask and the
     // watcher below alone takes the signals.
     const InterruptMask interruptMask;
@@ -267,7 +270,11 @@ int say(SayOptions& o) {
       recorder->begin(*o.text);
       bool interrupted = false;
       {
-        const InterruptWatcher watcher(interruptMask, [&service] { service._stopAll(false); });
+        const InterruptWatcher watcher(interruptMask, [&service, &robot] {
+          service._stopAll(false);
+          if (robot.faults())
+            robot.faults()->lift();  // the calls that hang answer again
+        });
         if (configuration)
           service.say(*o.text, *configuration);
         else
@@ -364,6 +371,23 @@ void addSayCommand(CLI::App& app, int& status) {
                     "Run the compiler and loader stages only and print the prepared job as "
                     "JSON, without speaking");
   command->add_flag("--quiet", o->quiet, "Print the summary only, not the live timeline");
+  command
+      ->add_option("--faults", o->faults,
+                   "Faults of the robot's services, separated by \";\": "
+                   "Service.operation:throw|hang|delay=300ms, "
+                   "ZUTextToSpeech.bookmarks:drop[=N,...]|duplicate|reorder|delay=600ms[@N,...], "
+                   "ZUBehaviorManager.behaviorStopped:never (a call that hangs answers at Ctrl-C)")
+      ->type_name("SPEC")
+      ->check(CLI::Validator(
+          [](std::string& spec) {
+            try {
+              robotsim::parseFaults(spec);
+              return std::string();
+            } catch (const robotsim::FaultSpecError& e) {
+              return std::string(e.what());
+            }
+          },
+          "SPEC"));
   command->add_option("text", o->text,
                       "The annotated text; read from standard input when absent or \"-\"");
   command->footer(

@@ -29,6 +29,8 @@ EmbeddedService::EmbeddedService(const EmbeddedServiceOptions& options) {
     host.robot.speech.playbackRate = robotsim::kSpeechAsFastAsPossible;
   host.postureFamily = options.posture;
   try {
+    if (!options.faults.empty())
+      host.robot.faults = std::make_shared<robotsim::FaultPlan>(options.faults);
     fHost = std::make_unique<zefoko::Host>(std::move(host));
     // As the module library's _createModule does, with the stage hook.
     const auto& broker = fHost->broker();

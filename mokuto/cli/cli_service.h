@@ -27,6 +27,8 @@ struct EmbeddedServiceOptions {
   std::string posture;
   // Whether the speech engine keeps the audio for a WAV file.
   bool recordAudio = false;
+  // The robot's faults (robotsim/faults.h); empty for none.
+  std::string faults;
 };
 
 // The robot or the module cannot start, or the index is not built in time.
