@@ -438,37 +438,41 @@ void DirectorTask::xEndOfText(Text& text) {
 // ---- stop -------------------------------------------------------------------------------
 
 void DirectorTask::stop(MKID id) {
-  xStopAllAnimations();
   std::shared_ptr<Text> text;
   std::int32_t speech = -1;
   {
     std::shared_lock lock(ttsMutex);
     text = xCurrentText();
-    if (id != text->instruction->id && id != -1)
-      return;
     speech = postId;
   }
-  // The speech engine and the audio player are told on the event loop: a stop returns at
-  // once, whatever they do (its caller holds the text register).
-  ko::getEventLoop()->post([tts = tts, speech] {
-    if (speech != -1) {
+  const bool spoken = id == -1 || id == text->instruction->id;
+  if (spoken) {
+    // The remaining actions go first: none begins once the animation that the current one
+    // waits for is stopped.
+    {
+      std::lock_guard lock(text->instruction->mutex);
+      text->receivedBookmarks.clear();
+      xDropRemainingActions(*text);
+      text->bookmarkCondition.notify_all();
+    }
+    // The speech engine and the audio player are told on the event loop: a stop returns at
+    // once, whatever they do (its caller holds the text register).
+    ko::getEventLoop()->post([tts = tts, speech] {
+      if (speech == -1)
+        return;
       try {
         tts->stop(speech);
       } catch (const std::exception& e) {
         KO_LOG_ERROR(kCategory) << "tts.stop() has thrown an exception: " << e.what();
       }
-    }
-  });
-  {
-    std::lock_guard lock(text->instruction->mutex);
-    text->receivedBookmarks.clear();
-    xDropRemainingActions(*text);
-    text->bookmarkCondition.notify_all();
+    });
   }
   xStopAllAnimations();
-  ko::getEventLoop()->post([audio = audioPlayer, plays = xTakeRunningSounds()] {
-    stopPlays(audio.get(), plays);
-  });
+  if (spoken) {
+    ko::getEventLoop()->post([audio = audioPlayer, plays = xTakeRunningSounds()] {
+      stopPlays(audio.get(), plays);
+    });
+  }
 }
 
 // ---- the speech engine's notifications ----------------------------------------------------

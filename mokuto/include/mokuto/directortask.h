@@ -11,7 +11,9 @@
 // "mrkpause" call (xBookmarkReached with blocking set); the behaviour manager's
 // "behaviorStopped" signal on its delivery thread; `stop` on any thread, the module calling
 // it with its text register's mutex held, so `stop` never waits for that mutex nor for the
-// text to end.
+// text to end, nor for another service: it asks the speech engine and the audio player to
+// stop from the event loop, and none of the locks that it takes is ever held across a call
+// of another service (a stop of an animation waits at most 200 ms for it).
 //
 // Locks, in the order they may be taken: the text register's mutex (the module's, around
 // `stop`); `animationsMutex`; the job's `mutex`; the speech lock (`ttsMutex`, shared by the
