@@ -1,8 +1,8 @@
 #include "loadertask.h"
 
-#include <cstdlib>
 #include <algorithm>
 #include <chrono>
+#include <cstdlib>
 #include <exception>
 #include <functional>
 #include <iterator>

@@ -65,7 +65,7 @@ TEST(ServiceStress, EightCallersAndTheirStoppersEndEveryTextOnce) {
   std::vector<std::thread> callers;
   for (int caller = 0; caller < kCallers; ++caller) {
     callers.emplace_back([&, caller] {
-      mokutotest::RandomTexts texts({mokutotest::kShort, mokutotest::kMid, mokutotest::kEnd},
+      mokutosoak::RandomTexts texts({mokutotest::kShort, mokutotest::kMid, mokutotest::kEnd},
                                     {"short", "mid", "end"}, {"bells/ding", "bells/dong"},
                                     static_cast<unsigned>(caller));
       for (int n = 0; n < says; ++n) {

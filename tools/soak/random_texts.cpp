@@ -2,7 +2,7 @@
 
 #include <utility>
 
-namespace mokutotest {
+namespace mokutosoak {
 
 namespace {
 
@@ -95,4 +95,4 @@ std::string RandomTexts::next() {
   return text + '.';
 }
 
-}  // namespace mokutotest
+}  // namespace mokutosoak

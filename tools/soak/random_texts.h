@@ -11,7 +11,7 @@
 #include <string>
 #include <vector>
 
-namespace mokutotest {
+namespace mokutosoak {
 
 class RandomTexts {
  public:
@@ -31,4 +31,4 @@ class RandomTexts {
   std::mt19937 fRandom;
 };
 
-}  // namespace mokutotest
+}  // namespace mokutosoak

@@ -4,7 +4,7 @@
 // (stop by id, _stopAll with and without waiting) and changes the configuration. Every
 // minute it prints the process's resident memory, threads and open descriptors; at the
 // end, whether every text ended exactly once. Exit status 0 when they all did, 1 if not,
-// 2 for a bad argument. Not a test of the default run: scripts/soak-say runs it.
+// 2 for a bad argument. scripts/soak-say builds and runs it.
 #include <dirent.h>
 
 #include <atomic>
@@ -123,7 +123,7 @@ int main(int argc, char** argv) {
   std::vector<std::thread> threads;
   for (std::uint32_t caller = 0; caller < 2; ++caller) {
     threads.emplace_back([&, caller] {
-      mokutotest::RandomTexts texts(animations, mokuto->_getTagList(),
+      mokutosoak::RandomTexts texts(animations, mokuto->_getTagList(),
                                     {"bells/ding", "bells/dong", "bells/chime"}, 7 + caller);
       while (!done.load()) {
         try {

@@ -10,7 +10,8 @@
 // were posted, on the module's own one-thread event loop and wait there until their text
 // ends. Texts are played one at a time by the player thread; a notifier thread raises the
 // events and starts the blocking calls, each on a thread of the module's hold loop, so
-// that stopping a text never waits for the handler. espeak-ng runs on the one thread of
+// that stopping a text never waits for the handler (a bookmark that a fault delays is
+// raised from the process's event loop). espeak-ng runs on the one thread of
 // the process that owns it. The settings and the table of texts in progress are guarded
 // by one mutex. The module's threads find services through the session, never holding
 // the broker.
