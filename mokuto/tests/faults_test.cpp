@@ -85,6 +85,7 @@ const char* kBlockingEnd =
     R"([["behaviorAtEndOfMokuto", "animations/Stand/Gestures/End_1"],
         ["ifBehaviorAtEndOfMokutoIsBlocking", true]])";
 const char* kNoArmsBreathing = R"([["armsBreathingAllowed", false]])";
+const char* kRandom = R"([["bodyLanguageMode", "random"]])";
 
 std::vector<Row> matrix() {
   const std::string hello = "Hello $a=1";
@@ -204,6 +205,13 @@ std::vector<Row> matrix() {
        kNoArmsBreathing},
       {"setBreathEnabled late", "ZUMotion.setBreathEnabled:delay=300ms", hello, 0, "",
        StopAt::Never, 0, kNoArmsBreathing},
+      // ---- the body talk, which moves while the speech waits for a sound ----
+      {"body talk: getAngles fails", "ZUMotion.getAngles:throw", sound, 0, "", StopAt::Never, 0,
+       kRandom},
+      {"body talk: getAngles late", "ZUMotion.getAngles:delay=300ms", sound, 0, "",
+       StopAt::Never, 0, kRandom},
+      {"body talk: a move that hangs, given up at its limit",
+       "ZUMotion.angleInterpolationBezier:hang", sound, 0, "", StopAt::Never, 0, kRandom},
       // ---- the memory ----
       {"raiseEvent fails: the text fails without end event", "ZUMemory.raiseEvent:throw", hello,
        400, "main: say() method detects an exception: ", StopAt::Never, kRestSkipped | kThrows},
