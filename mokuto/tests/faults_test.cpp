@@ -17,6 +17,7 @@
 #include "director_rig.h"
 #include "ko/json.hpp"
 #include "ko/log.hpp"
+#include "ko_test_helpers.hpp"
 #include "service_rig.h"
 #include "zu/zuproxy.h"
 #include "zu/zuvalueconverter.h"
@@ -328,6 +329,13 @@ TEST(FaultMatrix, EveryTextEndsOnceWithinItsLimitsAndTheNextIsSpokenNormally) {
       rig.faults->lift();
     }
     const bool ended = ready(said);
+    // Every fault struck (a stop asks the speech engine from the event loop: that call may
+    // come after the end of the text).
+    for (std::size_t k = 0; k < faults.size(); ++k) {
+      EXPECT_TRUE(rig.faults->waitForStrikes(faults[k].service, faults[k].operation,
+                                             strikesBefore[k] + 1, kBound))
+          << faults[k].service << "." << faults[k].operation << " never struck";
+    }
     rig.faults->lift();
     ASSERT_TRUE(ended || ready(said)) << "the text never ended";
     bool threw = false;
@@ -342,17 +350,15 @@ TEST(FaultMatrix, EveryTextEndsOnceWithinItsLimitsAndTheNextIsSpokenNormally) {
     EXPECT_EQ(rig.endEvents(id), throws ? 0u : 1u);
     EXPECT_LE((rig.clock->now() - clockBefore).count(), row.allowedMs);
     EXPECT_EQ(rig.events("a"), executed + ((row.flags & kRestSkipped) ? 0 : 1));
-    if (const auto colon = row.line.find(": "); colon != std::string::npos) {
-      EXPECT_TRUE(log->containsPart("mokuto." + row.line.substr(0, colon), Error,
-                                    row.line.substr(colon + 2)))
-          << row.line;
-    }
-    for (std::size_t k = 0; k < faults.size(); ++k) {
-      const auto& fault = faults[k];
-      EXPECT_GT(rig.faults->strikes(fault.service, fault.operation), strikesBefore[k])
-          << fault.service << "." << fault.operation << " never struck";
+    for (const auto& fault : faults) {
       EXPECT_TRUE(log->containsPart("robotsim.faults", ko::log::Warning,
                                     fault.service + "." + fault.operation + ": "));
+    }
+    if (const auto colon = row.line.find(": "); colon != std::string::npos) {
+      EXPECT_TRUE(ko::test::eventually([&] {
+        return log->containsPart("mokuto." + row.line.substr(0, colon), Error,
+                                 row.line.substr(colon + 2));
+      })) << row.line;
     }
 
     // The next text, without faults, on a robot at rest.
