@@ -336,8 +336,8 @@ void DirectorTask::process(const std::shared_ptr<MKTaskInstruction>& instruction
       fClock->waitFor(text->bookmarkCondition, lock, kBookmarkRound, MokutoClock::Wait::Round);
       continue;
     }
-    if (fClock->waitFor(text->bookmarkCondition, lock, kBookmarkGrace,
-                        MokutoClock::Wait::Limit) == std::cv_status::no_timeout)
+    if (fClock->waitFor(text->bookmarkCondition, lock, kBookmarkGrace, MokutoClock::Wait::Limit) ==
+        std::cv_status::no_timeout)
       continue;
     if (job.currentAction < job.actions.size()) {
       const std::size_t late = job.currentAction;
@@ -469,9 +469,8 @@ void DirectorTask::stop(MKID id) {
   }
   xStopAllAnimations();
   if (spoken) {
-    ko::getEventLoop()->post([audio = audioPlayer, plays = xTakeRunningSounds()] {
-      stopPlays(audio.get(), plays);
-    });
+    ko::getEventLoop()->post(
+        [audio = audioPlayer, plays = xTakeRunningSounds()] { stopPlays(audio.get(), plays); });
   }
 }
 

@@ -352,8 +352,8 @@ void DirectorTask::xWaitAnimation(AnimationLock& lock, const std::string& path,
     return;
   }
   while (running()) {
-    if (fClock->waitFor(animationsCondition, lock, kNotificationCheck,
-                        MokutoClock::Wait::Limit) != std::cv_status::timeout ||
+    if (fClock->waitFor(animationsCondition, lock, kNotificationCheck, MokutoClock::Wait::Limit) !=
+            std::cv_status::timeout ||
         !running())
       continue;
     bool stillRunning = false;

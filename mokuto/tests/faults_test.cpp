@@ -48,8 +48,8 @@ enum Flags : unsigned {
   // The text ends only once the plan is lifted: the service waits for the call without a
   // limit, as the robot's own would. Meanwhile the stop and the diagnosis answer.
   kRelease = 1,
-  kRestSkipped = 2,  // the "$a=1" that ends the text is not executed
-  kThrows = 4,       // a stage fails: say passes the error on, without end event
+  kRestSkipped = 2,      // the "$a=1" that ends the text is not executed
+  kThrows = 4,           // a stage fails: say passes the error on, without end event
   kStopAllBlocking = 8,  // stopped with _stopAll(true) rather than stop(id)
   kAsksTheSpeech = 16,   // the diagnosis asks the speech engine whether it speaks: it waits
 };
@@ -118,12 +118,10 @@ std::vector<Row> matrix() {
        "loader: injected fault"},
       {"resolveBehaviorName hangs", "ZUBehaviorManager.resolveBehaviorName:hang", start, 0, "",
        hang, held},
-      {"resolveBehaviorName late", "ZUBehaviorManager.resolveBehaviorName:delay=300ms", start,
-       200},
+      {"resolveBehaviorName late", "ZUBehaviorManager.resolveBehaviorName:delay=300ms", start, 200},
       {"preloadBehavior fails", "ZUBehaviorManager.preloadBehavior:throw", start, 200,
        "loader: Could not preload behavior " + S + ": "},
-      {"preloadBehavior hangs", "ZUBehaviorManager.preloadBehavior:hang", start, 0, "", hang,
-       held},
+      {"preloadBehavior hangs", "ZUBehaviorManager.preloadBehavior:hang", start, 0, "", hang, held},
       {"preloadBehavior late", "ZUBehaviorManager.preloadBehavior:delay=300ms", start, 200},
       {"loadSoundSet fails", "ZUAudioPlayer.loadSoundSet:throw", sound, 0,
        "loader: injected fault"},
@@ -132,8 +130,8 @@ std::vector<Row> matrix() {
       // ---- the director: the speech engine ----
       {"say fails: no speech, no bookmark", "ZUTextToSpeech.say:throw", hello, 400,
        lost + "1 has not been received in time.", StopAt::Never, kRestSkipped},
-      {"say hangs: stopped before the speech starts", "ZUTextToSpeech.say:hang", hello, 0, "",
-       hang, kRestSkipped},
+      {"say hangs: stopped before the speech starts", "ZUTextToSpeech.say:hang", hello, 0, "", hang,
+       kRestSkipped},
       {"say late", "ZUTextToSpeech.say:delay=300ms", hello},
       {"isRunning fails", "ZUTextToSpeech.isRunning:throw", hello, 400,
        "director: ZUTextToSpeech.isRunning has thrown an exception: "},
@@ -160,8 +158,8 @@ std::vector<Row> matrix() {
       {"startBehavior late", "ZUBehaviorManager.startBehavior:delay=300ms", start, 200},
       {"stopBehavior fails: given up after 200 ms, the next one starts",
        "ZUBehaviorManager.stopBehavior:throw", stopLong, 600, gaveUp},
-      {"stopBehavior hangs: given up after 200 ms", "ZUBehaviorManager.stopBehavior:hang",
-       stopLong, 600, gaveUp},
+      {"stopBehavior hangs: given up after 200 ms", "ZUBehaviorManager.stopBehavior:hang", stopLong,
+       600, gaveUp},
       {"stopBehavior late: given up after 200 ms", "ZUBehaviorManager.stopBehavior:delay=2s",
        stopLong, 600, gaveUp},
       {"behaviorStopped never: a stop given up after 200 ms", never, stopLong, 600, gaveUp},
@@ -170,23 +168,23 @@ std::vector<Row> matrix() {
        "^runTag(short) then $a=1", 5000, unheard},
       {"isBehaviorRunning fails", never + "ZUBehaviorManager.isBehaviorRunning:throw", run, 5000,
        "director: ZUBehaviorManager.isBehaviorRunning has thrown an exception: "},
-      {"isBehaviorRunning hangs", never + "ZUBehaviorManager.isBehaviorRunning:hang", run, 5200,
-       "", hang, held},
+      {"isBehaviorRunning hangs", never + "ZUBehaviorManager.isBehaviorRunning:hang", run, 5200, "",
+       hang, held},
       {"isBehaviorRunning late", never + "ZUBehaviorManager.isBehaviorRunning:delay=300ms", run,
        5000, unheard},
       {"runBehavior fails (the end behaviour)", "ZUBehaviorManager.runBehavior:throw", hello, 0,
-       "director: error while playing the behavior \"" + std::string(kEnd) + "\": ",
-       StopAt::Never, 0, kBlockingEnd},
+       "director: error while playing the behavior \"" + std::string(kEnd) + "\": ", StopAt::Never,
+       0, kBlockingEnd},
       {"runBehavior hangs", "ZUBehaviorManager.runBehavior:hang", hello, 0, "", hang, kRelease,
        kBlockingEnd},
-      {"runBehavior late", "ZUBehaviorManager.runBehavior:delay=300ms", hello, 0, "",
-       StopAt::Never, 0, kBlockingEnd},
+      {"runBehavior late", "ZUBehaviorManager.runBehavior:delay=300ms", hello, 0, "", StopAt::Never,
+       0, kBlockingEnd},
       // ---- the director: sounds and arm breathing ----
       {"playSoundSetFile fails", "ZUAudioPlayer.playSoundSetFile:throw", sound, 0,
        "director: the play of a file: \"bells/ding\" throw an error: "},
       {"a sound that never ends, stopped during ^waitSound",
-       "ZUAudioPlayer.playSoundSetFile:hang; ZUAudioPlayer.wait:delay=0ms", waitSound, 0, "",
-       hang, kRestSkipped},
+       "ZUAudioPlayer.playSoundSetFile:hang; ZUAudioPlayer.wait:delay=0ms", waitSound, 0, "", hang,
+       kRestSkipped},
       {"playSoundSetFile late", "ZUAudioPlayer.playSoundSetFile:delay=300ms", waitSound},
       {"stop of a sound fails", "ZUAudioPlayer.stop:throw", stopSound, 0,
        "director: ZUAudioPlayer has thrown an exception: "},
@@ -209,8 +207,8 @@ std::vector<Row> matrix() {
       // ---- the body talk, which moves while the speech waits for a sound ----
       {"body talk: getAngles fails", "ZUMotion.getAngles:throw", sound, 0, "", StopAt::Never, 0,
        kRandom},
-      {"body talk: getAngles late", "ZUMotion.getAngles:delay=300ms", sound, 0, "",
-       StopAt::Never, 0, kRandom},
+      {"body talk: getAngles late", "ZUMotion.getAngles:delay=300ms", sound, 0, "", StopAt::Never,
+       0, kRandom},
       {"body talk: a move that hangs, given up at its limit",
        "ZUMotion.angleInterpolationBezier:hang", sound, 0, "", StopAt::Never, 0, kRandom},
       // ---- the memory ----
@@ -234,8 +232,7 @@ std::vector<Row> matrix() {
       {"stopped entering the compiler", "", start, 0, "", StopAt::Compiler, kRestSkipped},
       {"stopped entering the loader", "", start, 0, "", StopAt::Loader, kRestSkipped},
       {"stopped entering the director", "", start, 0, "", StopAt::Director, kRestSkipped},
-      {"stopped while the speech holds for ^run", "", runLong, 200, "", StopAt::Hold,
-       kRestSkipped},
+      {"stopped while the speech holds for ^run", "", runLong, 200, "", StopAt::Hold, kRestSkipped},
       {"stopped during ^wait", "", "^start(" + L + ") a ^wait(" + L + ") b $a=1", 200, "",
        StopAt::Hold, kRestSkipped},
       {"_stopAll(true) gives up after 3 s on a text that does not end",

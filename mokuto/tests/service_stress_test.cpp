@@ -32,7 +32,8 @@ int saysPerCaller() {
   return says > 0 ? says : 10;
 }
 
-// Runs `step` with random pauses of up to `pauseMs` until `done`; answers the steps made.
+// A thread that runs `step` after random pauses of up to `pauseMs` until `done`, counting
+// its steps in `count`.
 template <class Step>
 std::thread every(std::atomic<bool>& done, std::atomic<int>& count, int pauseMs, unsigned seed,
                   Step step) {
@@ -120,8 +121,8 @@ TEST(ServiceStress, EightCallersAndTheirStoppersEndEveryTextOnce) {
     EXPECT_EQ(ends[id], 1) << "text " << id;
   const double seconds =
       std::chrono::duration<double>(std::chrono::steady_clock::now() - began).count();
-  std::cout << kCallers << " callers x " << says << " says in " << seconds << " s: "
-            << ends.size() << " end events; stops " << stops << ", _stopAll(false) " << stopAlls
+  std::cout << kCallers << " callers x " << says << " says in " << seconds << " s: " << ends.size()
+            << " end events; stops " << stops << ", _stopAll(false) " << stopAlls
             << ", _stopAll(true) " << waitingStopAlls << ", configuration rounds " << settings
             << ", packages declared " << packages << ", bookmark faults struck "
             << rig.faults->strikes("ZUTextToSpeech", "bookmarks") << std::endl;

@@ -425,14 +425,15 @@ TEST_F(ServicePipeline, ACallWhoseServiceDoesNotAnswerIsGivenUpAfterTheLookupTim
   auto pending = std::make_shared<std::vector<ko::Promise<ko::AnyObject>>>();
   auto asked = std::make_shared<ko::test::Counter>();
   const auto session = broker_->session();
-  session->setLookupHook([pending, asked](const std::string& name, const std::string&)
-                             -> std::optional<ko::Future<ko::AnyObject>> {
-    if (name != "ZUNowhere")
-      return std::nullopt;
-    pending->emplace_back();
-    asked->increment();
-    return pending->back().future();
-  });
+  session->setLookupHook(
+      [pending, asked](const std::string& name,
+                       const std::string&) -> std::optional<ko::Future<ko::AnyObject>> {
+        if (name != "ZUNowhere")
+          return std::nullopt;
+        pending->emplace_back();
+        asked->increment();
+        return pending->back().future();
+      });
   for (const bool stopped : {false, true}) {
     SCOPED_TRACE(stopped ? "stopped" : "timed out");
     ::setenv("KO_DEADLOCK_TIMEOUT", stopped ? "600000" : "100", 1);
@@ -449,9 +450,9 @@ TEST_F(ServicePipeline, ACallWhoseServiceDoesNotAnswerIsGivenUpAfterTheLookupTim
     else
       speech_->finish(spoken(0).id);
     ASSERT_TRUE(ready(text));
-    EXPECT_TRUE(log_->containsPart("mokuto.loader", ko::log::Error,
-                                   stopped ? "was given up: the text is stopped"
-                                           : "Can't find service: ZUNowhere"));
+    EXPECT_TRUE(log_->containsPart(
+        "mokuto.loader", ko::log::Error,
+        stopped ? "was given up: the text is stopped" : "Can't find service: ZUNowhere"));
   }
   EXPECT_TRUE(log_->contains("mokuto.loader", ko::log::Error,
                              "session.service(ZUNowhere) timeout after 30sec."));
@@ -676,8 +677,8 @@ TEST(ServiceOnTheRobot, RecognisedWordsRaiseTheirEmotionFromAConfidenceOfOneHalf
   for (const double confidence : {0.49, 0.5, 0.9}) {
     SCOPED_TRACE(confidence);
     rig.mokuto->_dialogMatchedInputCallback(
-        "WordRecognized", ZU::ZUValue::makeArray({ZU::ZUValue("I am happy"), ZU::ZUValue(confidence)}),
-        "");
+        "WordRecognized",
+        ZU::ZUValue::makeArray({ZU::ZUValue("I am happy"), ZU::ZUValue(confidence)}), "");
     raised += confidence >= 0.5 ? 1U : 0U;
     EXPECT_EQ(rig.events("AsrEmotion"), raised);
   }

@@ -30,15 +30,13 @@ const std::map<std::string_view, std::vector<std::string_view>>& serviceOperatio
         "getSubscribers"}},
       {"ZUMotion",
        {"getAngles", "setAngles", "angleInterpolationBezier", "areResourcesAvailable",
-        "getBreathEnabled", "setBreathEnabled", "_startBezierMove", "_stopMove",
-        "_isMoveRunning"}},
+        "getBreathEnabled", "setBreathEnabled", "_startBezierMove", "_stopMove", "_isMoveRunning"}},
       {kBehaviors,
        {"getInstalledBehaviors", "getBehaviorTags", "resolveBehaviorName", "preloadBehavior",
         "startBehavior", "runBehavior", "stopBehavior", "stopAllBehaviors", "isBehaviorRunning",
         "getRunningBehaviors", "installBehavior", "removeBehavior", "rescan"}},
       {"ZUAudioPlayer",
-       {"loadSoundSet", "unloadSoundSet", "getLoadedSoundSetsList", "playSoundSetFile",
-        "stopAll"}},
+       {"loadSoundSet", "unloadSoundSet", "getLoadedSoundSetsList", "playSoundSetFile", "stopAll"}},
       {"ZURobotPosture", {"getPostureFamily", "setPostureFamily", "getPostureFamilyList"}},
       {"ZURobotModel", {"_getRobotType", "_setRobotType"}},
       {"ZUAutonomousMoves", {"_moveForward", "_moveBackward", "_moveSides"}},
@@ -50,9 +48,9 @@ const std::map<std::string_view, std::vector<std::string_view>>& serviceOperatio
   return operations;
 }
 
-constexpr std::string_view kBuiltIns[] = {"version", "ping",    "getMethodList", "getMethodHelp",
-                                          "getModuleHelp", "wait", "isRunning", "stop",
-                                          "getBrokerName", "getUsage", "exit"};
+constexpr std::string_view kBuiltIns[] = {
+    "version",   "ping", "getMethodList", "getMethodHelp", "getModuleHelp", "wait",
+    "isRunning", "stop", "getBrokerName", "getUsage",      "exit"};
 
 std::string_view trim(std::string_view text) {
   const auto first = text.find_first_not_of(" \t\r\n");
@@ -154,8 +152,9 @@ Fault parseFault(std::string_view text) {
       if (at != std::string_view::npos)
         fault.bookmarks = bookmarkList(argument.substr(at + 1), text);
     } else {
-      refuse(text, "the bookmarks may be drop[=N,...], duplicate[=N,...], reorder[=N,...] or "
-                   "delay=DURATION[@N,...]");
+      refuse(text,
+             "the bookmarks may be drop[=N,...], duplicate[=N,...], reorder[=N,...] or "
+             "delay=DURATION[@N,...]");
     }
     return fault;
   }
@@ -167,9 +166,9 @@ Fault parseFault(std::string_view text) {
   }
 
   const auto& names = service->second;
-  const bool known = std::find(names.begin(), names.end(), fault.operation) != names.end() ||
-                     std::find(std::begin(kBuiltIns), std::end(kBuiltIns), fault.operation) !=
-                         std::end(kBuiltIns);
+  const bool known =
+      std::find(names.begin(), names.end(), fault.operation) != names.end() ||
+      std::find(std::begin(kBuiltIns), std::end(kBuiltIns), fault.operation) != std::end(kBuiltIns);
   if (!known) {
     std::string others = join(names);
     if (fault.service == kSpeech)
@@ -193,9 +192,8 @@ Fault parseFault(std::string_view text) {
 }
 
 bool concerns(const Fault& fault, std::int32_t bookmark) {
-  return fault.bookmarks.empty() ||
-         std::find(fault.bookmarks.begin(), fault.bookmarks.end(), bookmark) !=
-             fault.bookmarks.end();
+  return fault.bookmarks.empty() || std::find(fault.bookmarks.begin(), fault.bookmarks.end(),
+                                              bookmark) != fault.bookmarks.end();
 }
 
 std::string key(const std::string& service, const std::string& operation) {
@@ -279,9 +277,7 @@ void FaultPlan::strike(const std::string& service, const std::string& operation,
         const std::uint64_t lifts = fLifts;
         ++fHanging;
         fChanged.notify_all();
-        const auto released = [&] {
-          return fLifts != lifts || (task && task->isStopRequested());
-        };
+        const auto released = [&] { return fLifts != lifts || (task && task->isStopRequested()); };
         while (!released()) {
           if (task)
             fChanged.wait_for(lock, kStopPoll);

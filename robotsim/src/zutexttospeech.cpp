@@ -87,8 +87,8 @@ class ZUTextToSpeech::Listener : public SpeechPlayerListener {
         try {
           object->call<void>("_mrkpauseCallback", number);
         } catch (const std::exception& e) {
-          KO_LOG_ERROR(kCategory)
-              << handler << "._mrkpauseCallback(" << number << ") failed: " << e.what();
+          KO_LOG_ERROR(kCategory) << handler << "._mrkpauseCallback(" << number
+                                  << ") failed: " << e.what();
         }
       }
     });
@@ -410,7 +410,8 @@ void ZUTextToSpeech::xRecord(const std::string& operation, ko::AnyValue argument
     fOptions.timeline->record(getName(), operation, std::move(arguments), std::move(result));
 }
 
-void ZUTextToSpeech::xRaiseBookmark(std::int32_t number, std::chrono::steady_clock::duration delay) {
+void ZUTextToSpeech::xRaiseBookmark(std::int32_t number,
+                                    std::chrono::steady_clock::duration delay) {
   if (delay <= std::chrono::steady_clock::duration::zero()) {
     xRaise(kCurrentBookMarkEvent, ZU::ZUValue(number));
     return;

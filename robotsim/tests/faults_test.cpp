@@ -120,13 +120,13 @@ class RobotFaults : public ::testing::Test {
 TEST_F(RobotFaults, EveryPublishedMethodMayBeNamedAndNothingElse) {
   const auto bare = ZU::ZUModule::createModule<ZU::ZUModule>(robot_->broker(), "Bare");
   const auto builtIns = bare->getMethodList();
-  for (const char* service : {"ZUMemory", "ZUMotion", "ZUBehaviorManager", "ZUAudioPlayer",
-                              "ZURobotPosture", "ZURobotModel", "ZUAutonomousMoves",
-                              "ZUTextToSpeech"}) {
+  for (const char* service :
+       {"ZUMemory", "ZUMotion", "ZUBehaviorManager", "ZUAudioPlayer", "ZURobotPosture",
+        "ZURobotModel", "ZUAutonomousMoves", "ZUTextToSpeech"}) {
     SCOPED_TRACE(service);
     std::set<std::string> published;
-    for (const auto& name : ZU::ZUProxy(service, robot_->broker())
-                                .call<std::vector<std::string>>("getMethodList")) {
+    for (const auto& name :
+         ZU::ZUProxy(service, robot_->broker()).call<std::vector<std::string>>("getMethodList")) {
       if (std::find(builtIns.begin(), builtIns.end(), name) == builtIns.end())
         published.insert(name);
     }
@@ -167,8 +167,9 @@ TEST_F(RobotFaults, CallsFailHangUntilLiftedOrStoppedAndAnswerLate) {
   EXPECT_EQ(plan_->hanging(), 1u);
   EXPECT_EQ(model.wait_for(10ms), std::future_status::timeout);
   EXPECT_EQ(ZU::ZURobotPostureProxy(broker).getPostureFamily(), "Standing");  // late
-  EXPECT_TRUE(log_->contains(kFaults, ko::log::Warning,
-                             "ZURobotPosture.getPostureFamily: answers 20 ms late (injected fault)"));
+  EXPECT_TRUE(
+      log_->contains(kFaults, ko::log::Warning,
+                     "ZURobotPosture.getPostureFamily: answers 20 ms late (injected fault)"));
   plan_->lift();
   ASSERT_EQ(model.wait_for(kBound), std::future_status::ready);
   EXPECT_EQ(model.get(), 1);
@@ -177,9 +178,9 @@ TEST_F(RobotFaults, CallsFailHangUntilLiftedOrStoppedAndAnswerLate) {
 }
 
 TEST_F(RobotFaults, BookmarksAreDroppedRepeatedSwappedAndLate) {
-  plan_->set(parseFaults(
-      "ZUTextToSpeech.bookmarks:drop=2; ZUTextToSpeech.bookmarks:duplicate=3;"
-      "ZUTextToSpeech.bookmarks:reorder=4"));
+  plan_->set(
+      parseFaults("ZUTextToSpeech.bookmarks:drop=2; ZUTextToSpeech.bookmarks:duplicate=3;"
+                  "ZUTextToSpeech.bookmarks:reorder=4"));
   EXPECT_EQ(speak("a \\mrk=1\\ b \\mrk=2\\ c \\mrk=3\\ d \\mrk=4\\ e \\mrk=5\\ f", 5),
             (std::vector<int>{1, 3, 3, 5, 4}));
   // Held back at the end of the text, a bookmark comes before its end.

@@ -7,9 +7,9 @@ namespace mokutosoak {
 namespace {
 
 const std::vector<std::string> kWords = {
-    "hello", "my",     "friend", "how",    "are",   "you",   "today", "I",     "like",
-    "apples", "and",   "pears",  "but",    "not",   "tea",   "or",    "coffee", "yeah",
-    "think", "happy",  "one",    "two",    "three", "there", "is",    "a",     "robot"};
+    "hello",  "my",    "friend", "how", "are",   "you",   "today", "I",      "like",
+    "apples", "and",   "pears",  "but", "not",   "tea",   "or",    "coffee", "yeah",
+    "think",  "happy", "one",    "two", "three", "there", "is",    "a",      "robot"};
 
 }  // namespace
 
@@ -77,8 +77,9 @@ std::string RandomTexts::instruction() {
     default: {
       // What the parser or the loader refuses.
       static const std::vector<std::string> refused = {
-          "^nothing(x)", "^start(animations/Stand/Nowhere/None_1)", "^runSound(bells)",
-          "^call(ZUNowhere.method())", "^mode(sideways)", "^startTag(unheardof)"};
+          "^nothing(x)",      "^start(animations/Stand/Nowhere/None_1)",
+          "^runSound(bells)", "^call(ZUNowhere.method())",
+          "^mode(sideways)",  "^startTag(unheardof)"};
       return pick(refused);
     }
   }

@@ -138,8 +138,8 @@ int main(int argc, char** argv) {
   threads.emplace_back([&] {
     std::mt19937 random(11);
     while (!done.load()) {
-      std::this_thread::sleep_for(std::chrono::milliseconds(
-          std::uniform_int_distribution<int>(20, 1500)(random)));
+      std::this_thread::sleep_for(
+          std::chrono::milliseconds(std::uniform_int_distribution<int>(20, 1500)(random)));
       switch (std::uniform_int_distribution<int>(0, 9)(random)) {
         case 0:
           mokuto->_stopAll(true);

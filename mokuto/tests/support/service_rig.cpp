@@ -105,9 +105,8 @@ std::size_t ServiceRig::events(const std::string& key) const {
 bool ServiceRig::waitForTimeline(const std::string& service, const std::string& operation,
                                  std::size_t count) const {
   std::unique_lock lock(fWaiter->mutex);
-  return fWaiter->recorded.wait_for(lock, kBound, [&] {
-    return robot->timeline()->entries(service, operation).size() >= count;
-  });
+  return fWaiter->recorded.wait_for(
+      lock, kBound, [&] { return robot->timeline()->entries(service, operation).size() >= count; });
 }
 
 void ServiceRig::setStageHook(std::function<void(ZU::ZUMokutoStage, ZU::MKID)> hook) {
