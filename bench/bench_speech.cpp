@@ -2,6 +2,8 @@
 // bookmark, the time at which the player reached it minus the mark's audio time, both on
 // the text's playback clock. A module subscribed to the bookmark event stands for the
 // service, so that the memory service delivers every event as it would on the robot.
+// And for Japanese, the reading of a sentence into kana (MeCab) beside espeak-ng's
+// synthesis of the same sentence.
 #include <benchmark/benchmark.h>
 
 #include <algorithm>
@@ -12,8 +14,11 @@
 #include <vector>
 
 #include "ko/session.hpp"
+#include "robotsim/speechscript.h"
 #include "robotsim/zumemory.h"
 #include "robotsim/zutexttospeech.h"
+#include "speechjapanese.h"
+#include "speechsynthesizer.h"
 #include "zu/zubroker.h"
 #include "zu/zumodule.h"
 #include "zu/zuserviceproxies.h"
@@ -86,5 +91,54 @@ void BM_BookmarkLateness(benchmark::State& state) {
 }
 
 BENCHMARK(BM_BookmarkLateness)->Arg(200)->Iterations(2)->Unit(benchmark::kSecond)->UseRealTime();
+
+// Sentences of 11 to 28 characters, with a bookmark, a number and a Latin word among them.
+const std::vector<robotsim::SpeechScript>& japaneseSentences() {
+  static const std::vector<robotsim::SpeechScript> scripts = [] {
+    std::vector<robotsim::SpeechScript> out;
+    for (const char* text :
+         {"今日はいい天気ですね。", "博物館に3人で\\mrk=1\\行きました。",
+          "私はHelloと言いながら2024年に東京タワーを見た。", "ロボットが、ゆっくり歩いています！",
+          "みなさんと一緒にお話しできてうれしいです。"})
+      out.push_back(robotsim::parseSpeechText(text));
+    return out;
+  }();
+  return scripts;
+}
+
+// What the engine does to a Japanese sentence before espeak-ng: the reading and its SSML.
+void BM_JapaneseReading(benchmark::State& state) {
+  const auto& reader = robotsim::JapaneseReadings::shared();
+  const auto& sentences = japaneseSentences();
+  std::size_t i = 0;
+  for (auto _ : state) {
+    std::vector<robotsim::SpeechSourceSpan> sources;
+    benchmark::DoNotOptimize(
+        robotsim::toEspeakSsml(reader.read(sentences[i++ % sentences.size()]), &sources));
+  }
+  state.SetItemsProcessed(state.iterations());
+}
+BENCHMARK(BM_JapaneseReading)->Unit(benchmark::kMicrosecond);
+
+// espeak-ng's synthesis of the same sentences, reading included, to the last sample.
+void BM_JapaneseSynthesis(benchmark::State& state) {
+  const auto synthesizer = robotsim::makeEspeakSynthesizer();
+  robotsim::SpeechVoiceSettings voice;
+  voice.language = "Japanese";
+  const auto& sentences = japaneseSentences();
+  std::size_t i = 0;
+  double audioSeconds = 0;
+  for (auto _ : state) {
+    const auto& script = sentences[i++ % sentences.size()];
+    auto performance = std::make_shared<robotsim::SpeechPerformance>(
+        script.marks.size(), synthesizer->sampleRate(), false);
+    synthesizer->synthesize(script, voice, performance);
+    const auto samples = performance->waitForEnd();
+    audioSeconds += static_cast<double>(samples.value_or(0)) / synthesizer->sampleRate();
+  }
+  state.SetItemsProcessed(state.iterations());
+  state.counters["audio_ms"] = audioSeconds * 1000.0 / static_cast<double>(state.iterations());
+}
+BENCHMARK(BM_JapaneseSynthesis)->Unit(benchmark::kMillisecond)->UseRealTime();
 
 }  // namespace

@@ -6,6 +6,7 @@
 #include "robotsim/zumemory.h"
 #include "robotsim/zumotion.h"
 #include "robotsim/zurobotstate.h"
+#include "robotsim/zutimelineservice.h"
 
 namespace robotsim {
 
@@ -39,6 +40,9 @@ Robot::Robot(RobotOptions options, std::shared_ptr<ZU::ZUBroker> broker)
     options.speech.timeline = fTimeline;
     options.speech.faults = fFaults;
     fSpeech = xStart<ZUTextToSpeech>("ZUTextToSpeech", options.speech);
+    // The timeline is the simulation's own record, not a service of the robot: no faults.
+    fServices.push_back(ZU::ZUModule::createModule<ZUTimelineService>(
+        fBroker, ZUTimelineService::kServiceName, fTimeline));
   } catch (...) {
     xShutdown();
     throw;

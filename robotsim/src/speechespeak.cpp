@@ -12,6 +12,7 @@
 #include <thread>
 
 #include "ko/log.hpp"
+#include "speechjapanese.h"
 #include "speechsynthesizer.h"
 
 namespace robotsim {
@@ -47,8 +48,10 @@ class SpeechEspeakThread {
     fQueued.notify_one();
   }
 
-  // On the thread: speaks `ssml` into the performance.
-  void synthesize(const std::string& ssml, const SpeechVoiceSettings& voice,
+  // On the thread: speaks `ssml` into the performance; `sources` maps its characters to
+  // the caller's text, for the words.
+  void synthesize(const std::string& ssml, const std::vector<SpeechSourceSpan>& sources,
+                  const SpeechVoiceSettings& voice,
                   const std::shared_ptr<SpeechPerformance>& performance) {
     const auto& table = speechLanguageVoices();
     const auto it = std::find_if(table.begin(), table.end(),
@@ -73,10 +76,13 @@ class SpeechEspeakThread {
     espeak_SetParameter(espeakVOLUME, volume, 0);
 
     fPerformance = performance.get();
+    fSources = &sources;
+    fLastWord = std::string::npos;
     fSamples = 0;
     const espeak_ERROR result = espeak_Synth(ssml.c_str(), ssml.size() + 1, 0, POS_CHARACTER, 0,
                                              espeakCHARS_UTF8 | espeakSSML, nullptr, nullptr);
     fPerformance = nullptr;
+    fSources = nullptr;
     if (result != EE_OK && !performance->isCancelled()) {
       performance->fail("espeak-ng could not synthesise the text (error " +
                         std::to_string(static_cast<int>(result)) + ")");
@@ -139,6 +145,14 @@ class SpeechEspeakThread {
       return 0;
     SpeechPerformance& performance = *self->fPerformance;
     for (espeak_EVENT* e = events; e && e->type != espeakEVENT_LIST_TERMINATED; ++e) {
+      const std::uint64_t sample =
+          e->sample >= 0 ? static_cast<std::uint64_t>(e->sample)
+                         : static_cast<std::uint64_t>(std::max(e->audio_position, 0)) *
+                               static_cast<std::uint64_t>(self->fSampleRate) / 1000U;
+      if (e->type == espeakEVENT_WORD) {
+        self->xWord(*e, sample);
+        continue;
+      }
       if (e->type != espeakEVENT_MARK || !e->id.name)
         continue;
       std::size_t index = 0;
@@ -146,10 +160,6 @@ class SpeechEspeakThread {
       const auto [end, ec] = std::from_chars(name.data(), name.data() + name.size(), index);
       if (ec != std::errc() || end != name.data() + name.size())
         continue;
-      const std::uint64_t sample =
-          e->sample >= 0 ? static_cast<std::uint64_t>(e->sample)
-                         : static_cast<std::uint64_t>(std::max(e->audio_position, 0)) *
-                               static_cast<std::uint64_t>(self->fSampleRate) / 1000U;
       performance.reportMark(index, sample);
     }
     if (wav && count > 0) {
@@ -157,6 +167,29 @@ class SpeechEspeakThread {
       self->fSamples += static_cast<std::uint64_t>(count);
     }
     return performance.isCancelled() ? 1 : 0;
+  }
+
+  // A word event: its characters of the SSML (from 1) back to the caller's text. espeak-ng
+  // tells a word spelt letter by letter once per letter; it is kept once.
+  void xWord(const espeak_EVENT& e, std::uint64_t sample) {
+    if (!fSources || e.text_position <= 0)
+      return;
+    const auto first = static_cast<std::size_t>(e.text_position - 1);
+    const std::size_t last =
+        std::min(first + static_cast<std::size_t>(std::max(e.length, 1)), fSources->size());
+    std::size_t begin = std::string::npos;
+    std::size_t end = 0;
+    for (std::size_t i = first; i < last; ++i) {
+      const SpeechSourceSpan& span = (*fSources)[i];
+      if (span.begin == span.end)
+        continue;
+      begin = std::min(begin, span.begin);
+      end = std::max(end, span.end);
+    }
+    if (begin == std::string::npos || begin == fLastWord)
+      return;
+    fLastWord = begin;
+    fPerformance->reportWord(begin, end - begin, sample);
   }
 
   static inline SpeechEspeakThread* sCurrent = nullptr;  // only the thread reads it
@@ -170,6 +203,8 @@ class SpeechEspeakThread {
   std::vector<std::string> fLanguages;
   std::string fVoice;
   SpeechPerformance* fPerformance = nullptr;
+  const std::vector<SpeechSourceSpan>* fSources = nullptr;
+  std::size_t fLastWord = std::string::npos;  // where the last word began
   std::uint64_t fSamples = 0;
 };
 
@@ -181,15 +216,26 @@ class EspeakSynthesizer : public SpeechSynthesizer {
   bool producesAudio() const override { return true; }
   std::vector<std::string> languages() const override { return fThread.languages(); }
 
+  // Japanese is read into kana here, in the caller's thread.
   void synthesize(const SpeechScript& script, const SpeechVoiceSettings& voice,
                   std::shared_ptr<SpeechPerformance> performance) override {
-    fThread.post([thread = &fThread, ssml = toEspeakSsml(script), voice,
+    std::vector<SpeechSourceSpan> sources;
+    std::string ssml;
+    try {
+      ssml = voice.language == "Japanese"
+                 ? toEspeakSsml(JapaneseReadings::shared().read(script), &sources)
+                 : toEspeakSsml(script, &sources);
+    } catch (const std::exception& e) {
+      performance->fail(e.what());
+      return;
+    }
+    fThread.post([thread = &fThread, ssml = std::move(ssml), sources = std::move(sources), voice,
                   performance = std::move(performance)] {
       if (performance->isCancelled()) {
         performance->finish(0);
         return;
       }
-      thread->synthesize(ssml, voice, performance);
+      thread->synthesize(ssml, sources, voice, performance);
     });
   }
 

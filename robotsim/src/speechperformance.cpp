@@ -78,6 +78,16 @@ std::vector<std::size_t> SpeechPerformance::placedMarks() const {
   return fPlaced;
 }
 
+void SpeechPerformance::reportWord(std::size_t offset, std::size_t length, std::uint64_t sample) {
+  std::lock_guard lock(fMutex);
+  fWords.push_back(Word{offset, length, sample});
+}
+
+std::vector<SpeechPerformance::Word> SpeechPerformance::words() const {
+  std::lock_guard lock(fMutex);
+  return fWords;
+}
+
 void SpeechPerformance::cancel() {
   {
     std::lock_guard lock(fMutex);

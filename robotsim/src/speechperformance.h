@@ -34,6 +34,15 @@ class SpeechPerformance {
   void fail(std::string error);
   // The marks that synthesis did not report itself (placed by reportMark or finish).
   std::vector<std::size_t> placedMarks() const;
+  // A word begins at `sample`: bytes [offset, offset + length) of the caller's text.
+  void reportWord(std::size_t offset, std::size_t length, std::uint64_t sample);
+  struct Word {
+    std::size_t offset = 0;
+    std::size_t length = 0;
+    std::uint64_t sample = 0;
+  };
+  // The words reported so far, in order.
+  std::vector<Word> words() const;
 
   // ---- playback ----
   // Stops the text: wakes every wait and makes the synthesis give up.
@@ -76,6 +85,7 @@ class SpeechPerformance {
   std::uint64_t fProduced = 0;
   std::vector<std::uint64_t> fMarks;  // positions of the marks known so far, in order
   std::vector<std::size_t> fPlaced;
+  std::vector<Word> fWords;
   std::vector<std::int16_t> fAudio;
   std::uint64_t fHolds = 0;
   std::uint64_t fReleased = 0;

@@ -5,6 +5,7 @@
 #include <charconv>
 #include <limits>
 #include <optional>
+#include <span>
 
 namespace robotsim {
 
@@ -30,15 +31,23 @@ std::optional<std::int32_t> parseCount(std::string_view s) {
   return static_cast<std::int32_t>(value);
 }
 
-void appendText(SpeechScript& script, std::string_view text) {
+// Text from `source` in the caller's text; it joins the text before it when nothing lies
+// between the two.
+void appendText(SpeechScript& script, std::string_view text, std::size_t source) {
   if (text.empty())
     return;
-  if (!script.parts.empty() && script.parts.back().kind == SpeechScriptPart::Kind::Text) {
-    script.parts.back().text.append(text);
-    return;
+  if (!script.parts.empty()) {
+    SpeechScriptPart& last = script.parts.back();
+    if (last.kind == SpeechScriptPart::Kind::Text && last.source + last.sourceLength == source) {
+      last.text.append(text);
+      last.sourceLength += text.size();
+      return;
+    }
   }
   SpeechScriptPart part;
   part.text = std::string(text);
+  part.source = source;
+  part.sourceLength = text.size();
   script.parts.push_back(std::move(part));
 }
 
@@ -69,46 +78,102 @@ bool readTag(SpeechScript& script, std::string_view content) {
   return true;
 }
 
-void appendEscaped(std::string& out, std::string_view text) {
-  for (const char c : text) {
-    switch (c) {
-      case '&':
-        out += "&amp;";
-        break;
-      case '<':
-        out += "&lt;";
-        break;
-      case '>':
-        out += "&gt;";
-        break;
-      default:
-        // XML allows no control characters but tab and line breaks.
-        if (static_cast<unsigned char>(c) < 0x20 && c != '\t' && c != '\n' && c != '\r')
-          out += ' ';
-        else
-          out += c;
-    }
-  }
-}
-
 bool isBlank(char c) {
   return c == ' ' || c == '\t' || c == '\n' || c == '\r';
 }
 
-// Where a bookmark written at the end of `out` must go: before the punctuation of a
-// sentence that ends with a full stop (espeak-ng drops a mark after ". "), otherwise
-// at the end.
-std::size_t markPosition(const std::string& out) {
-  std::size_t end = out.size();
-  while (end > 0 && isBlank(out[end - 1]))
-    --end;
-  if (end == 0 || out[end - 1] != '.')
-    return out.size();
-  std::size_t start = end;
-  while (start > 0 && (out[start - 1] == '.' || out[start - 1] == '!' || out[start - 1] == '?'))
-    --start;
-  return start;
+// The punctuation of a sentence's end: a bookmark after one of the first group goes
+// before the whole run (espeak-ng drops a mark after ". ", and reports one after "。" at
+// the next sentence, after the pause).
+constexpr std::string_view kFullStops[] = {".", "。", "！", "？", "．"};
+constexpr std::string_view kSentenceEnds[] = {".", "!", "?", "。", "！", "？", "．"};
+
+std::string_view endingWith(std::string_view text, std::span<const std::string_view> ends) {
+  for (const std::string_view e : ends) {
+    if (text.ends_with(e))
+      return e;
+  }
+  return {};
 }
+
+// The SSML being written and, when asked for, the caller's bytes behind each of its bytes.
+class SsmlWriter {
+ public:
+  explicit SsmlWriter(bool mapped) : fMapped(mapped) {}
+
+  void markup(std::string_view s) { xAppend(s, {}); }
+
+  // Escaped; a reading maps as a whole to its source, words as written byte for byte.
+  void text(const SpeechScriptPart& part) {
+    const SpeechSourceSpan whole{part.source, part.source + part.sourceLength};
+    for (std::size_t i = 0; i < part.text.size(); ++i) {
+      const SpeechSourceSpan span =
+          part.reading ? whole : SpeechSourceSpan{part.source + i, part.source + i + 1};
+      const char c = part.text[i];
+      switch (c) {
+        case '&':
+          xAppend("&amp;", span);
+          break;
+        case '<':
+          xAppend("&lt;", span);
+          break;
+        case '>':
+          xAppend("&gt;", span);
+          break;
+        default:
+          // XML allows no control characters but tab and line breaks.
+          if (static_cast<unsigned char>(c) < 0x20 && c != '\t' && c != '\n' && c != '\r')
+            xAppend(" ", span);
+          else
+            xAppend(std::string_view(&c, 1), span);
+      }
+    }
+  }
+
+  // A bookmark: at the end, or before the punctuation of a sentence that ends there.
+  void mark(std::string_view tag) {
+    std::size_t end = fOut.size();
+    while (end > 0 && isBlank(fOut[end - 1]))
+      --end;
+    std::string_view head(fOut.data(), end);
+    if (endingWith(head, kFullStops).empty()) {
+      markup(tag);
+      return;
+    }
+    for (std::string_view e = endingWith(head, kSentenceEnds); !e.empty();
+         e = endingWith(head, kSentenceEnds))
+      head.remove_suffix(e.size());
+    fOut.insert(head.size(), tag);
+    if (fMapped)
+      fBytes.insert(fBytes.begin() + static_cast<std::ptrdiff_t>(head.size()), tag.size(),
+                    SpeechSourceSpan{});
+  }
+
+  std::string finish(std::vector<SpeechSourceSpan>* sources) {
+    if (sources) {
+      sources->clear();
+      for (std::size_t i = 0; i < fOut.size();) {
+        std::size_t next = i + 1;
+        while (next < fOut.size() && (static_cast<unsigned char>(fOut[next]) & 0xC0) == 0x80)
+          ++next;
+        sources->push_back(SpeechSourceSpan{fBytes[i].begin, fBytes[next - 1].end});
+        i = next;
+      }
+    }
+    return std::move(fOut);
+  }
+
+ private:
+  void xAppend(std::string_view s, SpeechSourceSpan span) {
+    fOut.append(s);
+    if (fMapped)
+      fBytes.insert(fBytes.end(), s.size(), span);
+  }
+
+  const bool fMapped;
+  std::string fOut;
+  std::vector<SpeechSourceSpan> fBytes;
+};
 
 }  // namespace
 
@@ -118,10 +183,10 @@ SpeechScript parseSpeechText(std::string_view text) {
   while (pos < text.size()) {
     const auto open = text.find('\\', pos);
     if (open == std::string_view::npos) {
-      appendText(script, text.substr(pos));
+      appendText(script, text.substr(pos), pos);
       break;
     }
-    appendText(script, text.substr(pos, open - pos));
+    appendText(script, text.substr(pos, open - pos), pos);
     const auto close = text.find('\\', open + 1);
     if (close == std::string_view::npos) {
       script.notes.push_back("unterminated tag dropped: " + std::string(text.substr(open)));
@@ -135,23 +200,34 @@ SpeechScript parseSpeechText(std::string_view text) {
   return script;
 }
 
-std::string toEspeakSsml(const SpeechScript& script) {
-  std::string out = "<speak>";
+std::string toEspeakSsml(const SpeechScript& script, std::vector<SpeechSourceSpan>* sources) {
+  SsmlWriter out(sources != nullptr);
+  out.markup("<speak>");
+  std::string voice;  // of the span open
   for (const auto& part : script.parts) {
     switch (part.kind) {
       case SpeechScriptPart::Kind::Text:
-        appendEscaped(out, part.text);
+        if (part.voice != voice) {
+          if (!voice.empty())
+            out.markup("</voice>");
+          if (!part.voice.empty())
+            out.markup("<voice name=\"" + part.voice + "\">");
+          voice = part.voice;
+        }
+        out.text(part);
         break;
       case SpeechScriptPart::Kind::Mark:
-        out.insert(markPosition(out), "<mark name=\"" + std::to_string(part.mark) + "\"/>");
+        out.mark("<mark name=\"" + std::to_string(part.mark) + "\"/>");
         break;
       case SpeechScriptPart::Kind::Break:
-        out += "<break strength=\"x-weak\" time=\"" + std::to_string(part.breakMs) + "ms\"/>";
+        out.markup("<break strength=\"x-weak\" time=\"" + std::to_string(part.breakMs) + "ms\"/>");
         break;
     }
   }
-  out += "</speak>";
-  return out;
+  if (!voice.empty())
+    out.markup("</voice>");
+  out.markup("</speak>");
+  return out.finish(sources);
 }
 
 }  // namespace robotsim

@@ -1,7 +1,8 @@
 #pragma once
 // The speech engine's synthesis backends: espeak-ng (real audio, on the one thread of the
-// process that owns espeak-ng) and a timing-only estimate from the text. Both write into
-// a SpeechPerformance and report the same bookmarks in the same order.
+// process that owns espeak-ng, with the words' audio times; Japanese read into kana
+// first, in the caller's thread) and a timing-only estimate from the text. Both write
+// into a SpeechPerformance and report the same bookmarks in the same order.
 //
 // A synthesizer's functions may be called from any thread.
 
@@ -41,8 +42,12 @@ class SpeechSynthesizer {
 
 // Raises std::runtime_error when espeak-ng cannot be initialised.
 std::unique_ptr<SpeechSynthesizer> makeEspeakSynthesizer();
-// Durations of `charactersPerSecond` characters of text a second at speed 100, pauses as
-// written; no audio, at espeak-ng's sample rate.
+// How many characters of a text, as written, espeak-ng speaks a second in `language` at
+// speed 100.
+double speechCharactersPerSecond(const std::string& language);
+// Durations of the text at `charactersPerSecond` characters a second at speed 100 (0: the
+// language's own rate), pauses as written; no audio, at espeak-ng's sample rate, and no
+// words.
 std::unique_ptr<SpeechSynthesizer> makeTimingSynthesizer(double charactersPerSecond);
 
 }  // namespace robotsim

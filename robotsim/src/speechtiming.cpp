@@ -8,11 +8,12 @@ namespace {
 
 constexpr int kTimingSampleRate = 22050;
 
-// Characters of UTF-8 text (continuation bytes are not counted).
-std::size_t characterCount(const std::string& text) {
+// Characters of UTF-8 text (continuation bytes are not counted), white space or not.
+std::size_t characterCount(const std::string& text, bool countBlanks) {
   std::size_t n = 0;
   for (const char c : text) {
-    if ((static_cast<unsigned char>(c) & 0xC0) != 0x80)
+    if ((static_cast<unsigned char>(c) & 0xC0) != 0x80 &&
+        (countBlanks || (c != ' ' && c != '\t' && c != '\n' && c != '\r')))
       ++n;
   }
   return n;
@@ -21,7 +22,7 @@ std::size_t characterCount(const std::string& text) {
 class TimingSynthesizer : public SpeechSynthesizer {
  public:
   explicit TimingSynthesizer(double charactersPerSecond)
-      : fCharactersPerSecond(charactersPerSecond > 0 ? charactersPerSecond : 14.0) {}
+      : fCharactersPerSecond(charactersPerSecond) {}
 
   int sampleRate() const override { return kTimingSampleRate; }
   bool producesAudio() const override { return false; }
@@ -36,12 +37,17 @@ class TimingSynthesizer : public SpeechSynthesizer {
   void synthesize(const SpeechScript& script, const SpeechVoiceSettings& voice,
                   std::shared_ptr<SpeechPerformance> performance) override {
     const double speed = voice.speed > 0 ? static_cast<double>(voice.speed) / 100.0 : 1.0;
-    const double samplesPerCharacter = kTimingSampleRate / (fCharactersPerSecond * speed);
+    const double rate =
+        fCharactersPerSecond > 0 ? fCharactersPerSecond : speechCharactersPerSecond(voice.language);
+    const double samplesPerCharacter = kTimingSampleRate / (rate * speed);
+    // Japanese is written without blanks: those of a text are the ones put around its tags.
+    const bool countBlanks = voice.language != "Japanese";
     double position = 0;
     for (const auto& part : script.parts) {
       switch (part.kind) {
         case SpeechScriptPart::Kind::Text:
-          position += static_cast<double>(characterCount(part.text)) * samplesPerCharacter;
+          position +=
+              static_cast<double>(characterCount(part.text, countBlanks)) * samplesPerCharacter;
           break;
         case SpeechScriptPart::Kind::Break:
           position += part.breakMs * (kTimingSampleRate / 1000.0);
@@ -59,6 +65,12 @@ class TimingSynthesizer : public SpeechSynthesizer {
 };
 
 }  // namespace
+
+double speechCharactersPerSecond(const std::string& language) {
+  // Measured on espeak-ng: Japanese counts kanji, kana and punctuation alike (a kanji
+  // often reads as two kana or more), without blanks.
+  return language == "Japanese" ? 5.9 : 14.0;
+}
 
 std::unique_ptr<SpeechSynthesizer> makeTimingSynthesizer(double charactersPerSecond) {
   return std::make_unique<TimingSynthesizer>(charactersPerSecond);

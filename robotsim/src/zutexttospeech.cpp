@@ -282,14 +282,24 @@ void ZUTextToSpeech::say(const std::string& text) {
   {
     std::lock_guard lock(fMutex);
     fTexts.erase(id);
-    fHistory[id] = utterance->marks;
+    Spoken& spoken = fHistory[id];
+    spoken.marks = utterance->marks;
+    for (const auto& word : performance->words()) {
+      spoken.words.push_back(SpeechWordRecord{
+          word.offset, word.length, text.substr(word.offset, word.length),
+          static_cast<std::int64_t>(word.sample * 1'000'000 /
+                                    static_cast<std::uint64_t>(performance->sampleRate()))});
+    }
     while (fHistory.size() > kHistorySize)
       fHistory.erase(fHistory.begin());
   }
-  for (const std::size_t index : performance->placedMarks()) {
-    KO_LOG_WARNING(kCategory) << "Text " << id << ": bookmark "
-                              << utterance->script.marks[index].number
-                              << " was not reported by the synthesis; placed by its neighbours";
+  // A stopped text's synthesis gives up before its last bookmarks: nothing to warn about.
+  if (!performance->isCancelled()) {
+    for (const std::size_t index : performance->placedMarks()) {
+      KO_LOG_WARNING(kCategory) << "Text " << id << ": bookmark "
+                                << utterance->script.marks[index].number
+                                << " was not reported by the synthesis; placed by its neighbours";
+    }
   }
   if (state != ko::FutureState::FinishedWithValue)
     ZU_THROW_ERROR(getName(), "say", ended.error());
@@ -397,7 +407,13 @@ void ZUTextToSpeech::saveRecording(const std::string& path) {
 std::vector<SpeechMarkRecord> ZUTextToSpeech::markRecords(int id) const {
   std::lock_guard lock(fMutex);
   const auto it = fHistory.find(id);
-  return it == fHistory.end() ? std::vector<SpeechMarkRecord>{} : it->second;
+  return it == fHistory.end() ? std::vector<SpeechMarkRecord>{} : it->second.marks;
+}
+
+std::vector<SpeechWordRecord> ZUTextToSpeech::wordRecords(int id) const {
+  std::lock_guard lock(fMutex);
+  const auto it = fHistory.find(id);
+  return it == fHistory.end() ? std::vector<SpeechWordRecord>{} : it->second.words;
 }
 
 int ZUTextToSpeech::sampleRate() const {

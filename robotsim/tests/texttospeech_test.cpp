@@ -143,6 +143,9 @@ INSTANTIATE_TEST_SUITE_P(
         SsmlCase{"One. \\mrk=1\\ \\mrk=2\\ Two", "One<mark name=\"0\"/><mark name=\"1\"/>.   Two"},
         SsmlCase{"Wait... \\mrk=1\\", "Wait<mark name=\"0\"/>... "},
         SsmlCase{"Really? \\mrk=1\\", "Really? <mark name=\"0\"/>"},
+        SsmlCase{"はい。\\mrk=1\\ええ？\\mrk=2\\そう！！\\mrk=3\\3．\\mrk=4\\",
+                 "はい<mark name=\"0\"/>。ええ<mark name=\"1\"/>？そう<mark name=\"2\"/>！！3<mark "
+                 "name=\"3\"/>．"},
         SsmlCase{"\\pau=500\\Hi", "<break strength=\"x-weak\" time=\"500ms\"/>Hi"},
         SsmlCase{"\\pau=99999999\\", "<break strength=\"x-weak\" time=\"60000ms\"/>"},
         SsmlCase{"a & b < c > d", "a &amp; b &lt; c &gt; d"},
@@ -188,6 +191,16 @@ TEST(TextToSpeechEspeak, BookmarksArriveInOrderAtTheirAudioTimes) {
   }
   // The pause is in the audio between bookmarks 3 and 4.
   EXPECT_GE(marks[3].audioUs - marks[2].audioUs, 300'000);
+  // The words are the caller's; the first bookmark comes with "there".
+  const auto records = robot.ttsModule->wordRecords(id);
+  std::vector<std::string> words;
+  for (const auto& word : records)
+    words.push_back(word.text);
+  EXPECT_EQ(words,
+            (std::vector<std::string>{"Hello", "there", "How", "are", "you", "today", "Fine"}));
+  ASSERT_EQ(records.size(), 7U);
+  EXPECT_NEAR(static_cast<double>(marks[0].audioUs), static_cast<double>(records[1].audioUs),
+              kToleranceUs);
   // The timeline shows each bookmark with its audio time and lateness.
   const auto entries = robot.timeline->entries("ZUTextToSpeech", "bookmark");
   ASSERT_EQ(entries.size(), 5U);

@@ -11,6 +11,7 @@
 #include <cstdint>
 #include <functional>
 #include <mutex>
+#include <optional>
 #include <ostream>
 #include <string>
 #include <vector>
@@ -35,6 +36,12 @@ class Timeline {
               ko::AnyValue result = {});
   // Microseconds since the timeline began (or was last cleared).
   std::int64_t now() const;
+  // When it began, on ko::os::ustime()'s clock (the steady clock of the machine).
+  std::int64_t originUs() const;
+  // Records an entry that happened at `us` (on this timeline's clock), elsewhere: a mirror
+  // of another process's timeline.
+  void recordAt(std::int64_t us, std::string service, std::string operation,
+                ko::AnyValue arguments = {}, ko::AnyValue result = {});
 
   std::vector<TimelineEntry> entries() const;
   // The entries of one service and operation, in order.
@@ -52,6 +59,9 @@ class Timeline {
   void addListener(Listener listener);
 
  private:
+  void xRecord(std::optional<std::int64_t> us, std::string service, std::string operation,
+               ko::AnyValue arguments, ko::AnyValue result);
+
   mutable std::mutex mutex_;
   std::chrono::steady_clock::time_point start_;
   std::vector<TimelineEntry> entries_;

@@ -1,20 +1,22 @@
 #pragma once
 // ZUTextToSpeech: the speech engine of the simulated robot. It speaks texts with the
-// inline tags "\mrk=N\", "\mrkpause=N\" and "\pau=N\" on espeak-ng (or, for tests and
-// benchmarks, on a timing-only estimate), plays them on a silent output with a real-time
-// playback clock, raises "ZUTextToSpeech/CurrentBookMark" and "ZUTextToSpeech/Status"
-// through ZUMemory, holds the speech at each "mrkpause" bookmark while the blocking
-// bookmark handler's "_mrkpauseCallback" runs, and keeps a recording of what it played.
+// inline tags "\mrk=N\", "\mrkpause=N\" and "\pau=N\" on espeak-ng, Japanese read into
+// kana with MeCab first (or, for tests and benchmarks, on a timing-only estimate), plays
+// them on a silent output with a real-time playback clock, raises
+// "ZUTextToSpeech/CurrentBookMark" and "ZUTextToSpeech/Status" through ZUMemory, holds the
+// speech at each "mrkpause" bookmark while the blocking bookmark handler's
+// "_mrkpauseCallback" runs, and keeps a recording of what it played and the audio times
+// of its words.
 //
 // Threads: calls arrive on ko threads; posted says run one at a time, in the order they
 // were posted, on the module's own one-thread event loop and wait there until their text
 // ends. Texts are played one at a time by the player thread; a notifier thread raises the
 // events and starts the blocking calls, each on a thread of the module's hold loop, so
 // that stopping a text never waits for the handler (a bookmark that a fault delays is
-// raised from the process's event loop). espeak-ng runs on the one thread of
-// the process that owns it. The settings and the table of texts in progress are guarded
-// by one mutex. The module's threads find services through the session, never holding
-// the broker.
+// raised from the process's event loop). espeak-ng runs on the one thread of the process
+// that owns it; a Japanese text is read into kana in its say's thread. The settings and the
+// table of texts in progress are guarded by one mutex. The module's threads find services
+// through the session, never holding the broker.
 //
 // Stopping, from any thread (a blocking-bookmark handler included):
 // - stop(id) stops the text of the posted say `id` whatever its state: queued, being
@@ -60,8 +62,9 @@ struct ZUTextToSpeechOptions {
   Backend backend = Backend::Espeak;
   // 1 real time, 2 twice as fast, kSpeechAsFastAsPossible without waiting.
   double playbackRate = 1.0;
-  // The timing backend's reading rate at speed 100.
-  double charactersPerSecond = 14.0;
+  // The timing backend's reading rate at speed 100, in characters as written a second;
+  // 0 for each language's own (Japanese 5.9, the others 14).
+  double charactersPerSecond = 0;
   std::string language = "English";
   // The module whose "_mrkpauseCallback" handles blocking bookmarks.
   std::string blockingBookmarkModule = "ZUMokuto";
@@ -113,6 +116,10 @@ class ZUTextToSpeech : public ZU::ZUModule {
   // ---- inspection ----
   // The marks of a text that ended (the last 256 texts are kept); empty when unknown.
   std::vector<SpeechMarkRecord> markRecords(int id) const;
+  // The words of a text that ended, as espeak-ng spoke them (none from the timing
+  // backend), in the same way; for Japanese, the words of the reading mapped back to the
+  // caller's text.
+  std::vector<SpeechWordRecord> wordRecords(int id) const;
   int sampleRate() const;
 
  private:
@@ -144,7 +151,11 @@ class ZUTextToSpeech : public ZU::ZUModule {
   mutable std::mutex fMutex;
   Settings fSettings;
   std::map<int, std::shared_ptr<SpeechUtterance>> fTexts;  // in progress
-  std::map<int, std::vector<SpeechMarkRecord>> fHistory;   // ended
+  struct Spoken {
+    std::vector<SpeechMarkRecord> marks;
+    std::vector<SpeechWordRecord> words;
+  };
+  std::map<int, Spoken> fHistory;  // ended
   int fNextDirectId = 1 << 30;
   std::uint64_t fStopAllGeneration = 0;  // counts the calls of stopAll
   ko::AnyObject fMemory;                 // cached lookup of the memory service
