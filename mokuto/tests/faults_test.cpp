@@ -98,6 +98,8 @@ std::vector<Row> matrix() {
   const std::string stopSound = "^startSound(bells/chime) a ^stopSound(bells/chime) b $a=1";
   const std::string mode2 = "^inputMode2(on) Hello $a=1";
   const std::string three = "a $a=1 b $b=1 c $c=1";
+  const std::string call = "^call(ZUAutonomousMoves._moveForward()) go $a=1";
+  const std::string move = "ZUAutonomousMoves._moveForward";
   const std::string stopLong = "^start(" + L + ") a ^stop(" + L + ") b ^start(" + S + ") c $a=1";
   const std::string gaveUp =
       "director: Behavior " + L + " did not stop before 200ms, timeout expired.";
@@ -211,6 +213,12 @@ std::vector<Row> matrix() {
        0, kRandom},
       {"body talk: a move that hangs, given up at its limit",
        "ZUMotion.angleInterpolationBezier:hang", sound, 0, "", StopAt::Never, 0, kRandom},
+      // ---- the calls of a text: waited for without a limit, as the robot's own ----
+      {"a called method fails", move + ":throw", call, 0,
+       "director: An exception as been thrown during this call: " + move + "([]) with this error: "},
+      {"a called method hangs", move + ":hang", call, 0, "", hang, held},
+      {"a called method late", move + ":delay=300ms", call},
+      {"a posted call hangs: not waited for", move + ":hang", "^pCall(" + move + "()) go $a=1"},
       // ---- the memory ----
       {"raiseEvent fails: the text fails without end event", "ZUMemory.raiseEvent:throw", hello,
        400, "main: say() method detects an exception: ", StopAt::Never, kRestSkipped | kThrows},
