@@ -404,12 +404,8 @@ void DirectorTask::xEndOfText(Text& text) {
   xStopAllAnimations();
   xStopAllSounds();
 
-  bool restoreBreathing = false;
-  {
-    std::lock_guard lock(fBreathMutex);
-    restoreBreathing = std::exchange(armsBreathingDisabled, false);
-  }
-  if (restoreBreathing) {
+  // The speech is over (speechOver): no handler of this text turns breathing off any more.
+  if (std::lock_guard breath(fBreathMutex); std::exchange(armsBreathingDisabled, false)) {
     try {
       if (!motion)
         ZU_THROW_ERROR("ZUProxy", "setBreathEnabled", "module destroyed");

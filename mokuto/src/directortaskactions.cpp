@@ -198,7 +198,7 @@ void DirectorTask::xSpeechStarted(const std::shared_ptr<Text>& text) {
   }
   // The motion service is asked without the locks, which a stop of the text takes.
   if (!job.config.armsBreathingAllowed && xArmsBreathingEnabled())
-    xDisableArmsBreathing();
+    xDisableArmsBreathing(*text);
 }
 
 bool DirectorTask::xArmsBreathingEnabled() {
@@ -210,14 +210,22 @@ bool DirectorTask::xArmsBreathingEnabled() {
   }
 }
 
-void DirectorTask::xDisableArmsBreathing() {
+void DirectorTask::xDisableArmsBreathing(Text& text) {
+  // Held across the call, as the end of the text holds it to turn breathing back on: a
+  // speech-start handler that met a slow motion service after the text ended (it was
+  // stopped meanwhile) leaves breathing as the end of the text left it.
+  std::lock_guard breath(fBreathMutex);
+  {
+    std::lock_guard lock(text.instruction->mutex);
+    if (text.speechOver)
+      return;
+  }
   try {
     live(motion, "setBreathEnabled").setBreathEnabled("Arms", false);
   } catch (const std::exception& e) {
     KO_LOG_ERROR(kCategory) << "ZUMotion.setBreathEnabled has thrown an exception: " << e.what();
     return;
   }
-  std::lock_guard lock(fBreathMutex);
   armsBreathingDisabled = true;
 }
 
@@ -237,7 +245,7 @@ void DirectorTask::xSetMode(Text& text, BodyLanguageMode mode) {
       bodyTalk->resume();
   } else if (mode == BODY_LANGUAGE_MODE_DISABLED) {
     if (!breathingAllowed && xArmsBreathingEnabled())
-      xDisableArmsBreathing();
+      xDisableArmsBreathing(text);
     if (bodyTalk)
       bodyTalk->pause();
     AnimationLock lock(animationsMutex);

@@ -168,7 +168,7 @@ class DirectorTask {
   bool xRemoveRunningAnimation(AnimationLock& lock, const std::string& path);
   void xPostStopBehavior(const std::string& path);
   void xSetMode(Text& text, BodyLanguageMode mode);
-  void xDisableArmsBreathing();
+  void xDisableArmsBreathing(Text& text);
   bool xArmsBreathingEnabled();
   void xPlayASound(const MKSoundAction& action);
   void xStopASound(const MKSoundAction& action);
@@ -213,6 +213,8 @@ class DirectorTask {
   std::mutex soundsMutex;
   std::vector<RunningSound> runningSounds;  // in start order, under soundsMutex
 
+  // Held across the motion service's calls that turn arm breathing off and back on (never
+  // taken by a stop), so that they come in the order of their decisions.
   std::mutex fBreathMutex;
   bool armsBreathingDisabled = false;  // under fBreathMutex
 };
