@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <charconv>
 #include <stdexcept>
+#include <string>
+#include <string_view>
 #include <utility>
 
 #include "ko/json.hpp"
@@ -36,7 +38,11 @@ std::vector<ko::AnyValue> MKCallAction::argumentList() const {
   try {
     return ko::fromJson(arguments).to<std::vector<ko::AnyValue>>();
   } catch (const ko::JsonError& e) {
-    ZU_THROW_ERROR(module, method, std::string("the arguments are no JSON: ") + e.what());
+    // The decoder's words, without its tag ("[json.exception.parse_error.101] ").
+    std::string_view why = e.what();
+    if (const auto tag = why.find("] "); why.rfind("[json.exception.", 0) == 0 && tag != why.npos)
+      why.remove_prefix(tag + 2);
+    ZU_THROW_ERROR(module, method, "the arguments are not JSON: " + std::string(why));
   } catch (const ko::ConversionError&) {
     ZU_THROW_ERROR(module, method, "the arguments are not a list");
   }
