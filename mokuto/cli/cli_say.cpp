@@ -29,6 +29,7 @@
 #include "ko/os.hpp"
 #include "ko/path.hpp"
 #include "mokuto/mokutoconfig.h"
+#include "robotsim/faults.h"
 #include "robotsim/soundlibrary.h"
 #include "zu/zuerror.h"
 #include "zu/zuproxy.h"
@@ -58,6 +59,7 @@ struct SayOptions {
   std::string timeline;
   bool dryRun = false;
   bool quiet = false;
+  std::string faults;
   std::optional<std::string> text;
 };
 
@@ -188,8 +190,10 @@ std::optional<Refusal> checkRemote(const CLI::App& command) {
   }
   if (command.count("--dry-run") > 0)
     return Refusal{"--dry-run needs the service in this process (without --connect)"};
-  if (command.count("--wav") > 0)
-    return Refusal{"--wav needs the robot in this process (without --connect)"};
+  for (const char* option : {"--wav", "--faults"}) {
+    if (command.count(option) > 0)
+      return Refusal{std::string(option) + " needs the robot in this process (without --connect)"};
+  }
   return std::nullopt;
 }
 
@@ -365,6 +369,7 @@ int say(SayOptions& o, const CLI::App& command) {
     serviceOptions.language = o.language;
     serviceOptions.posture = o.posture;
     serviceOptions.recordAudio = !o.wav.empty();
+    serviceOptions.faults = o.faults;
     const std::unique_ptr<ServiceHandle> handle = openService(serviceOptions);
     ServiceHandle& service = *handle;
     if (const auto refusal = configureService(o, values, service))
@@ -514,6 +519,23 @@ void addSayCommand(CLI::App& app, int& status) {
                     "JSON, with the error of each action that the loader knows or that its "
                     "call would meet, without speaking");
   command->add_flag("--quiet", o->quiet, "Print the summary only, not the live timeline");
+  command
+      ->add_option("--faults", o->faults,
+                   "Faults of the robot's services, separated by \";\": "
+                   "Service.operation:throw|hang|delay=300ms, "
+                   "ZUTextToSpeech.bookmarks:drop[=N,...]|duplicate|reorder|delay=600ms[@N,...], "
+                   "ZUBehaviorManager.behaviorStopped:never (a call that hangs answers at Ctrl-C)")
+      ->type_name("SPEC")
+      ->check(CLI::Validator(
+          [](std::string& spec) {
+            try {
+              robotsim::parseFaults(spec);
+              return std::string();
+            } catch (const robotsim::FaultSpecError& e) {
+              return std::string(e.what());
+            }
+          },
+          "SPEC"));
   addTextArgument(*command, o->text, "The annotated text (see mokuto syntax)");
   command->footer(
       "Exit status: 0 when the text was spoken (instruction errors and failed actions "
@@ -522,8 +544,8 @@ void addSayCommand(CLI::App& app, int& status) {
       "service fails; 130 when SIGINT (Ctrl-C) or SIGTERM stopped the text (its summary and "
       "files still come; a second signal, or one before the text is handed to the service, "
       "ends the command at once).\nWith mokuto --connect, --speech, --fast, --language and "
-      "--posture belong to the robot's process (zefoko serve --listen), and --wav and "
-      "--dry-run need the service in this one: they are usage errors.\nWarnings about the text "
+      "--posture belong to the robot's process (zefoko serve --listen), and --wav, --faults "
+      "and --dry-run need the service in this one: they are usage errors.\nWarnings about the text "
       "and log lines go to standard error, warnings and errors only unless ZEFOKO_LOG sets "
       "the levels.");
   command->callback([o, command, &status] { status = say(*o, *command); });

@@ -41,6 +41,8 @@ EmbeddedService::EmbeddedService(const EmbeddedServiceOptions& options) {
     host.robot.speech.playbackRate = robotsim::kSpeechAsFastAsPossible;
   host.postureFamily = options.posture;
   try {
+    if (!options.faults.empty())
+      host.robot.faults = std::make_shared<robotsim::FaultPlan>(options.faults);
     fHost = std::make_unique<zefoko::Host>(std::move(host));
     // As the module library's _createModule does, with the stage hook.
     const auto& broker = fHost->broker();
@@ -76,6 +78,12 @@ std::vector<std::string> EmbeddedService::installedBehaviors() {
 void EmbeddedService::setStageObserver(StageObserver observer) {
   std::lock_guard lock(fStageHook->mutex);
   fStageHook->observer = std::move(observer);
+}
+
+void EmbeddedService::stopText(ZU::MKID /*id*/) {
+  fService->_stopAll(false);
+  if (robot().faults())
+    robot().faults()->lift();
 }
 
 EmbeddedService::~EmbeddedService() {

@@ -33,6 +33,8 @@ struct EmbeddedServiceOptions {
   std::string posture;
   // Whether the speech engine keeps the audio for a WAV file.
   bool recordAudio = false;
+  // The robot's faults (robotsim/faults.h); empty for none.
+  std::string faults;
 };
 
 // The robot or the module cannot start, or the index is not built in time.
@@ -122,7 +124,8 @@ class EmbeddedService : public ServiceHandle {
   void setDirectorObserver(std::shared_ptr<ActionObserver> observer) override {
     fService->setDirectorObserver(std::move(observer));
   }
-  void stopText(ZU::MKID /*id*/) override { fService->_stopAll(false); }
+  // Also lifts the robot's faults, so that the calls that hang answer again.
+  void stopText(ZU::MKID id) override;
   std::vector<std::string> installedBehaviors() override;
   void setBodyLanguageModeFromStr(const std::string& mode) override {
     fService->setBodyLanguageModeFromStr(mode);

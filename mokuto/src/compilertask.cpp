@@ -1,6 +1,7 @@
 #include "mokuto/compilertask.h"
 
 #include <exception>
+#include <mutex>
 #include <utility>
 
 #include "ko/log.hpp"
@@ -41,6 +42,7 @@ void CompilerTask::process(const std::shared_ptr<MKTaskInstruction>& job) {
   if (const auto error = xLanguage(language)) {
     KO_LOG_ERROR(kCategory) << kLanguageError << *error;
   }
+  std::lock_guard lock(job->mutex);
   fParser.parse(job, job->text, language == "Japanese");
   fTagging->process(*job, language);
 }

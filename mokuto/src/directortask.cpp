@@ -12,6 +12,7 @@
 #include <utility>
 
 #include "directortask_text.h"
+#include "ko/eventloop.hpp"
 #include "ko/log.hpp"
 #include "ko/os.hpp"
 #include "mokuto/mkidregister.h"
@@ -66,9 +67,11 @@ bool DirectorTask::AnimationOrder::operator()(const MKAnimationAction& a,
 }
 
 DirectorTask::DirectorTask(const std::shared_ptr<ZUBroker>& broker,
-                           ZURobotBodyTalk* bodyTalkController, MKIDRegister& textRegister)
+                           ZURobotBodyTalk* bodyTalkController, MKIDRegister& textRegister,
+                           std::shared_ptr<MokutoClock> clock)
     : mkidRegister(textRegister),
       bodyTalk(bodyTalkController),
+      fClock(clock ? std::move(clock) : MokutoClock::real()),
       fSession(broker ? broker->session() : nullptr),
       currentText(std::make_shared<Text>(std::make_shared<MKTaskInstruction>(), nullptr)) {
   tts = makeProxy<ZUTextToSpeechProxy>(broker);
@@ -249,8 +252,9 @@ void DirectorTask::process(const std::shared_ptr<MKTaskInstruction>& instruction
   // effect now, as if it had come an instant later.
   if (mkidRegister.isMKIDStopped(id))
     stop(id);
-  lock.lock();
 
+  // The speech engine is called without the job's mutex, which a stop takes: a stop never
+  // waits for the speech engine.
   const bool inputMode2 = job.config.inputMode2;
   if (inputMode2) {
     try {
@@ -271,6 +275,7 @@ void DirectorTask::process(const std::shared_ptr<MKTaskInstruction>& instruction
       KO_LOG_ERROR(kCategory) << "ZUTextToSpeech.say has thrown an exception: " << e.what();
     }
   }
+  lock.lock();
 
   // The actions, in list order, each once its bookmark has come.
   const auto received = [&text](std::size_t index) {
@@ -324,12 +329,18 @@ void DirectorTask::process(const std::shared_ptr<MKTaskInstruction>& instruction
         xReport(*text, index);
       continue;
     }
+    lock.unlock();
     const bool running = xIsSpeechRunning();
+    lock.lock();
+    // A bookmark or a stop that came meanwhile is dealt with first.
+    if (job.currentAction != index || received(index))
+      continue;
     if (text->receivedBookmarks.empty() && running) {
-      text->bookmarkCondition.wait_for(lock, kBookmarkRound);
+      fClock->waitFor(text->bookmarkCondition, lock, kBookmarkRound, MokutoClock::Wait::Round);
       continue;
     }
-    if (text->bookmarkCondition.wait_for(lock, kBookmarkGrace) == std::cv_status::no_timeout)
+    if (fClock->waitFor(text->bookmarkCondition, lock, kBookmarkGrace, MokutoClock::Wait::Limit) ==
+        std::cv_status::no_timeout)
       continue;
     if (job.currentAction < job.actions.size()) {
       const std::size_t late = job.currentAction;
@@ -396,12 +407,8 @@ void DirectorTask::xEndOfText(Text& text) {
   xStopAllAnimations();
   xStopAllSounds();
 
-  bool restoreBreathing = false;
-  {
-    std::lock_guard lock(fBreathMutex);
-    restoreBreathing = std::exchange(armsBreathingDisabled, false);
-  }
-  if (restoreBreathing) {
+  // The speech is over (speechOver): no handler of this text turns breathing off any more.
+  if (std::lock_guard breath(fBreathMutex); std::exchange(armsBreathingDisabled, false)) {
     try {
       if (!motion)
         ZU_THROW_ERROR("ZUProxy", "setBreathEnabled", "module destroyed");
@@ -430,29 +437,40 @@ void DirectorTask::xEndOfText(Text& text) {
 // ---- stop -------------------------------------------------------------------------------
 
 void DirectorTask::stop(MKID id) {
-  xStopAllAnimations();
   std::shared_ptr<Text> text;
+  std::int32_t speech = -1;
   {
-    std::shared_lock speech(ttsMutex);
+    std::shared_lock lock(ttsMutex);
     text = xCurrentText();
-    if (id != text->instruction->id && id != -1)
-      return;
-    if (postId != -1) {
+    speech = postId;
+  }
+  const bool spoken = id == -1 || id == text->instruction->id;
+  if (spoken) {
+    // The remaining actions go first: none begins once the animation that the current one
+    // waits for is stopped.
+    {
+      std::lock_guard lock(text->instruction->mutex);
+      text->receivedBookmarks.clear();
+      xDropRemainingActions(*text);
+      text->bookmarkCondition.notify_all();
+    }
+    // The speech engine and the audio player are told on the event loop: a stop returns at
+    // once, whatever they do (its caller holds the text register).
+    ko::getEventLoop()->post([tts = tts, speech] {
+      if (speech == -1)
+        return;
       try {
-        tts->stop(postId);
+        tts->stop(speech);
       } catch (const std::exception& e) {
         KO_LOG_ERROR(kCategory) << "tts.stop() has thrown an exception: " << e.what();
       }
-    }
-  }
-  {
-    std::lock_guard lock(text->instruction->mutex);
-    text->receivedBookmarks.clear();
-    xDropRemainingActions(*text);
-    text->bookmarkCondition.notify_all();
+    });
   }
   xStopAllAnimations();
-  xStopAllSounds();
+  if (spoken) {
+    ko::getEventLoop()->post(
+        [audio = audioPlayer, plays = xTakeRunningSounds()] { stopPlays(audio.get(), plays); });
+  }
 }
 
 // ---- the speech engine's notifications ----------------------------------------------------

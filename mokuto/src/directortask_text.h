@@ -14,6 +14,9 @@
 
 namespace ZU {
 
+// Asks the audio player to stop each play (from any thread); a failure is logged.
+void stopPlays(const ZUAudioPlayerProxy* audio, const std::vector<int>& plays);
+
 struct DirectorTask::Text {
   static constexpr std::size_t kNone = std::numeric_limits<std::size_t>::max();
 

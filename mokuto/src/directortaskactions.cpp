@@ -9,7 +9,6 @@
 #include <vector>
 
 #include "directortask_text.h"
-#include "ko/json.hpp"
 #include "ko/log.hpp"
 #include "mokuto/directortask.h"
 #include "robotbodytalk/zurobotbodytalk.h"
@@ -37,6 +36,18 @@ const Proxy& live(const std::shared_ptr<Proxy>& proxy, const char* method) {
 }
 
 }  // namespace
+
+void stopPlays(const ZUAudioPlayerProxy* audio, const std::vector<int>& plays) {
+  for (const int play : plays) {
+    try {
+      if (!audio)
+        ZU_THROW_ERROR("ZUProxy", "stop", "module destroyed");
+      audio->stop(play);
+    } catch (const std::exception& e) {
+      KO_LOG_ERROR(kCategory) << "ZUAudioPlayer has thrown an exception: " << e.what();
+    }
+  }
+}
 
 void DirectorTask::xDoAction(Text& text, const std::shared_ptr<MKTaskAction>& action) {
   MKTaskInstruction& job = *text.instruction;
@@ -157,13 +168,7 @@ void DirectorTask::xCall(const MKCallAction& call) {
   try {
     if (!call.proxy)
       ZU_THROW_ERROR(call.module, call.method, "Module " + call.module + " not found");
-    std::vector<ko::AnyValue> arguments;
-    const ko::AnyValue decoded = ko::fromJson(call.arguments);
-    try {
-      arguments = decoded.to<std::vector<ko::AnyValue>>();
-    } catch (const ko::ConversionError&) {
-      ZU_THROW_ERROR(call.module, call.method, "the arguments are not a list");
-    }
+    const std::vector<ko::AnyValue> arguments = call.argumentList();
     if (call.type == CALL)
       call.proxy->callArgs<ko::AnyValue>(call.method, arguments);
     else
@@ -178,19 +183,22 @@ void DirectorTask::xCall(const MKCallAction& call) {
 // ---- body talk and arm breathing ----------------------------------------------------------
 
 void DirectorTask::xSpeechStarted(const std::shared_ptr<Text>& text) {
-  AnimationLock animations(animationsMutex);
   MKTaskInstruction& job = *text->instruction;
-  std::lock_guard lock(job.mutex);
-  // A status that comes after the speech (or after another text began) starts nothing.
-  if (text->speechOver || text != xCurrentText() || !bodyTalk)
-    return;
-  if (job.config.bodyLanguageMode != BODY_LANGUAGE_MODE_DISABLED && runningAnimations.empty()) {
-    bodyTalk->start(ZURobotBodyTalk::kSpeaking, kHeadAndArms, true);
-    return;
+  {
+    AnimationLock animations(animationsMutex);
+    std::lock_guard lock(job.mutex);
+    // A status that comes after the speech (or after another text began) starts nothing.
+    if (text->speechOver || text != xCurrentText() || !bodyTalk)
+      return;
+    if (job.config.bodyLanguageMode != BODY_LANGUAGE_MODE_DISABLED && runningAnimations.empty()) {
+      bodyTalk->start(ZURobotBodyTalk::kSpeaking, kHeadAndArms, true);
+      return;
+    }
+    bodyTalk->prepare(ZURobotBodyTalk::kSpeaking, kHeadAndArms, true);
   }
+  // The motion service is asked without the locks, which a stop of the text takes.
   if (!job.config.armsBreathingAllowed && xArmsBreathingEnabled())
-    xDisableArmsBreathing();
-  bodyTalk->prepare(ZURobotBodyTalk::kSpeaking, kHeadAndArms, true);
+    xDisableArmsBreathing(*text);
 }
 
 bool DirectorTask::xArmsBreathingEnabled() {
@@ -202,14 +210,22 @@ bool DirectorTask::xArmsBreathingEnabled() {
   }
 }
 
-void DirectorTask::xDisableArmsBreathing() {
+void DirectorTask::xDisableArmsBreathing(Text& text) {
+  // Held across the call, as the end of the text holds it to turn breathing back on: a
+  // speech-start handler that met a slow motion service after the text ended (it was
+  // stopped meanwhile) leaves breathing as the end of the text left it.
+  std::lock_guard breath(fBreathMutex);
+  {
+    std::lock_guard lock(text.instruction->mutex);
+    if (text.speechOver)
+      return;
+  }
   try {
     live(motion, "setBreathEnabled").setBreathEnabled("Arms", false);
   } catch (const std::exception& e) {
     KO_LOG_ERROR(kCategory) << "ZUMotion.setBreathEnabled has thrown an exception: " << e.what();
     return;
   }
-  std::lock_guard lock(fBreathMutex);
   armsBreathingDisabled = true;
 }
 
@@ -229,7 +245,7 @@ void DirectorTask::xSetMode(Text& text, BodyLanguageMode mode) {
       bodyTalk->resume();
   } else if (mode == BODY_LANGUAGE_MODE_DISABLED) {
     if (!breathingAllowed && xArmsBreathingEnabled())
-      xDisableArmsBreathing();
+      xDisableArmsBreathing(text);
     if (bodyTalk)
       bodyTalk->pause();
     AnimationLock lock(animationsMutex);
@@ -293,12 +309,24 @@ void DirectorTask::xStartAnimation(Text& text, const MKAnimationAction& action) 
     break;
   }
   runningAnimations.insert(action);
+  // The behaviour manager is called without the lock, which a stop of the text takes.
+  std::string error;
+  lock.unlock();
   try {
     live(behaviorManager, "startBehavior").startBehavior(action.animation);
   } catch (const std::exception& e) {
+    error = e.what();
+  }
+  lock.lock();
+  if (!error.empty()) {
     KO_LOG_ERROR(kCategory) << "Error caught while starting the animation: " << action.animation
-                            << ", with this error: " << e.what();
+                            << ", with this error: " << error;
     xRemoveRunningAnimation(lock, action.animation);
+    return;
+  }
+  if (runningAnimations.count(action) == 0) {
+    // Stopped (or over) while it started: what the start began goes too.
+    xPostStopBehavior(action.animation);
     return;
   }
   xStopAnimationsBelow(lock, action.type);
@@ -320,8 +348,8 @@ void DirectorTask::xWaitAnimation(AnimationLock& lock, const std::string& path,
   // Each notification begins a fresh wait: the limit counts from the last change of the table.
   if (limitMs >= 0) {
     while (running()) {
-      if (animationsCondition.wait_for(lock, std::chrono::milliseconds(limitMs)) ==
-              std::cv_status::timeout &&
+      if (fClock->waitFor(animationsCondition, lock, std::chrono::milliseconds(limitMs),
+                          MokutoClock::Wait::Limit) == std::cv_status::timeout &&
           running()) {
         KO_LOG_ERROR(kCategory) << "Behavior " << path << " did not stop before " << limitMs
                                 << "ms, timeout expired.";
@@ -332,17 +360,20 @@ void DirectorTask::xWaitAnimation(AnimationLock& lock, const std::string& path,
     return;
   }
   while (running()) {
-    if (animationsCondition.wait_for(lock, kNotificationCheck) != std::cv_status::timeout ||
+    if (fClock->waitFor(animationsCondition, lock, kNotificationCheck, MokutoClock::Wait::Limit) !=
+            std::cv_status::timeout ||
         !running())
       continue;
     bool stillRunning = false;
+    lock.unlock();  // as for a start
     try {
       stillRunning = live(behaviorManager, "isBehaviorRunning").isBehaviorRunning(path);
     } catch (const std::exception& e) {
       KO_LOG_ERROR(kCategory) << "ZUBehaviorManager.isBehaviorRunning has thrown an exception: "
                               << e.what();
     }
-    if (stillRunning)
+    lock.lock();
+    if (stillRunning || !running())
       continue;
     KO_LOG_ERROR(kCategory) << "MK hasn't been notified that the behavior: \"" << path
                             << "\" has stopped.\nMake sure that the animation name follow the "
@@ -461,19 +492,19 @@ void DirectorTask::xPlayASound(const MKSoundAction& action) {
 }
 
 void DirectorTask::xStopASound(const MKSoundAction& action) {
-  std::lock_guard lock(soundsMutex);
-  for (auto it = runningSounds.begin(); it != runningSounds.end(); ++it) {
-    if (it->action.soundSet != action.soundSet || it->action.soundName != action.soundName)
-      continue;
-    const int playId = it->playId;
-    runningSounds.erase(it);
-    try {
-      live(audioPlayer, "stop").stop(playId);
-    } catch (const std::exception& e) {
-      KO_LOG_ERROR(kCategory) << "ZUAudioPlayer has thrown an exception: " << e.what();
+  // The audio player is called without the lock, which a stop of the text takes.
+  std::vector<int> plays;
+  {
+    std::lock_guard lock(soundsMutex);
+    for (auto it = runningSounds.begin(); it != runningSounds.end(); ++it) {
+      if (it->action.soundSet == action.soundSet && it->action.soundName == action.soundName) {
+        plays.push_back(it->playId);
+        runningSounds.erase(it);
+        break;
+      }
     }
-    return;
   }
+  stopPlays(audioPlayer.get(), plays);
 }
 
 void DirectorTask::xWaitASound(const MKSoundAction& action) {
@@ -504,16 +535,17 @@ void DirectorTask::xWaitASound(const MKSoundAction& action) {
   }
 }
 
-void DirectorTask::xStopAllSounds() {
+std::vector<int> DirectorTask::xTakeRunningSounds() {
+  std::vector<int> plays;
   std::lock_guard lock(soundsMutex);
-  for (const auto& sound : runningSounds) {
-    try {
-      live(audioPlayer, "stop").stop(sound.playId);
-    } catch (const std::exception& e) {
-      KO_LOG_ERROR(kCategory) << "ZUAudioPlayer has thrown an exception: " << e.what();
-    }
-  }
+  for (const auto& sound : runningSounds)
+    plays.push_back(sound.playId);
   runningSounds.clear();
+  return plays;
+}
+
+void DirectorTask::xStopAllSounds() {
+  stopPlays(audioPlayer.get(), xTakeRunningSounds());
 }
 
 }  // namespace ZU

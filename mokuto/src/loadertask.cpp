@@ -1,9 +1,11 @@
 #include "loadertask.h"
 
+#include <algorithm>
+#include <chrono>
 #include <cstdlib>
 #include <exception>
+#include <functional>
 #include <iterator>
-#include <limits>
 #include <stdexcept>
 #include <string_view>
 #include <utility>
@@ -21,9 +23,6 @@ namespace ZU {
 namespace {
 
 constexpr const char* kCategory = "mokuto.loader";
-
-// The call of a module is looked up without a time limit.
-constexpr int kCallLookupTimeoutMs = std::numeric_limits<std::int32_t>::max();
 
 // The folders that name a posture family right after the package.
 struct PostureFolder {
@@ -57,27 +56,52 @@ Record& recordOf(MKTaskAction& action) {
   return *record;
 }
 
+// How often a lookup that has not answered looks whether its text was stopped.
+constexpr int kStopPollMs = 20;
+
 // The service of that name through the session: in the local scope, then in any scope,
-// each lookup bounded by the deadlock time-out. Raises ZUError when it is not found.
+// each lookup bounded by the deadlock time-out and given up as soon as `stopped` answers
+// true. Raises ZUError "Can't find service: <name>" (or that the text was stopped).
+ko::AnyObject findService(const std::shared_ptr<ko::Session>& session, const std::string& name,
+                          const std::function<bool()>& stopped) {
+  if (!session)
+    ZU_THROW_ERROR("ZUProxy", "ZUProxy", "Broker is invalid");
+  using Clock = std::chrono::steady_clock;
+  for (const char* scope : {"local", ""}) {
+    const auto found = session->service(name, scope);
+    const auto deadline = Clock::now() + std::chrono::milliseconds(ZUBroker::deadlockTimeout());
+    ko::FutureState state = ko::FutureState::Timeout;
+    for (;;) {
+      const auto left =
+          std::chrono::duration_cast<std::chrono::milliseconds>(deadline - Clock::now()).count();
+      state = found.wait(static_cast<int>(std::clamp<std::int64_t>(left, 0, kStopPollMs)));
+      if (state != ko::FutureState::Timeout || left <= 0)
+        break;
+      if (stopped && stopped())
+        ZU_THROW_ERROR("ZUProxy", "ZUProxy",
+                       "The lookup of the service " + name + " was given up: the text is stopped");
+    }
+    if (state == ko::FutureState::Timeout) {
+      KO_LOG_ERROR(kCategory) << "session.service(" << name << ") "
+                              << (*scope ? "timeout" : "timed out") << " after 30sec.";
+    } else if (state == ko::FutureState::FinishedWithValue) {
+      ko::AnyObject object = found.value();
+      if (object && object->isValid())
+        return object;
+    }
+  }
+  ZU_THROW_ERROR("ZUProxy", "ZUProxy", "Can't find service: " + name);
+}
+
+// The proxy of a robot service, kept in `cached` while the service lives.
 template <class Proxy>
 std::shared_ptr<Proxy> lookUp(const std::shared_ptr<ko::Session>& session,
                               std::shared_ptr<Proxy>& cached) {
   if (cached && cached->isValid())
     return cached;
   cached.reset();
-  if (session) {
-    for (const char* scope : {"local", ""}) {
-      const auto found = session->service(Proxy::kServiceName, scope);
-      if (found.wait(ZUBroker::deadlockTimeout()) == ko::FutureState::FinishedWithValue) {
-        ko::AnyObject object = found.value();
-        if (object && object->isValid()) {
-          cached = std::make_shared<Proxy>(std::move(object));
-          return cached;
-        }
-      }
-    }
-  }
-  ZU_THROW_ERROR("ZUProxy", "ZUProxy", std::string("Can't find service: ") + Proxy::kServiceName);
+  cached = std::make_shared<Proxy>(findService(session, Proxy::kServiceName, nullptr));
+  return cached;
 }
 
 }  // namespace
@@ -107,7 +131,17 @@ std::shared_ptr<ZUMemoryProxy> LoaderTask::xMemory() {
 
 // ---- the stage --------------------------------------------------------------------------
 
-void LoaderTask::process(MKTaskInstruction& instruction) {
+void LoaderTask::process(MKTaskInstruction& instruction, const std::function<bool()>& stopped) {
+  // What the diagnosis prints of an action (its type and text) changes under the job's
+  // mutex, taken only for that: never across a call of another service.
+  const auto markAsError = [&instruction](MKTaskAction& action, std::string_view code) {
+    std::lock_guard lock(instruction.mutex);
+    action.markAsError(code);
+  };
+  const auto skip = [&instruction](MKTaskAction& action) {
+    std::lock_guard lock(instruction.mutex);
+    action.type = UNKNOWN;
+  };
   {
     std::lock_guard lock(preloadMutex);
     preloadCounts.clear();
@@ -129,13 +163,13 @@ void LoaderTask::process(MKTaskInstruction& instruction) {
             resolved = xBehaviorManager()->resolveBehaviorName(animation);
           } catch (const std::exception& e) {
             KO_LOG_ERROR(kCategory) << e.what();
-            action.markAsError("ANIMATION_NOT_FOUND");
+            markAsError(action, "ANIMATION_NOT_FOUND");
             break;
           }
           if (resolved.empty()) {
             KO_LOG_ERROR(kCategory)
                 << "Animation \"" << animation << "\" not found. Instruction skipped.";
-            action.markAsError("ANIMATION_NOT_FOUND");
+            markAsError(action, "ANIMATION_NOT_FOUND");
           } else if (resolved == animation) {
             if (action.type == START)
               xRegisterPreload(animation);
@@ -156,7 +190,7 @@ void LoaderTask::process(MKTaskInstruction& instruction) {
             KO_LOG_WARNING(kCategory)
                 << action.text
                 << " action can't be done because the robot is in an unknown posture.";
-            action.markAsError("NO_ANIMATION_FOR_CURRENT_POSTURE");
+            markAsError(action, "NO_ANIMATION_FOR_CURRENT_POSTURE");
             break;
           }
           std::lock_guard lock(tagsMutex);
@@ -175,9 +209,9 @@ void LoaderTask::process(MKTaskInstruction& instruction) {
               KO_LOG_WARNING(kCategory)
                   << "Tag \"" << tagAction.tag << "\" not found for the "
                   << postureFamilyToStr(family) << " posture. Instruction skipped.";
-              action.markAsError("NO_ANIMATION_FOR_CURRENT_POSTURE");
+              markAsError(action, "NO_ANIMATION_FOR_CURRENT_POSTURE");
             }
-            action.type = UNKNOWN;
+            skip(action);
             break;
           }
           const std::set<std::string> choice = *candidates;
@@ -193,7 +227,7 @@ void LoaderTask::process(MKTaskInstruction& instruction) {
             xAudioPlayer()->loadSoundSet(soundSet);
           } catch (const std::exception& e) {
             KO_LOG_ERROR(kCategory) << e.what();
-            action.markAsError("SOUND_SET_NOT_FOUND");
+            markAsError(action, "SOUND_SET_NOT_FOUND");
           }
           break;
         }
@@ -201,13 +235,11 @@ void LoaderTask::process(MKTaskInstruction& instruction) {
         case PCALL: {
           MKCallAction& call = recordOf<MKCallAction>(action);
           try {
-            if (!session)
-              ZU_THROW_ERROR("ZUProxy", "ZUProxy", "Broker is invalid");
-            ko::AnyObject service = session->service(call.module, "").value(kCallLookupTimeoutMs);
-            call.proxy = std::make_shared<ZUProxy>(std::move(service), call.module);
+            call.proxy =
+                std::make_shared<ZUProxy>(findService(session, call.module, stopped), call.module);
           } catch (const std::exception& e) {
             KO_LOG_ERROR(kCategory) << e.what();
-            action.markAsError("MODULE_NOT_FOUND");
+            markAsError(action, "MODULE_NOT_FOUND");
           }
           break;
         }
@@ -217,7 +249,7 @@ void LoaderTask::process(MKTaskInstruction& instruction) {
     } catch (const std::exception& e) {
       // A record that does not fit its type, or no memory left: only this action is lost.
       KO_LOG_ERROR(kCategory) << e.what();
-      action.type = UNKNOWN;
+      skip(action);
     }
   }
   if (!instruction.config.behaviorAtEndOfMokuto.empty())

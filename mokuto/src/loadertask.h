@@ -33,6 +33,7 @@
 #include <atomic>
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -78,8 +79,12 @@ class LoaderTask {
   LoaderTask& operator=(const LoaderTask&) = delete;
 
   // ---- the stage ----
-  // Prepares every action of the job; never throws (each failure marks its action).
-  void process(MKTaskInstruction& instruction);
+  // Prepares every action of the job; never throws (each failure marks its action). The
+  // services of calls are looked up as the framework looks services up, each scope bounded
+  // by the deadlock time-out; `stopped` (may be empty) ends such a lookup when it answers
+  // true. The job's mutex is taken only to change an action's type and text (what the
+  // diagnosis prints), never across a call of another service.
+  void process(MKTaskInstruction& instruction, const std::function<bool()>& stopped = {});
   // A behaviour has stopped: if the current text starts it again, preloads it again
   // (without waiting); after its last expected start its entry goes.
   void onBehaviorStopped(const std::string& name);

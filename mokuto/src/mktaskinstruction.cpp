@@ -3,7 +3,12 @@
 #include <algorithm>
 #include <charconv>
 #include <stdexcept>
+#include <string>
+#include <string_view>
 #include <utility>
+
+#include "ko/json.hpp"
+#include "zu/zuerror.h"
 
 namespace ZU {
 
@@ -27,6 +32,20 @@ std::string MKTaskAction::bookmark() const {
   std::string out;
   appendBookmark(out);
   return out;
+}
+
+std::vector<ko::AnyValue> MKCallAction::argumentList() const {
+  try {
+    return ko::fromJson(arguments).to<std::vector<ko::AnyValue>>();
+  } catch (const ko::JsonError& e) {
+    // The decoder's words, without its tag ("[json.exception.parse_error.101] ").
+    std::string_view why = e.what();
+    if (const auto tag = why.find("] "); why.rfind("[json.exception.", 0) == 0 && tag != why.npos)
+      why.remove_prefix(tag + 2);
+    ZU_THROW_ERROR(module, method, "the arguments are not JSON: " + std::string(why));
+  } catch (const ko::ConversionError&) {
+    ZU_THROW_ERROR(module, method, "the arguments are not a list");
+  }
 }
 
 void MKTaskAction::markAsError(std::string_view code) {

@@ -207,9 +207,9 @@ ZUMokuto::ZUMokuto(const std::shared_ptr<ZUBroker>& broker, const std::string& n
       compiler(makeMember<CompilerTask>("compiler", [&] { return makeCompiler(broker); })),
       loader(makeMember<LoaderTask>(
           "loader", [&] { return std::make_shared<LoaderTask>(broker, bodyTalk); })),
-      director(makeMember<DirectorTask>("director", [&] {
-        return std::make_shared<DirectorTask>(broker, bodyTalk->bodyTalk, textRegister);
-      })) {
+      // Without a speech engine the module cannot be built: the director's error goes on.
+      director(std::make_shared<DirectorTask>(broker, bodyTalk->bodyTalk, textRegister,
+                                              fOptions.clock)) {
   setModuleDescription("The Mokuto module makes ZEFO interpret a text annotated with behaviors.");
   const auto& methods = publishedMethods();
   bindMethods(kModuleName, std::span(methods).first(methods.size() - 1));
@@ -314,20 +314,19 @@ void ZUMokuto::xFreeMKID(MKID id) {
 }
 
 void ZUMokuto::xCompileAndLoad(const std::shared_ptr<MKTaskInstruction>& instruction, MKID id) {
+  // The stages change the job under its mutex (the diagnosis may print it meanwhile), but
+  // call the robot's services without it.
   {
     std::lock_guard lock(compilerMutex);
     if (!textRegister.isMKIDStopped(id)) {
       xEnterStage(ZUMokutoStage::Compiler, id);
-      // The diagnosis may print the job of any registered text meanwhile.
-      std::lock_guard jobLock(instruction->mutex);
       compiler->process(instruction);
     }
   }
   std::lock_guard lock(loaderMutex);
   if (!textRegister.isMKIDStopped(id)) {
     xEnterStage(ZUMokutoStage::Loader, id);
-    std::lock_guard jobLock(instruction->mutex);
-    loader->process(*instruction);
+    loader->process(*instruction, [this, id] { return textRegister.isMKIDStopped(id); });
   }
 }
 
@@ -414,8 +413,9 @@ void ZUMokuto::_stopAll(bool blocking) {
   if (!blocking)
     return;
   while (!textRegister.textsToStop.empty()) {
-    if (textRegister.textsCondition.wait_for(lock, fOptions.stopAllWait) ==
-        std::cv_status::timeout) {
+    const auto& clock = fOptions.clock ? fOptions.clock : MokutoClock::real();
+    if (clock->waitFor(textRegister.textsCondition, lock, fOptions.stopAllWait,
+                       MokutoClock::Wait::Limit) == std::cv_status::timeout) {
       KO_LOG_ERROR(kMain) << "ZUMokuto.stopAll() makes more than 3 seconds, we skip this method";
       break;
     }

@@ -349,6 +349,47 @@ TEST_F(Director, StopTagStopsOnlyTheFirstAnimationOfTheTag) {
   EXPECT_TRUE(end(run));
 }
 
+TEST_F(Director, TagsAndNamesAreRunWaitedForAndStoppedByTheirActions) {
+  struct Case {
+    std::string text;
+    std::vector<int> marks;  // raised in turn; a negative one as a held "mrkpause"
+    const char* stopped;     // stops, and is heard to stop, before "x" is raised
+  };
+  const std::string longGesture = kLongA;
+  const std::vector<Case> cases = {
+      {"^runTag(short) then $x=1", {-1, 2}, kShort},
+      {"^startTag(mid) a ^waitTag(mid) b $x=1", {1, -2, 3}, kMid},
+      {"^start(" + longGesture + ") a ^stop(" + longGesture + ") b $x=1", {1, 2, 3}, kLongA},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.text);
+    rig_.timeline->clear();
+    Run run = begin(rig_.job(c.text, {}, {{"short", kShort}, {"mid", kMid}}));
+    for (const int mark : c.marks) {
+      if (mark < 0)
+        ASSERT_TRUE(paused(-mark));
+      else
+        bookmark(mark);
+    }
+    ASSERT_TRUE(rig_.waitFor("ZUMemory", "raiseEvent", "x"));
+    EXPECT_TRUE(before("behaviorStopped", c.stopped, "raiseEvent", "x"));
+    EXPECT_TRUE(end(run));
+  }
+  EXPECT_FALSE(log_->containsPart(kDirector, ko::log::Error, "did not stop before"));
+}
+
+TEST_F(Director, ABookmarkWhileNoTextIsSpokenIsIgnored) {
+  ZU::DirectorTask& director = rig_.host->director();
+  director.xOnBookmark(ZU::ZUValue(1));
+  auto held = std::async(std::launch::async, [&director] { director.xBookmarkReached(1, true); });
+  ASSERT_EQ(held.wait_for(kBound), std::future_status::ready);  // the speech is not held
+  Run run = begin(rig_.job("$x=1 Hello"));
+  rig_.speech->finish(run.say.id);
+  ASSERT_TRUE(recorder_->waitFor(1));
+  EXPECT_EQ(outcomes(), std::vector{Outcome::Skipped});
+  EXPECT_TRUE(end(run));
+}
+
 TEST_F(Director, ABehaviourThatStopsUnheardIsLetGoByTheFiveSecondCheck) {
   // The director no longer hears the behaviour manager; the speech events still come.
   ZU::DirectorTask& director = rig_.host->director();

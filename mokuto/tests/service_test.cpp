@@ -15,12 +15,14 @@
 #include <map>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <stdexcept>
 #include <string>
 #include <utility>
 #include <vector>
 
 #include "ko/log.hpp"
+#include "ko/path.hpp"
 #include "ko/reaper.hpp"
 #include "ko/session.hpp"
 #include "ko_test_helpers.hpp"
@@ -33,6 +35,7 @@
 #include "robotsim/zurobotstate.h"
 #include "robotsim/zutexttospeech.h"
 #include "scripted_speech.h"
+#include "service_rig.h"
 #include "zefoko/host.h"
 #include "zu/zumoduleentry.h"
 #include "zu/zuproxy.h"
@@ -417,6 +420,48 @@ TEST_F(ServicePipeline, PrepareCompilesAndLoadsInTheLastReportedPostureWithoutSp
     EXPECT_NE(entry.first, Stage::Director);
 }
 
+TEST_F(ServicePipeline, ACallWhoseServiceDoesNotAnswerIsGivenUpAfterTheLookupTimeOrAtAStop) {
+  // The lookups of "ZUNowhere" never answer.
+  auto pending = std::make_shared<std::vector<ko::Promise<ko::AnyObject>>>();
+  auto asked = std::make_shared<ko::test::Counter>();
+  const auto session = broker_->session();
+  session->setLookupHook(
+      [pending, asked](const std::string& name,
+                       const std::string&) -> std::optional<ko::Future<ko::AnyObject>> {
+        if (name != "ZUNowhere")
+          return std::nullopt;
+        pending->emplace_back();
+        asked->increment();
+        return pending->back().future();
+      });
+  for (const bool stopped : {false, true}) {
+    SCOPED_TRACE(stopped ? "stopped" : "timed out");
+    ::setenv("KO_DEADLOCK_TIMEOUT", stopped ? "600000" : "100", 1);
+    ZU::ZUBroker::resetDeadlockTimeoutForTesting();
+    const int before = asked->value();
+    auto text = sayAsync("^call(ZUNowhere.anything()) hi");
+    ASSERT_TRUE(asked->waitFor(before + 1));
+    // The job is not held meanwhile: the diagnosis prints it.
+    auto lines = std::async(std::launch::async, [this] { return mokuto_->diagnosisLines(); });
+    ASSERT_EQ(lines.wait_for(kBound), std::future_status::ready);
+    EXPECT_EQ(lines.get().at(7), "number of texts in the stack: 1");
+    if (stopped)
+      mokuto_->stop(stages_->all().back().second);
+    else
+      speech_->finish(spoken(0).id);
+    ASSERT_TRUE(ready(text));
+    EXPECT_TRUE(log_->containsPart(
+        "mokuto.loader", ko::log::Error,
+        stopped ? "was given up: the text is stopped" : "Can't find service: ZUNowhere"));
+  }
+  EXPECT_TRUE(log_->contains("mokuto.loader", ko::log::Error,
+                             "session.service(ZUNowhere) timeout after 30sec."));
+  EXPECT_EQ(endEvents().size(), 2u);
+  session->setLookupHook(nullptr);
+  ::unsetenv("KO_DEADLOCK_TIMEOUT");
+  ZU::ZUBroker::resetDeadlockTimeoutForTesting();
+}
+
 // ---- the method table and the configuration methods ---------------------------------------
 
 struct MethodRow {
@@ -622,7 +667,75 @@ TEST_F(ServiceIndex, TagPageListsTheVisibleTags) {
   EXPECT_EQ(mokuto_->tagPage(), head + table + rows + "</table>" + tail);
 }
 
+// ---- on the whole simulated robot --------------------------------------------------------
+
+TEST(ServiceOnTheRobot, RecognisedWordsRaiseTheirEmotionFromAConfidenceOfOneHalf) {
+  if (ko::path::findData("zefoko", "mokuto/syntacticanalysis/englishemotionsdatabase.bdb").empty())
+    GTEST_SKIP() << "the build made no linguistic databases";
+  mokutotest::ServiceRig rig;
+  std::size_t raised = 0;
+  for (const double confidence : {0.49, 0.5, 0.9}) {
+    SCOPED_TRACE(confidence);
+    rig.mokuto->_dialogMatchedInputCallback(
+        "WordRecognized",
+        ZU::ZUValue::makeArray({ZU::ZUValue("I am happy"), ZU::ZUValue(confidence)}), "");
+    raised += confidence >= 0.5 ? 1U : 0U;
+    EXPECT_EQ(rig.events("AsrEmotion"), raised);
+  }
+  for (const auto& entry : rig.robot->timeline()->entries("ZUMemory", "raiseEvent")) {
+    const auto arguments = entry.arguments.to<std::vector<ko::AnyValue>>();
+    if (arguments.at(0).to<std::string>() == "AsrEmotion") {
+      EXPECT_GT(arguments.at(1).to<int>(), 0);
+    }
+  }
+}
+
+TEST(ServiceOnTheRobot, TheTimingCheckerFramesTheEndEventAndComesBackWhenSwitchedOnAgain) {
+  mokutotest::ServiceRig rig;
+  ko::log::ScopedCapture log(ko::log::Info);
+  const std::vector<std::string> framed = {"ZUMokuto/StartOfMK", kEnd, "ZUMokuto/StopOfMK"};
+  for (const bool on : {true, false, true}) {
+    SCOPED_TRACE(on);
+    rig.mokuto->_setCheckExecutionTimes(on);
+    rig.robot->timeline()->clear();
+    log->clear();
+    rig.mokuto->say("Hello $a=1");
+    std::vector<std::string> events;
+    for (const auto& entry : rig.robot->timeline()->entries("ZUMemory", "raiseEvent")) {
+      const auto key = entry.arguments.to<std::vector<ko::AnyValue>>().at(0).to<std::string>();
+      if (key.rfind("ZUMokuto/", 0) == 0)
+        events.push_back(key);
+    }
+    EXPECT_EQ(events, on ? framed : std::vector<std::string>{kEnd});
+    EXPECT_EQ(log->containsPart("mokuto.times", ko::log::Info,
+                                "time between 'stop of TTS' and 'stop of MK': "),
+              on);
+  }
+}
+
 // ---- the module library -------------------------------------------------------------------
+
+TEST(ServiceLibrary, WithoutASpeechEngineTheModuleIsNotCreated) {
+  const auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
+  const auto memory = ZU::ZUModule::createModule<robotsim::ZUMemory>(broker, "ZUMemory");
+  void* library = ::dlopen(ZUMOKUTO_PLUGIN, RTLD_NOW);
+  ASSERT_NE(library, nullptr) << ::dlerror();
+  const auto create =
+      reinterpret_cast<ZU::ZUCreateModuleFunction>(::dlsym(library, ZU::kCreateModuleSymbol));
+  ASSERT_NE(create, nullptr);
+  try {
+    create(broker);
+    ADD_FAILURE() << "created";
+  } catch (const ZU::ZUError& e) {
+    EXPECT_EQ(e.moduleName(), "ZUMokuto");
+    EXPECT_EQ(e.methodName(), "Constructor");
+    EXPECT_EQ(e.description(), "Module ZUTextToSpeech not found");
+  }
+  const auto names = broker->session()->services();
+  EXPECT_EQ(std::count(names.begin(), names.end(), "ZUMokuto"), 0);
+  memory->exit();
+  ::dlclose(library);
+}
 
 TEST(ServiceLibrary, TheHostLoadsItAndItsEntryPointsAnswerZero) {
   zefoko::HostOptions options;

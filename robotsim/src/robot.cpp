@@ -10,29 +10,38 @@
 
 namespace robotsim {
 
+template <class Service, class... A>
+std::shared_ptr<Service> Robot::xStart(const std::string& name, A&&... args) {
+  std::shared_ptr<Service> service;
+  if (fFaults) {
+    service = ZU::ZUModule::createModule<WithFaults<Service>>(fBroker, name, fFaults,
+                                                              std::forward<A>(args)...);
+  } else {
+    service = ZU::ZUModule::createModule<Service>(fBroker, name, std::forward<A>(args)...);
+  }
+  fServices.push_back(service);
+  return service;
+}
+
 Robot::Robot(RobotOptions options, std::shared_ptr<ZU::ZUBroker> broker)
     : fBroker(broker ? std::move(broker) : ZU::ZUBroker::create(std::make_shared<ko::Session>())),
+      fFaults(std::move(options.faults)),
       fTimeline(std::make_shared<Timeline>()) {
-  using ZU::ZUModule;
   try {
     ZUMemoryOptions memory;
     memory.timeline = fTimeline;
-    fServices.push_back(ZUModule::createModule<ZUMemory>(fBroker, "ZUMemory", memory));
-    fServices.push_back(ZUModule::createModule<ZUMotion>(fBroker, "ZUMotion", fTimeline));
-    fServices.push_back(ZUModule::createModule<ZUBehaviorManager>(
-        fBroker, "ZUBehaviorManager", fTimeline, options.behaviorsRoot));
-    fServices.push_back(ZUModule::createModule<ZUAudioPlayer>(fBroker, "ZUAudioPlayer", fTimeline,
-                                                              options.soundsRoot));
-    fServices.push_back(
-        ZUModule::createModule<ZURobotPosture>(fBroker, "ZURobotPosture", fTimeline));
-    fServices.push_back(
-        ZUModule::createModule<ZURobotModel>(fBroker, "ZURobotModel", options.robotType));
-    fServices.push_back(
-        ZUModule::createModule<ZUAutonomousMoves>(fBroker, "ZUAutonomousMoves", fTimeline));
+    xStart<ZUMemory>("ZUMemory", memory);
+    xStart<ZUMotion>("ZUMotion", fTimeline);
+    xStart<ZUBehaviorManager>("ZUBehaviorManager", fTimeline, options.behaviorsRoot, fFaults);
+    xStart<ZUAudioPlayer>("ZUAudioPlayer", fTimeline, options.soundsRoot);
+    xStart<ZURobotPosture>("ZURobotPosture", fTimeline);
+    xStart<ZURobotModel>("ZURobotModel", options.robotType);
+    xStart<ZUAutonomousMoves>("ZUAutonomousMoves", fTimeline);
     options.speech.timeline = fTimeline;
-    fSpeech = ZUModule::createModule<ZUTextToSpeech>(fBroker, "ZUTextToSpeech", options.speech);
-    fServices.push_back(fSpeech);
-    fServices.push_back(ZUModule::createModule<ZUTimelineService>(
+    options.speech.faults = fFaults;
+    fSpeech = xStart<ZUTextToSpeech>("ZUTextToSpeech", options.speech);
+    // The timeline is the simulation's own record, not a service of the robot: no faults.
+    fServices.push_back(ZU::ZUModule::createModule<ZUTimelineService>(
         fBroker, ZUTimelineService::kServiceName, fTimeline));
   } catch (...) {
     xShutdown();
@@ -46,6 +55,9 @@ Robot::~Robot() {
 }
 
 void Robot::xShutdown() noexcept {
+  // The calls that hang would hold the services' threads.
+  if (fFaults)
+    fFaults->lift();
   while (!fServices.empty()) {
     auto service = std::move(fServices.back());
     fServices.pop_back();

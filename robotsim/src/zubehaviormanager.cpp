@@ -10,6 +10,7 @@
 #include "ko/log.hpp"
 #include "ko/path.hpp"
 #include "ko/reaper.hpp"
+#include "robotsim/faults.h"
 #include "zu/zubroker.h"
 #include "zu/zuerror.h"
 #include "zu/zuserviceproxies.h"
@@ -42,10 +43,11 @@ std::string quoted(const std::string& behavior) {
 
 ZUBehaviorManager::ZUBehaviorManager(const std::shared_ptr<ZU::ZUBroker>& broker,
                                      const std::string& name, std::shared_ptr<Timeline> timeline,
-                                     std::string root)
+                                     std::string root, std::shared_ptr<FaultPlan> faults)
     : ZU::ZUModule(broker, name),
       fTimeline(std::move(timeline)),
-      fRoot(defaultRoot(std::move(root))) {
+      fRoot(defaultRoot(std::move(root))),
+      fFaults(std::move(faults)) {
   setModuleDescription("The simulated robot's behaviours: the animation library on disk.");
   setEventLoop(std::make_shared<ko::EventLoop>(name, kLoopThreads));
   advertiseSignal<std::string>("behaviorStopped");
@@ -493,7 +495,7 @@ void ZUBehaviorManager::xDeliver() {
       } else {
         xRecord("behaviorStopped", ko::AnyValue::list({delivery.behavior}),
                 delivery.interrupted ? "stopped" : "ended");
-        if (!delivery.superseded)
+        if (!delivery.superseded && !(fFaults && fFaults->hidesStop(delivery.behavior)))
           (*fBehaviorStopped)(delivery.behavior);
       }
     } catch (const std::exception& e) {

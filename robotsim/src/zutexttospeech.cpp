@@ -2,9 +2,12 @@
 
 #include <algorithm>
 #include <cmath>
+#include <optional>
+#include <thread>
 #include <utility>
 
 #include "ko/log.hpp"
+#include "robotsim/faults.h"
 #include "speechplayer.h"
 #include "speechrecording.h"
 #include "speechsynthesizer.h"
@@ -30,7 +33,8 @@ ko::AnyValue markResult(const SpeechMarkRecord& record) {
 
 }  // namespace
 
-// The player's listener: the events, the blocking calls and the timeline records.
+// The player's listener: the events, the blocking calls and the timeline records, with
+// the bookmark faults of the plan, if any. Its members run on the notifier thread only.
 class ZUTextToSpeech::Listener : public SpeechPlayerListener {
  public:
   explicit Listener(ZUTextToSpeech& tts) : fTts(tts) {}
@@ -42,35 +46,54 @@ class ZUTextToSpeech::Listener : public SpeechPlayerListener {
   }
 
   void onBookmark(const SpeechUtterance& /*u*/, std::int32_t number) override {
-    if (fTts.xNotificationsEnabled())
-      fTts.xRaise(kCurrentBookMarkEvent, ZU::ZUValue(number));
+    if (!fTts.xNotificationsEnabled())
+      return;
+    const BookmarkFate fate = xFate(number, false);
+    const std::optional<std::int32_t> held = std::exchange(fHeld, std::nullopt);
+    if (fate.reorder && !fate.drop) {
+      fHeld = number;
+    } else if (!fate.drop) {
+      for (int k = fate.duplicate ? 2 : 1; k > 0; --k)
+        fTts.xRaiseBookmark(number, fate.delay);
+    }
+    if (held)
+      fTts.xRaiseBookmark(*held, {});
   }
 
   ko::Future<void> onBlockingBookmark(const SpeechUtterance& u, std::int32_t number) override {
     const std::string& handler = fTts.fOptions.blockingBookmarkModule;
     fTts.xRecord("hold", ko::AnyValue::List{u.id, number});
-    ko::AnyObject object = fTts.findService(handler);
+    const BookmarkFate fate = xFate(number, true);
+    ko::AnyObject object = fate.drop ? nullptr : fTts.findService(handler);
     if (!object) {
-      KO_LOG_WARNING(kCategory) << "No module " << handler << " to hold text " << u.id
-                                << " at bookmark " << number;
+      if (!fate.drop) {
+        KO_LOG_WARNING(kCategory) << "No module " << handler << " to hold text " << u.id
+                                  << " at bookmark " << number;
+      }
+      xReleaseHeld();
       return ko::makeFutureValue();
     }
     // A call still queued when its text is stopped is withdrawn: it would hold whatever
     // text is spoken when it comes.
-    return fTts.fHoldLoop->async(
-        [object = std::move(object), handler, number, performance = u.performance, id = u.id] {
-          if (performance->isCancelled()) {
-            KO_LOG_VERBOSE(kCategory) << "Text " << id << " was stopped: no call of " << handler
-                                      << "._mrkpauseCallback(" << number << ")";
-            return;
-          }
-          try {
-            object->call<void>("_mrkpauseCallback", number);
-          } catch (const std::exception& e) {
-            KO_LOG_ERROR(kCategory)
-                << handler << "._mrkpauseCallback(" << number << ") failed: " << e.what();
-          }
-        });
+    auto held = fTts.fHoldLoop->async([object = std::move(object), handler, number, fate,
+                                       performance = u.performance, id = u.id] {
+      std::this_thread::sleep_for(fate.delay);
+      for (int k = fate.duplicate ? 2 : 1; k > 0; --k) {
+        if (performance->isCancelled()) {
+          KO_LOG_VERBOSE(kCategory) << "Text " << id << " was stopped: no call of " << handler
+                                    << "._mrkpauseCallback(" << number << ")";
+          return;
+        }
+        try {
+          object->call<void>("_mrkpauseCallback", number);
+        } catch (const std::exception& e) {
+          KO_LOG_ERROR(kCategory) << handler << "._mrkpauseCallback(" << number
+                                  << ") failed: " << e.what();
+        }
+      }
+    });
+    xReleaseHeld();
+    return held;
   }
 
   void onMarkDone(const SpeechUtterance& u, const SpeechMarkRecord& record) override {
@@ -80,6 +103,7 @@ class ZUTextToSpeech::Listener : public SpeechPlayerListener {
 
   void onEnded(const SpeechUtterance& u, bool stopped, std::int64_t playedUs,
                const std::string& error) override {
+    xReleaseHeld();
     if (!error.empty()) {
       KO_LOG_ERROR(kCategory) << "Text " << u.id << " could not be spoken: " << error;
     }
@@ -91,7 +115,18 @@ class ZUTextToSpeech::Listener : public SpeechPlayerListener {
   }
 
  private:
+  BookmarkFate xFate(std::int32_t number, bool blocking) const {
+    return fTts.fOptions.faults ? fTts.fOptions.faults->bookmarkFate(number, blocking)
+                                : BookmarkFate{};
+  }
+  // A bookmark held back by a reorder fault comes after the next mark.
+  void xReleaseHeld() {
+    if (const auto held = std::exchange(fHeld, std::nullopt); held && fTts.xNotificationsEnabled())
+      fTts.xRaiseBookmark(*held, {});
+  }
+
   ZUTextToSpeech& fTts;
+  std::optional<std::int32_t> fHeld;
 };
 
 ZUTextToSpeech::ZUTextToSpeech(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name,
@@ -390,6 +425,20 @@ void ZUTextToSpeech::xRecord(const std::string& operation, ko::AnyValue argument
                              ko::AnyValue result) {
   if (fOptions.timeline)
     fOptions.timeline->record(getName(), operation, std::move(arguments), std::move(result));
+}
+
+void ZUTextToSpeech::xRaiseBookmark(std::int32_t number,
+                                    std::chrono::steady_clock::duration delay) {
+  if (delay <= std::chrono::steady_clock::duration::zero()) {
+    xRaise(kCurrentBookMarkEvent, ZU::ZUValue(number));
+    return;
+  }
+  ko::getEventLoop()->postDelayed(
+      [weakSelf = weak_from_this(), number] {
+        if (const auto self = std::static_pointer_cast<ZUTextToSpeech>(weakSelf.lock()))
+          self->xRaise(kCurrentBookMarkEvent, ZU::ZUValue(number));
+      },
+      delay);
 }
 
 void ZUTextToSpeech::xRaise(const std::string& key, const ZU::ZUValue& value) {

@@ -175,6 +175,12 @@ TEST_F(MokutoCommand, AnswersEachCaseWithItsStatusAndMessage) {
       {fast + "-", 0, Stream::Out, "say 1 (9 characters): Hi\uFFFDthere ", "", "Hi\x01there\n"},
       {"mokuto say --speech timing --dry-run 'Hi ^runSound(bells/dingg) ^call(ZUMemory.nosuch())'",
        0, Stream::Out, "\"failure\": \"No sound \\\"dingg\\\" in the sound set \\\"bells\\\"\""},
+      // The robot's faults, logged where they strike; the text goes on.
+      {fast + "--faults 'ZUBehaviorManager.startBehavior:throw' "
+              "'Hi ^start(animations/Stand/Gestures/Hey_1) there'",
+       0, Stream::Err, "ZUBehaviorManager.startBehavior: fails (injected fault)"},
+      {"mokuto say --faults 'ZUMemory.raiseEvent:explode' Hi", 2, Stream::Err,
+       "--faults: fault \"ZUMemory.raiseEvent:explode\": "},
       // Instructions that did not parse, with their column; the status stays.
       {fast + "'Hello ^start(animations/Stand/Gestures/Hey_1 my friend'", 0, Stream::Err,
        "column 7: \"^start(\" has no closing parenthesis"},
@@ -219,6 +225,8 @@ TEST_F(MokutoCommand, AnswersEachCaseWithItsStatusAndMessage) {
        "--speech belongs to the robot's process with --connect"},
       {"mokuto --connect ipc:///nonexistent say --wav x.wav Hi", 2, Stream::Err,
        "--wav needs the robot in this process"},
+      {"mokuto --connect ipc:///nonexistent say --faults 'ZUMemory.raiseEvent:hang' Hi", 2,
+       Stream::Err, "--faults needs the robot in this process"},
       {"mokuto --connect ipc:///nonexistent say --dry-run Hi", 2, Stream::Err,
        "--dry-run needs the service in this process"},
       {"mokuto --connect ipc:///nonexistent diagnosis --posture Sitting", 2, Stream::Err,

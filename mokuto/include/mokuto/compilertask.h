@@ -47,7 +47,8 @@ class CompilerTask {
   // Fills the job from its annotated text; in contextual mode (the job's configuration)
   // adds the automatic tags and the pause before speech. A failing speech engine is
   // logged; the parse goes on, and a language without a database adds only the tags of
-  // the configuration's words and of the structures found without one.
+  // the configuration's words and of the structures found without one. The job's mutex
+  // is held while the job changes, not while the speech engine is asked.
   void process(const std::shared_ptr<MKTaskInstruction>& job);
 
   // The emotion of a recognised word or phrase in the speech engine's language: 2 very

@@ -11,7 +11,9 @@
 // "mrkpause" call (xBookmarkReached with blocking set); the behaviour manager's
 // "behaviorStopped" signal on its delivery thread; `stop` on any thread, the module calling
 // it with its text register's mutex held, so `stop` never waits for that mutex nor for the
-// text to end.
+// text to end, nor for another service: it asks the speech engine and the audio player to
+// stop from the event loop, and none of the locks that it takes is ever held across a call
+// of another service (a stop of an animation waits at most 200 ms for it).
 //
 // Locks, in the order they may be taken: the text register's mutex (the module's, around
 // `stop`); `animationsMutex`; the job's `mutex`; the speech lock (`ttsMutex`, shared by the
@@ -36,6 +38,7 @@
 #include "ko/signal.hpp"
 #include "mokuto/mktaskaction.h"
 #include "mokuto/mktaskinstruction.h"
+#include "mokuto/mokutoclock.h"
 
 namespace ZU {
 
@@ -84,11 +87,12 @@ class DirectorObserver {
 
 class DirectorTask {
  public:
-  // `bodyTalk` and `mkidRegister` belong to the module and outlive the director. Raises
-  // ZUError (ZUMokuto::Constructor) "Module ZUTextToSpeech not found" without a speech
-  // engine; the other services are reported and their calls fail (logged) later.
+  // `bodyTalk` and `mkidRegister` belong to the module and outlive the director; `clock`
+  // waits out the director's limits (null: real time). Raises ZUError
+  // (ZUMokuto::Constructor) "Module ZUTextToSpeech not found" without a speech engine; the
+  // other services are reported and their calls fail (logged) later.
   DirectorTask(const std::shared_ptr<ZUBroker>& broker, ZURobotBodyTalk* bodyTalk,
-               MKIDRegister& mkidRegister);
+               MKIDRegister& mkidRegister, std::shared_ptr<MokutoClock> clock = nullptr);
   ~DirectorTask();
   DirectorTask(const DirectorTask&) = delete;
   DirectorTask& operator=(const DirectorTask&) = delete;
@@ -164,16 +168,19 @@ class DirectorTask {
   bool xRemoveRunningAnimation(AnimationLock& lock, const std::string& path);
   void xPostStopBehavior(const std::string& path);
   void xSetMode(Text& text, BodyLanguageMode mode);
-  void xDisableArmsBreathing();
+  void xDisableArmsBreathing(Text& text);
   bool xArmsBreathingEnabled();
   void xPlayASound(const MKSoundAction& action);
   void xStopASound(const MKSoundAction& action);
   void xWaitASound(const MKSoundAction& action);
   void xStopAllSounds();
+  // Empties the table of sounds; answers their play identifiers.
+  std::vector<int> xTakeRunningSounds();
   void xNotifyAutonomousMoves(const std::string& tag);
 
   MKIDRegister& mkidRegister;
   ZURobotBodyTalk* const bodyTalk;
+  const std::shared_ptr<MokutoClock> fClock;
   const std::shared_ptr<ko::Session> fSession;
 
   std::shared_ptr<ZUTextToSpeechProxy> tts;
@@ -206,6 +213,8 @@ class DirectorTask {
   std::mutex soundsMutex;
   std::vector<RunningSound> runningSounds;  // in start order, under soundsMutex
 
+  // Held across the motion service's calls that turn arm breathing off and back on (never
+  // taken by a stop), so that they come in the order of their decisions.
   std::mutex fBreathMutex;
   bool armsBreathingDisabled = false;  // under fBreathMutex
 };

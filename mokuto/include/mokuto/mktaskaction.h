@@ -14,7 +14,9 @@
 #include <string>
 #include <string_view>
 #include <utility>
+#include <vector>
 
+#include "ko/anyvalue.hpp"
 #include "zu/enums.h"
 
 namespace ZU {
@@ -139,6 +141,10 @@ class MKCallAction : public MKTaskAction {
   std::string method;
   // The argument list as a JSON array text: "[\"hello\", 2]", possibly "[]".
   std::string arguments;
+
+  // The arguments decoded from their text, as the call hands them to the service. Raises
+  // ZUError (module, method) when the text is no JSON array.
+  std::vector<ko::AnyValue> argumentList() const;
 };
 
 class MKModeAction : public MKTaskAction {

@@ -4,8 +4,9 @@
 //
 // A job is created by the say pipeline in the caller's thread and shared by the stages
 // that work on it in turn. The compiler stage fills it and the loader prepares its
-// actions, each with `mutex` held by the pipeline (the diagnosis prints the jobs of the
-// registered texts under it); the director and its bookmark callbacks, which run in the
+// actions, each holding `mutex` while it changes what the job prints (the diagnosis prints
+// the jobs of the registered texts under it), never across a call of another service; the
+// director and its bookmark callbacks, which run in the
 // framework's threads, guard `currentAction` and the actions' progress with `mutex`.
 // addAction itself takes no lock.
 

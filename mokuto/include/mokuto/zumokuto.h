@@ -34,6 +34,7 @@
 #include "mokuto/directortask.h"
 #include "mokuto/mkidregister.h"
 #include "mokuto/mktaskinstruction.h"
+#include "mokuto/mokutoclock.h"
 #include "mokuto/mokutoconfig.h"
 #include "robotbodytalk/zurobotbodytalk.h"
 #include "zu/zumodule.h"
@@ -53,6 +54,8 @@ struct ZUMokutoOptions {
   ZURobotBodyTalkOptions bodyTalk;
   // How long a blocking _stopAll waits for a text to be freed before it gives up.
   std::chrono::microseconds stopAllWait{3'000'000};
+  // Waits out the service's time limits, _stopAll's included (null: real time).
+  std::shared_ptr<MokutoClock> clock;
   // Called in the say caller's thread as a text enters a stage, under that stage's lock
   // once its stop check has passed, for hosts that trace the pipeline. What it throws
   // fails the text as the stage's own error would.
@@ -65,6 +68,8 @@ class ZUMokuto : public ZUModule {
   static constexpr const char* kEndEvent = "ZUMokuto/EndOfMokuto";
   static constexpr const char* kEmotionEvent = "AsrEmotion";
 
+  // Raises ZUError (ZUMokuto::Constructor) "Module ZUTextToSpeech not found" when the
+  // broker finds no speech engine: such a module cannot be built.
   ZUMokuto(const std::shared_ptr<ZUBroker>& broker, const std::string& name,
            ZUMokutoOptions options = {});
   ~ZUMokuto() override;

@@ -53,16 +53,6 @@ void writeGesture(const fs::path& root, const Gesture& gesture) {
       << "], \"keys\": [[0.2, [3, " << -gesture.seconds / 3 << ", 0.0], [3, 0.0, 0.0]]]}}}";
 }
 
-fs::path makeLibrary() {
-  static std::atomic<int> serial{0};
-  const fs::path root =
-      fs::temp_directory_path() /
-      ("mokuto-director-" + std::to_string(::getpid()) + "-" + std::to_string(serial.fetch_add(1)));
-  for (const auto& gesture : kGestures)
-    writeGesture(root, gesture);
-  return root;
-}
-
 std::string firstArgument(const robotsim::TimelineEntry& entry) {
   try {
     const auto list = entry.arguments.to<std::vector<ko::AnyValue>>();
@@ -74,6 +64,16 @@ std::string firstArgument(const robotsim::TimelineEntry& entry) {
 
 }  // namespace
 
+fs::path makeGestureLibrary() {
+  static std::atomic<int> serial{0};
+  const fs::path root =
+      fs::temp_directory_path() /
+      ("mokuto-director-" + std::to_string(::getpid()) + "-" + std::to_string(serial.fetch_add(1)));
+  for (const auto& gesture : kGestures)
+    writeGesture(root, gesture);
+  return root;
+}
+
 // Wakes the waiters at each timeline entry; lives as long as the timeline.
 struct DirectorRig::Waiter {
   std::mutex mutex;
@@ -81,7 +81,7 @@ struct DirectorRig::Waiter {
 };
 
 DirectorRig::DirectorRig(Speech kind)
-    : fLibrary(makeLibrary()), fWaiter(std::make_shared<Waiter>()) {
+    : fLibrary(makeGestureLibrary()), fWaiter(std::make_shared<Waiter>()) {
   using ZU::ZUModule;
   if (kind == Speech::Espeak) {
     robotsim::RobotOptions options;

@@ -39,6 +39,10 @@ inline constexpr const char* kLongB = "animations/Stand/Gestures/Long_2";   // 3
 inline constexpr const char* kLongC = "animations/Stand/Gestures/Long_3";   // 30 s
 inline constexpr const char* kEnd = "animations/Stand/Gestures/End_1";      // 0.2 s
 
+// Writes the gestures above, each on joints of its own, into a new temporary folder, and
+// answers it.
+std::filesystem::path makeGestureLibrary();
+
 class DirectorRig {
  public:
   enum class Speech { Scripted, Espeak };

@@ -13,6 +13,7 @@
 #include <string>
 #include <vector>
 
+#include "robotsim/faults.h"
 #include "robotsim/timeline.h"
 #include "robotsim/zutexttospeech.h"
 #include "zu/zubroker.h"
@@ -27,6 +28,9 @@ struct RobotOptions {
   std::string behaviorsRoot;
   std::string soundsRoot;
   int robotType = 1;
+  // Faults that strike the services' calls, the speech engine's bookmarks and the
+  // behaviour manager's stops (null: none). The robot lifts them when it shuts down.
+  std::shared_ptr<FaultPlan> faults;
 };
 
 class Robot {
@@ -42,11 +46,17 @@ class Robot {
   const std::shared_ptr<ZU::ZUBroker>& broker() const noexcept { return fBroker; }
   const std::shared_ptr<Timeline>& timeline() const noexcept { return fTimeline; }
   const std::shared_ptr<ZUTextToSpeech>& speech() const noexcept { return fSpeech; }
+  // The plan of the options; null when there is none.
+  const std::shared_ptr<FaultPlan>& faults() const noexcept { return fFaults; }
 
  private:
   void xShutdown() noexcept;
+  // Starts a service, behind the faults when there are some.
+  template <class Service, class... A>
+  std::shared_ptr<Service> xStart(const std::string& name, A&&... args);
 
   std::shared_ptr<ZU::ZUBroker> fBroker;
+  std::shared_ptr<FaultPlan> fFaults;
   std::shared_ptr<Timeline> fTimeline;
   std::shared_ptr<ZUTextToSpeech> fSpeech;
   std::vector<std::shared_ptr<ZU::ZUModuleCore>> fServices;  // in start order

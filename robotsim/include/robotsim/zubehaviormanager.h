@@ -42,12 +42,16 @@
 
 namespace robotsim {
 
+class FaultPlan;
+
 class ZUBehaviorManager : public ZU::ZUModule {
  public:
   // `root`: the library folder; empty for the data folder "zefoko/behaviors". `timeline` may
-  // be null. The library is scanned here.
+  // be null. The library is scanned here. A stop that `faults` hides is recorded on the
+  // timeline but never signalled.
   ZUBehaviorManager(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name,
-                    std::shared_ptr<Timeline> timeline = nullptr, std::string root = "");
+                    std::shared_ptr<Timeline> timeline = nullptr, std::string root = "",
+                    std::shared_ptr<FaultPlan> faults = nullptr);
   ~ZUBehaviorManager() override;
 
   // See above.
@@ -122,6 +126,7 @@ class ZUBehaviorManager : public ZU::ZUModule {
 
   const std::shared_ptr<Timeline> fTimeline;
   const std::filesystem::path fRoot;
+  const std::shared_ptr<FaultPlan> fFaults;
   ko::Signal<std::string>* fBehaviorStopped = nullptr;
 
   std::mutex fMotionMutex;  // the motion handle and its signal link

@@ -12,10 +12,11 @@
 // were posted, on the module's own one-thread event loop and wait there until their text
 // ends. Texts are played one at a time by the player thread; a notifier thread raises the
 // events and starts the blocking calls, each on a thread of the module's hold loop, so
-// that stopping a text never waits for the handler. espeak-ng runs on the one thread of
-// the process that owns it; a Japanese text is read into kana in its say's thread. The
-// settings and the table of texts in progress are guarded by one mutex. The module's
-// threads find services through the session, never holding the broker.
+// that stopping a text never waits for the handler (a bookmark that a fault delays is
+// raised from the process's event loop). espeak-ng runs on the one thread of the process
+// that owns it; a Japanese text is read into kana in its say's thread. The settings and the
+// table of texts in progress are guarded by one mutex. The module's threads find services
+// through the session, never holding the broker.
 //
 // Stopping, from any thread (a blocking-bookmark handler included):
 // - stop(id) stops the text of the posted say `id` whatever its state: queued, being
@@ -30,6 +31,7 @@
 // joins the threads the same way; like exit(), it may run on any thread but the module's
 // own (the framework sees to it, see ko/reaper.hpp).
 
+#include <chrono>
 #include <cstdint>
 #include <filesystem>
 #include <limits>
@@ -46,6 +48,7 @@
 
 namespace robotsim {
 
+class FaultPlan;
 class SpeechPlayer;
 class SpeechRecording;
 class SpeechSynthesizer;
@@ -71,6 +74,8 @@ struct ZUTextToSpeechOptions {
   // Whether the audio is kept for saveRecording.
   bool recordAudio = true;
   std::shared_ptr<Timeline> timeline;
+  // The bookmark faults of this plan strike the events and blocking calls (null: none).
+  std::shared_ptr<FaultPlan> faults;
 };
 
 class ZUTextToSpeech : public ZU::ZUModule {
@@ -131,6 +136,8 @@ class ZUTextToSpeech : public ZU::ZUModule {
   void xBindMethods();
   void xRecord(const std::string& operation, ko::AnyValue arguments, ko::AnyValue result = {});
   void xRaise(const std::string& key, const ZU::ZUValue& value);
+  // The bookmark event, raised now or, from another thread, `delay` later.
+  void xRaiseBookmark(std::int32_t number, std::chrono::steady_clock::duration delay);
   bool xNotificationsEnabled() const;
   void xStopText(int id);
   void xStopThreads();

@@ -1,0 +1,45 @@
+#pragma once
+// DrivenClock: the service's clock in its tests. It waits each of the service's waits
+// `scale` times as long as the robot would, and keeps its own time, which moves only when
+// a limit of the service runs out, and then by that whole limit (as the robot would have
+// waited it). So a test reads how long the service waited on its limits from this clock,
+// whatever the load of the machine: a loaded machine makes the real waits longer, never
+// this time.
+//
+// Any thread may wait on it; the time is an atomic.
+
+#include <atomic>
+#include <chrono>
+#include <condition_variable>
+#include <cstdint>
+#include <mutex>
+
+#include "mokuto/mokutoclock.h"
+
+namespace mokutotest {
+
+class DrivenClock : public ZU::MokutoClock {
+ public:
+  explicit DrivenClock(double scale) : fScale(scale) {}
+
+  std::cv_status waitFor(std::condition_variable& condition, std::unique_lock<std::mutex>& lock,
+                         std::chrono::microseconds duration, Wait wait) override {
+    const auto real = std::chrono::duration_cast<std::chrono::microseconds>(duration * fScale);
+    const std::cv_status status = condition.wait_for(lock, real);
+    if (status == std::cv_status::timeout && wait == Wait::Limit)
+      fNowUs.fetch_add(duration.count());
+    return status;
+  }
+
+  // The limits that ran out so far, in the robot's time.
+  std::chrono::milliseconds now() const {
+    return std::chrono::duration_cast<std::chrono::milliseconds>(
+        std::chrono::microseconds(fNowUs.load()));
+  }
+
+ private:
+  const double fScale;
+  std::atomic<std::int64_t> fNowUs{0};
+};
+
+}  // namespace mokutotest

@@ -1,0 +1,117 @@
+#include "service_rig.h"
+
+#include <condition_variable>
+#include <utility>
+
+#include "director_rig.h"
+#include "ko/reaper.hpp"
+#include "scripted_speech.h"
+#include "zu/zuserviceproxies.h"
+
+namespace mokutotest {
+
+namespace {
+
+// The key and the integer value of a ZUMemory.raiseEvent entry.
+std::pair<std::string, ko::AnyValue> raised(const robotsim::TimelineEntry& entry) {
+  try {
+    const auto arguments = entry.arguments.to<std::vector<ko::AnyValue>>();
+    return {arguments.at(0).to<std::string>(), arguments.at(1)};
+  } catch (const std::exception&) {
+    return {};
+  }
+}
+
+}  // namespace
+
+// Wakes the waiters at each timeline entry; lives as long as the timeline.
+struct ServiceRig::Waiter {
+  std::mutex mutex;
+  std::condition_variable recorded;
+};
+
+ServiceRig::ServiceRig(double scale)
+    : clock(std::make_shared<DrivenClock>(scale)),
+      faults(std::make_shared<robotsim::FaultPlan>(std::vector<robotsim::Fault>{}, scale)),
+      fLibrary(makeGestureLibrary()),
+      fWaiter(std::make_shared<Waiter>()) {
+  robotsim::RobotOptions options;
+  options.speech.backend = robotsim::ZUTextToSpeechOptions::Backend::Timing;
+  options.speech.playbackRate = robotsim::kSpeechAsFastAsPossible;
+  options.speech.recordAudio = false;
+  options.behaviorsRoot = fLibrary.string();
+  options.faults = faults;
+  robot = std::make_unique<robotsim::Robot>(options);
+  robot->timeline()->addListener([waiter = fWaiter](const robotsim::TimelineEntry&) {
+    std::lock_guard lock(waiter->mutex);
+    waiter->recorded.notify_all();
+  });
+  ZU::ZUAudioPlayerProxy(robot->broker()).loadSoundSet("bells");
+
+  ZU::ZUMokutoOptions moduleOptions;
+  moduleOptions.clock = clock;
+  moduleOptions.bodyTalk.timeScale = 0.01;
+  moduleOptions.onStage = [hook = fHook](ZU::ZUMokutoStage stage, ZU::MKID id) {
+    std::function<void(ZU::ZUMokutoStage, ZU::MKID)> call;
+    {
+      std::lock_guard lock(hook->mutex);
+      call = hook->call;
+    }
+    if (call)
+      call(stage, id);
+  };
+  mokuto = ZU::ZUModule::createModule<ZU::ZUMokuto>(robot->broker(), ZU::ZUMokuto::kModuleName,
+                                                    std::move(moduleOptions));
+  mokuto->setBodyLanguageModeFromStr("disabled");
+  mokuto->waitForIndex(kBound);
+}
+
+ServiceRig::~ServiceRig() {
+  faults->lift();
+  mokuto->exit();
+  mokuto.reset();
+  robot.reset();
+  ko::waitForReaper();
+  std::error_code ec;
+  std::filesystem::remove_all(fLibrary, ec);
+}
+
+std::future<void> ServiceRig::sayAsync(const std::string& text, const ZU::ZUValue& configuration) {
+  return std::async(std::launch::async, [module = mokuto, text, configuration] {
+    if (configuration.isValid())
+      module->say(text, configuration);
+    else
+      module->say(text);
+  });
+}
+
+std::size_t ServiceRig::endEvents(ZU::MKID id) const {
+  std::size_t n = 0;
+  for (const auto& entry : robot->timeline()->entries("ZUMemory", "raiseEvent")) {
+    const auto [key, value] = raised(entry);
+    if (key == ZU::ZUMokuto::kEndEvent && value.to<int>() == id)
+      ++n;
+  }
+  return n;
+}
+
+std::size_t ServiceRig::events(const std::string& key) const {
+  std::size_t n = 0;
+  for (const auto& entry : robot->timeline()->entries("ZUMemory", "raiseEvent"))
+    n += raised(entry).first == key ? 1U : 0U;
+  return n;
+}
+
+bool ServiceRig::waitForTimeline(const std::string& service, const std::string& operation,
+                                 std::size_t count) const {
+  std::unique_lock lock(fWaiter->mutex);
+  return fWaiter->recorded.wait_for(
+      lock, kBound, [&] { return robot->timeline()->entries(service, operation).size() >= count; });
+}
+
+void ServiceRig::setStageHook(std::function<void(ZU::ZUMokutoStage, ZU::MKID)> hook) {
+  std::lock_guard lock(fHook->mutex);
+  fHook->call = std::move(hook);
+}
+
+}  // namespace mokutotest
