@@ -17,11 +17,14 @@ Robot::Robot(RobotOptions options, std::shared_ptr<ZU::ZUBroker> broker)
     ZUMemoryOptions memory;
     memory.timeline = fTimeline;
     fServices.push_back(ZUModule::createModule<ZUMemory>(fBroker, "ZUMemory", memory));
-    fServices.push_back(ZUModule::createModule<ZUMotion>(fBroker, "ZUMotion", fTimeline));
+    fMotion = ZUModule::createModule<ZUMotion>(fBroker, "ZUMotion", fTimeline);
+    fMotion->sampleAngles(options.angleSamplesPerSecond);
+    fServices.push_back(fMotion);
     fServices.push_back(ZUModule::createModule<ZUBehaviorManager>(
         fBroker, "ZUBehaviorManager", fTimeline, options.behaviorsRoot));
-    fServices.push_back(ZUModule::createModule<ZUAudioPlayer>(fBroker, "ZUAudioPlayer", fTimeline,
-                                                              options.soundsRoot));
+    fAudioPlayer = ZUModule::createModule<ZUAudioPlayer>(fBroker, "ZUAudioPlayer", fTimeline,
+                                                         options.soundsRoot);
+    fServices.push_back(fAudioPlayer);
     fServices.push_back(
         ZUModule::createModule<ZURobotPosture>(fBroker, "ZURobotPosture", fTimeline));
     fServices.push_back(
@@ -54,6 +57,8 @@ void Robot::xShutdown() noexcept {
     }
   }
   fSpeech.reset();
+  fMotion.reset();
+  fAudioPlayer.reset();
 }
 
 }  // namespace robotsim

@@ -13,6 +13,8 @@
 #include <vector>
 
 #include "robotsim/timeline.h"
+#include "robotsim/zuaudioplayer.h"
+#include "robotsim/zumotion.h"
 #include "robotsim/zutexttospeech.h"
 #include "zu/zubroker.h"
 #include "zu/zumodule.h"
@@ -26,6 +28,9 @@ struct RobotOptions {
   std::string behaviorsRoot;
   std::string soundsRoot;
   int robotType = 1;
+  // How often the motion service records the angles of the joints that move on the
+  // timeline (ZUMotion::sampleAngles); 0 for never.
+  double angleSamplesPerSecond = 0;
 };
 
 class Robot {
@@ -41,6 +46,8 @@ class Robot {
   const std::shared_ptr<ZU::ZUBroker>& broker() const noexcept { return fBroker; }
   const std::shared_ptr<Timeline>& timeline() const noexcept { return fTimeline; }
   const std::shared_ptr<ZUTextToSpeech>& speech() const noexcept { return fSpeech; }
+  const std::shared_ptr<ZUMotion>& motion() const noexcept { return fMotion; }
+  const std::shared_ptr<ZUAudioPlayer>& audioPlayer() const noexcept { return fAudioPlayer; }
 
  private:
   void xShutdown() noexcept;
@@ -48,6 +55,8 @@ class Robot {
   std::shared_ptr<ZU::ZUBroker> fBroker;
   std::shared_ptr<Timeline> fTimeline;
   std::shared_ptr<ZUTextToSpeech> fSpeech;
+  std::shared_ptr<ZUMotion> fMotion;
+  std::shared_ptr<ZUAudioPlayer> fAudioPlayer;
   std::vector<std::shared_ptr<ZU::ZUModuleCore>> fServices;  // in start order
 };
 
