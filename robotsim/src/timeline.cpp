@@ -29,6 +29,11 @@ std::int64_t Timeline::now() const {
       .count();
 }
 
+std::int64_t Timeline::usAt(std::chrono::steady_clock::time_point moment) const {
+  std::lock_guard lock(mutex_);
+  return std::chrono::duration_cast<std::chrono::microseconds>(moment - start_).count();
+}
+
 void Timeline::record(std::string service, std::string operation, ko::AnyValue arguments,
                       ko::AnyValue result) {
   TimelineEntry entry;

@@ -35,6 +35,8 @@ class Timeline {
               ko::AnyValue result = {});
   // Microseconds since the timeline began (or was last cleared).
   std::int64_t now() const;
+  // The same of a moment of the steady clock (negative before the timeline began).
+  std::int64_t usAt(std::chrono::steady_clock::time_point moment) const;
 
   std::vector<TimelineEntry> entries() const;
   // The entries of one service and operation, in order.
