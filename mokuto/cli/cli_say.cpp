@@ -13,6 +13,7 @@
 #include <iterator>
 #include <memory>
 #include <optional>
+#include <sstream>
 #include <string>
 #include <thread>
 #include <tuple>
@@ -21,6 +22,7 @@
 
 #include "cli_commands.h"
 #include "cli_json.h"
+#include "cli_sayperformance.h"
 #include "cli_saytimeline.h"
 #include "cli_service.h"
 #include "ko/json.hpp"
@@ -104,6 +106,7 @@ struct SayOptions {
   std::vector<std::string> packages;
   bool checkTimes = false;
   std::string wav;
+  std::string html;
   std::string timeline;
   bool dryRun = false;
   bool quiet = false;
@@ -200,12 +203,15 @@ int say(SayOptions& o) {
       return usage(parsed.error);
     *target = std::move(parsed.value);
   }
-  for (const auto& [option, path] : {std::pair{"--wav", &o.wav}, {"--timeline", &o.timeline}}) {
+  for (const auto& [option, path] :
+       {std::pair{"--wav", &o.wav}, {"--html", &o.html}, {"--timeline", &o.timeline}}) {
     if (const std::string error = checkOutputPath(option, *path); !error.empty())
       return usage(error);
   }
   if (o.dryRun && !o.wav.empty())
     return usage("--wav has no audio to write with --dry-run");
+  if (o.dryRun && !o.html.empty())
+    return usage("--html has no performance to draw with --dry-run");
   std::ofstream timelineFile;
   if (!o.timeline.empty()) {
     timelineFile.open(o.timeline);
@@ -224,7 +230,9 @@ int say(SayOptions& o) {
     serviceOptions.fast = o.fast;
     serviceOptions.language = o.language;
     serviceOptions.posture = o.posture;
-    serviceOptions.recordAudio = !o.wav.empty();
+    serviceOptions.recordAudio = !o.wav.empty() || !o.html.empty();
+    if (!o.html.empty() || !o.timeline.empty())
+      serviceOptions.angleSamplesPerSecond = kAngleSamplesPerSecond;
     // Blocked before the robot's threads start, so that they all inherit the mask and the
     // watcher below alone takes the signals.
     const InterruptMask interruptMask;
@@ -259,11 +267,17 @@ int say(SayOptions& o) {
     } else {
       const auto recorder = SayTimeline::create(robot.timeline(), o.quiet ? nullptr : &std::cout);
       service.setDirectorObserver(recorder);
-      embedded.setStageObserver([recorder](ZU::ZUMokutoStage stage, ZU::MKID id) {
-        if (stage == ZU::ZUMokutoStage::Compiler)
-          recorder->accepted(id);
+      const bool drawn = serviceOptions.angleSamplesPerSecond > 0;
+      embedded.setStageObserver([recorder, drawn, &robot](ZU::ZUMokutoStage stage, ZU::MKID id) {
+        if (stage != ZU::ZUMokutoStage::Compiler)
+          return;
+        recorder->accepted(id);
+        // The pose the performance starts from; the samples tell the joints that move.
+        if (drawn)
+          robot.motion()->recordPose();
       });
       robot.timeline()->clear();
+      const std::int64_t originUs = robot.timeline()->now();
       recorder->begin(*o.text);
       bool interrupted = false;
       {
@@ -280,11 +294,12 @@ int say(SayOptions& o) {
       const SaySummary summary = recorder->end(&id);
       embedded.setStageObserver(nullptr);
       service.setDirectorObserver(nullptr);
+      const std::int64_t endUs = robot.timeline()->now();
       SayTimeline::printSummary(std::cout, id, summary);
-      if (!o.wav.empty()) {
-        robot.speech()->saveRecording(o.wav);
-        std::cout << "Audio written to " << o.wav << std::endl;
-      }
+      std::ostringstream summaryText;
+      SayTimeline::printSummary(summaryText, id, summary);
+      writePerformanceFiles({o.wav, o.html}, robot, *recorder, *o.text, summaryText.str(),
+                            originUs, endUs, std::cout);
       if (timelineFile.is_open()) {
         recorder->writeJsonLines(timelineFile);
         std::cout << "Timeline written to " << o.timeline << std::endl;
@@ -355,7 +370,15 @@ void addSayCommand(CLI::App& app, int& status) {
   command->add_flag("--check-times", o->checkTimes,
                     "Switch the timing checker on (ZUMokuto/StartOfMK and StopOfMK, and the "
                     "durations in the log category mokuto.times)");
-  command->add_option("--wav", o->wav, "Write the audio of the whole performance to this WAV file")
+  command
+      ->add_option("--wav", o->wav,
+                   "Write the audio of the whole performance to this WAV file: the speech and "
+                   "every sound, mixed at the times they played")
+      ->type_name("FILE");
+  command
+      ->add_option("--html", o->html,
+                   "Write the viewer of the performance to this HTML file: one page, audio "
+                   "included, that draws the timeline and the robot and plays them")
       ->type_name("FILE");
   command
       ->add_option("--timeline", o->timeline, "Write the whole timeline to this file as JSON lines")

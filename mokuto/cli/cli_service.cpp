@@ -23,6 +23,7 @@ EmbeddedService::EmbeddedService(const EmbeddedServiceOptions& options) {
   zefoko::HostOptions host;
   host.robot.speech.language = options.language;
   host.robot.speech.recordAudio = options.recordAudio;
+  host.robot.angleSamplesPerSecond = options.angleSamplesPerSecond;
   if (options.speech == "timing")
     host.robot.speech.backend = robotsim::ZUTextToSpeechOptions::Backend::Timing;
   if (options.fast)

@@ -27,6 +27,8 @@ struct EmbeddedServiceOptions {
   std::string posture;
   // Whether the speech engine keeps the audio for a WAV file.
   bool recordAudio = false;
+  // How often the joint angles go on the timeline while they move; 0 for never.
+  double angleSamplesPerSecond = 0;
 };
 
 // The robot or the module cannot start, or the index is not built in time.
