@@ -9,7 +9,8 @@ namespace zefoko {
 void addSpeakCommand(CLI::App& app, int& status);
 // zefoko bodytalk [--seconds N] [--posture Standing|Sitting|SittingOnChair] [--json]
 void addBodyTalkCommand(CLI::App& app, int& status);
-// zefoko serve [--speech espeak|timing] [--posture P] MODULE.so...
+// zefoko serve [--speech espeak|timing] [--posture P] [--http ADDRESS:PORT [--http-token T]]
+//              MODULE.so...
 void addServeCommand(CLI::App& app, int& status);
 
 }  // namespace zefoko

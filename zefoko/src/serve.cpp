@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "commands.h"
+#include "httpserver.h"
 #include "zefoko/host.h"
 #include "zu/zuerror.h"
 
@@ -17,6 +18,7 @@ struct ServeOptions {
   std::string speech = "espeak";
   std::string posture;
   std::vector<std::string> libraries;
+  HttpCommandOptions http;
 };
 
 int serve(const ServeOptions& o) {
@@ -42,11 +44,13 @@ int serve(const ServeOptions& o) {
         std::cout << ' ' << name;
       std::cout << std::endl;
     }
+    auto http = startHttpServer(host, o.http, std::cout);
     std::cout << "zefoko serve: serving; stop with Ctrl-C (SIGINT) or SIGTERM" << std::endl;
     int received = 0;
     sigwait(&signals, &received);
     std::cout << "zefoko serve: " << (received == SIGINT ? "SIGINT" : "SIGTERM") << ", stopping"
               << std::endl;
+    http.reset();
     host.shutdown();
   } catch (const HostError& e) {
     std::cerr << "zefoko serve: " << e.what() << std::endl;
@@ -74,6 +78,7 @@ void addServeCommand(CLI::App& app, int& status) {
       ->check(CLI::IsMember({"espeak", "timing"}));
   command->add_option("--posture", options->posture, "The robot's posture family at start")
       ->check(CLI::IsMember({"Standing", "Sitting", "SittingOnChair"}));
+  addHttpOptions(*command, options->http);
   command->add_option("libraries", options->libraries, "The module libraries (.so) to load")
       ->required()
       ->check(CLI::ExistingFile);
