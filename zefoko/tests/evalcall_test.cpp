@@ -1,11 +1,13 @@
 // The calls that a module's page may ask for: one call with literal arguments, parsed
-// strictly; everything else refused with the reason and where.
+// strictly; everything else refused with the reason and where. And the addresses that the
+// pages are served at.
 #include <gtest/gtest.h>
 
 #include <string>
 #include <vector>
 
 #include "evalcall.h"
+#include "httpserver.h"
 #include "ko/json.hpp"
 
 namespace zefoko {
@@ -79,6 +81,35 @@ TEST(EvalCall, RefusesAnythingElseWithTheReason) {
     }
   }
   EXPECT_THROW(parseEvalCall("M.m('" + std::string(9000, 'a') + "')"), EvalSyntaxError);
+}
+
+TEST(HttpAddress, ReadsAddressAndPortAndTellsLoopback) {
+  struct Case {
+    std::string text;
+    std::string address;  // empty: refused
+    int port;
+    bool loopback;
+  };
+  const std::vector<Case> cases = {
+      {"127.0.0.1:8080", "127.0.0.1", 8080, true}, {"localhost:0", "localhost", 0, true},
+      {"[::1]:65535", "::1", 65535, true},         {"127.1.2.3:80", "127.1.2.3", 80, true},
+      {"0.0.0.0:8080", "0.0.0.0", 8080, false},    {"[::]:8080", "::", 8080, false},
+      {"192.168.1.2:1", "192.168.1.2", 1, false},  {"8080", "", 0, false},
+      {"127.0.0.1:", "", 0, false},                {":8080", "", 0, false},
+      {"127.0.0.1:65536", "", 0, false},           {"127.0.0.1:80a", "", 0, false},
+      {"[::1:80", "", 0, false},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.text);
+    if (c.address.empty()) {
+      EXPECT_THROW(parseHttpAddress(c.text), HttpError);
+      continue;
+    }
+    const HttpOptions options = parseHttpAddress(c.text);
+    EXPECT_EQ(options.address, c.address);
+    EXPECT_EQ(options.port, c.port);
+    EXPECT_EQ(isLoopbackAddress(options.address), c.loopback);
+  }
 }
 
 }  // namespace
