@@ -674,7 +674,9 @@
     };
     function frame(time) {
       const now = nowUs();
-      if (dirty || time - lastRender > 500) {
+      // The lanes are drawn again five times a second at most; the cursor and the figure
+      // follow every frame.
+      if ((dirty && time - lastRender > 200) || time - lastRender > 500) {
         const from = Math.max(0, now - LIVE_WINDOW_US);
         lanes.render(model, from, from + LIVE_WINDOW_US + 1e6, null, now);
         lastRender = time;
