@@ -86,15 +86,24 @@ async function launchChromium() {
     "--disable-background-networking", "--disable-component-update", "--disable-sync",
     "--mute-audio", "--user-data-dir=" + profile, "--remote-debugging-port=0",
     "--window-size=1400,1000", "about:blank",
-  ], { stdio: ["ignore", "ignore", "pipe"] });
+  ], { stdio: ["ignore", "ignore", "pipe"], detached: true });
   const match = await waitForOutput(child, "stderr", /DevTools listening on ws:\/\/[^:]+:(\d+)\//, "Chromium's DevTools port");
   return {
     port: Number(match[1]),
+    // Chromium and the processes it started (its own process group), then its profile.
     async close() {
       const exited = new Promise((resolve) => (child.exitCode !== null ? resolve() : child.on("exit", resolve)));
-      child.kill("SIGKILL");
+      try {
+        process.kill(-child.pid, "SIGKILL");
+      } catch (e) {
+        // already gone
+      }
       await bounded(exited, "the end of Chromium");
-      fs.rmSync(profile, { recursive: true, force: true, maxRetries: 3 });
+      try {
+        fs.rmSync(profile, { recursive: true, force: true, maxRetries: 5, retryDelay: 100 });
+      } catch (e) {
+        console.log("note: " + profile + " left behind: " + e.message);
+      }
     },
   };
 }
@@ -301,7 +310,8 @@ async function liveScenario(zefoko, module, artefacts) {
     await browser.close();
     server.kill("SIGTERM");
     await bounded(new Promise((resolve) => (server.exitCode !== null ? resolve() : server.on("exit", resolve))), "the end of zefoko serve");
-    check(server.exitCode === 0, "zefoko serve stops on SIGTERM", String(server.exitCode) + " " + serverErrors);
+    const stopped = server.exitCode === 0;
+    check(stopped, "zefoko serve stops on SIGTERM", stopped ? "" : server.exitCode + "\n" + serverErrors);
   }
 }
 
