@@ -307,8 +307,8 @@ async function liveScenario(zefoko, module, artefacts) {
     check(after === before, "the robot did nothing for the refused calls", before + " entries, then " + after);
     check(page.errors.length === 0 && live.errors.length === 0, "the pages log no console error", page.errors.concat(live.errors).join(" | "));
   } finally {
-    await browser.close();
     server.kill("SIGTERM");
+    await browser.close();
     await bounded(new Promise((resolve) => (server.exitCode !== null ? resolve() : server.on("exit", resolve))), "the end of zefoko serve");
     const stopped = server.exitCode === 0;
     check(stopped, "zefoko serve stops on SIGTERM", stopped ? "" : server.exitCode + "\n" + serverErrors);
