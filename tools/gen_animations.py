@@ -525,7 +525,11 @@ def sorry_low(g):
 
 # Tags of the gestures for what a word says, in the three languages of the linguistic
 # databases: each tag is a base form that the analysis gives for a word ("moi" for
-# "moi", "penser" for "pense"). The databases keep these base forms first.
+# "moi", "penser" for "pense"). The databases keep these base forms first. A word that
+# another language spells alike with another meaning is no tag: French "content" is
+# English "contents", "ensemble" a musical one, "minuscule" a lowercase letter, "super"
+# the superuser (French "non" stays: the English database gives the prefix "non-" no
+# base form).
 ME = ["me", "i", "myself", "je", "moi", "私", "僕"]
 YOU = ["you", "yourself", "tu", "toi", "vous", "あなた", "君"]
 YES = ["yes", "oui", "はい", "うん"]
@@ -561,7 +565,7 @@ GESTURES = [
      lambda g: thinking(g)),
     ("Big_1", ["big", "large", "huge", "enormous", "grand", "gros", "énorme", "immense", "大きい",
                "大きな", "巨大"], big_wide),
-    ("Small_1", ["small", "little", "tiny", "petit", "minuscule", "小さい", "小さな"], small_close),
+    ("Small_1", ["small", "little", "tiny", "petit", "小さい", "小さな"], small_close),
     ("All_1", ["all", "everything", "everyone", "everybody", "tout", "全部", "全て", "すべて", "皆さん",
                "みんな", "皆"], all_sweep),
     ("Many_1", ["many", "lot", "beaucoup", "nombreux", "たくさん", "沢山", "多い"], many_both),
@@ -575,13 +579,13 @@ GESTURES = [
     ("Far_1", ["far", "loin", "遠い"], far_point),
     ("Thanks_1", ["thank", "thanks", "merci", "remercier", "ありがとう", "感謝"], thanks_bow),
     ("Love_1", ["love", "adore", "aimer", "adorer", "好き", "愛", "大好き"], love_chest),
-    ("Happy_1", ["happy", "glad", "heureux", "content", "joie", "嬉しい", "楽しい", "幸せ"],
+    ("Happy_1", ["happy", "glad", "heureux", "joyeux", "joie", "嬉しい", "楽しい", "幸せ"],
      happy_up),
     ("Come_1", ["come", "venir", "来る"], beckon),
     ("Stop_1", ["stop", "wait", "arrêter", "attendre", "止める", "待つ", "ストップ"], stop_palm),
-    ("Great_1", ["great", "excellent", "wonderful", "amazing", "super", "génial", "bravo", "すごい",
+    ("Great_1", ["great", "excellent", "wonderful", "amazing", "génial", "bravo", "すごい",
                  "素晴らしい"], great_fists),
-    ("Together_1", ["together", "ensemble", "一緒"], together_clasp),
+    ("Together_1", ["together", "一緒"], together_clasp),
     ("Look_1", ["look", "see", "watch", "regarder", "voir", "見る"], look_brow),
     ("Sorry_1", ["sorry", "apologize", "désoler", "pardon", "excuser", "ごめん"], sorry_low),
 ]

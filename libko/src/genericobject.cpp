@@ -226,6 +226,8 @@ Future<AnyValue> GenericObject::asyncCallById(unsigned methodId, std::vector<Any
   std::shared_ptr<DynamicObject> obj = dynamicObject();
   if (!obj)
     return makeFutureError<AnyValue>("Object is gone: " + label_);
+  if (obj->isRemote())
+    return obj->metaCall(methodId, args, MetaCallType::Direct);
   auto loop = obj->eventLoop();
   return loop->async([obj = std::move(obj), methodId, args = std::move(args)] {
     return obj->metaCall(methodId, args, MetaCallType::Direct).value();

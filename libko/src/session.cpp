@@ -3,6 +3,7 @@
 #include <mutex>
 
 #include "ko/log.hpp"
+#include "remote_node.hpp"
 
 namespace ko {
 
@@ -13,7 +14,10 @@ Future<AnyObject> notFound(const std::string& name) {
 }  // namespace
 
 Session::Session() = default;
-Session::~Session() = default;
+
+Session::~Session() {
+  closeLink();
+}
 
 unsigned Session::registerService(const std::string& name, AnyObject object) {
   if (name.empty())
@@ -22,7 +26,13 @@ unsigned Session::registerService(const std::string& name, AnyObject object) {
     throw Error("Service '" + name + "' has no object");
   unsigned id = 0;
   std::uint64_t serial = 0;
+  std::shared_ptr<detail::RemoteNode> remote;
   {
+    std::shared_lock lock(mutex_);
+    remote = remote_;
+  }
+  const AnyObject published = object;
+  const auto insert = [&] {
     std::unique_lock lock(mutex_);
     if (byName_.count(name))
       throw Error("Service '" + name + "' is already registered");
@@ -30,9 +40,22 @@ unsigned Session::registerService(const std::string& name, AnyObject object) {
     byName_.emplace(name, Entry{id, std::move(object)});
     byId_.emplace(id, name);
     serial = xQueueAnnouncement(true, id, name);
-  }
+  };
+  // Listening: the name must be free in the whole directory.
+  if (remote && remote->role() == detail::RemoteNode::Role::Listening)
+    remote->registerLocal(name, insert);
+  else
+    insert();
   KO_LOG_VERBOSE("ko.session") << "Registered service '" << name << "' as #" << id;
   xAnnounce(serial);
+  if (remote && remote->role() == detail::RemoteNode::Role::Connecting) {
+    try {
+      remote->publish(name, published);
+    } catch (const Error&) {
+      unregisterService(id);
+      throw;
+    }
+  }
   return id;
 }
 
@@ -54,6 +77,13 @@ void Session::unregisterService(unsigned id) {
   }
   KO_LOG_VERBOSE("ko.session") << "Unregistered service '" << name << "' (#" << id << ")";
   xAnnounce(serial);
+  std::shared_ptr<detail::RemoteNode> remote;
+  {
+    std::shared_lock lock(mutex_);
+    remote = remote_;
+  }
+  if (remote)
+    remote->withdraw(name);
 }
 
 std::uint64_t Session::xQueueAnnouncement(bool registered, unsigned id, const std::string& name) {
@@ -120,11 +150,87 @@ Future<AnyObject> Session::service(const std::string& name, const std::string& s
   }
   if (!scope.empty() && scope != "local")
     return makeFutureError<AnyObject>("Unknown scope '" + scope + "'");
+  std::shared_ptr<detail::RemoteNode> remote;
+  {
+    std::shared_lock lock(mutex_);
+    const auto it = byName_.find(name);
+    if (it != byName_.end())
+      return Future<AnyObject>::fromValue(it->second.object);
+    remote = remote_;
+  }
+  if (scope.empty() && remote)
+    return remote->lookup(name);
+  return notFound(name);
+}
+
+std::string Session::listen(const std::string& endpoint, RemoteOptions options) {
+  std::lock_guard link(linkMutex_);
+  {
+    std::shared_lock lock(mutex_);
+    if (remote_)
+      throw Error("The session is already linked with " + remote_->endpoint());
+  }
+  auto node =
+      detail::RemoteNode::start(*this, detail::RemoteNode::Role::Listening, endpoint, std::move(options));
+  std::unique_lock lock(mutex_);
+  remote_ = node;
+  return node->endpoint();
+}
+
+void Session::connect(const std::string& endpoint, RemoteOptions options) {
+  std::lock_guard link(linkMutex_);
+  {
+    std::shared_lock lock(mutex_);
+    if (remote_)
+      throw Error("The session is already linked with " + remote_->endpoint());
+  }
+  auto node = detail::RemoteNode::start(*this, detail::RemoteNode::Role::Connecting, endpoint,
+                                        std::move(options));
+  std::unique_lock lock(mutex_);
+  remote_ = std::move(node);
+}
+
+void Session::closeLink() {
+  std::lock_guard link(linkMutex_);
+  std::shared_ptr<detail::RemoteNode> node;
+  {
+    std::unique_lock lock(mutex_);
+    node = std::move(remote_);
+  }
+  if (node)
+    node->stop();
+}
+
+bool Session::isLinked() const {
   std::shared_lock lock(mutex_);
-  const auto it = byName_.find(name);
-  if (it == byName_.end())
-    return notFound(name);
-  return Future<AnyObject>::fromValue(it->second.object);
+  return remote_ && remote_->isLinked();
+}
+
+bool Session::waitForLink(std::chrono::milliseconds bound) const {
+  std::shared_ptr<detail::RemoteNode> node;
+  {
+    std::shared_lock lock(mutex_);
+    node = remote_;
+  }
+  return node && node->waitForLink(bound);
+}
+
+void Session::setLinkListener(std::function<void(bool)> listener) {
+  std::shared_lock lock(mutex_);
+  if (!remote_)
+    throw Error("The session has no link");
+  remote_->setLinkListener(std::move(listener));
+}
+
+Future<std::vector<std::string>> Session::directory() const {
+  std::shared_ptr<detail::RemoteNode> node;
+  {
+    std::shared_lock lock(mutex_);
+    node = remote_;
+  }
+  if (!node)
+    return Future<std::vector<std::string>>::fromValue(services());
+  return node->directory();
 }
 
 std::vector<std::string> Session::services() const {

@@ -2,12 +2,17 @@
 // [--structures] [TEXT]: the job that the compiler stage makes of a text in contextual
 // mode, parsed and with its automatic tags, as JSON (the form of mokuto parse), so that
 // the automatic gestures of a text can be checked without a robot.
+#include <cstdint>
+#include <filesystem>
 #include <iostream>
 #include <iterator>
+#include <limits>
 #include <memory>
+#include <optional>
 #include <string>
 
 #include "cli_commands.h"
+#include "cli_common.h"
 #include "cli_json.h"
 #include "ko/json.hpp"
 #include "mokuto/mktaskinstruction.h"
@@ -28,7 +33,7 @@ struct AnalyseOptions {
   std::int32_t pause = 500;
   std::string tagsToWords;
   bool structures = false;
-  std::string text;
+  std::optional<std::string> text;
 };
 
 Json structureToJson(const ZU::ZULingSyntacticAnalysis& analysis,
@@ -66,36 +71,33 @@ Json analysisToJson(const ZU::ZULingSyntacticAnalysis& analysis) {
   return out;
 }
 
-int analyse(const AnalyseOptions& options) {
+int analyse(const AnalyseOptions& options, const std::string& text) {
   ZU::MokutoConfig config;
   config.bodyLanguageMode = ZU::bodyLanguageModeFromStr(options.mode);
-  if (config.bodyLanguageMode == ZU::BODY_LANGUAGE_MODE_END_OF_ENUM) {
-    std::cerr << "mokuto analyse: the mode must be disabled, random or contextual\n";
-    return 1;
-  }
-  if (options.pause < 0) {
-    std::cerr << "mokuto analyse: the pause cannot be negative\n";
-    return 1;
-  }
   config.msPauseBeforeSpeech = options.pause;
   if (!options.tagsToWords.empty()) {
     try {
-      config.updateWordsToTags(ZU::fromAnyReference(ko::fromJson(options.tagsToWords)));
+      const ko::AnyValue value = ko::fromJson(options.tagsToWords);
+      if (value.kind() != ko::Kind::List) {
+        std::cerr << "mokuto analyse: --tags-to-words takes a JSON array\n";
+        return kUsage;
+      }
+      config.updateWordsToTags(ZU::fromAnyReference(value));
     } catch (const ko::JsonError& e) {
-      std::cerr << "mokuto analyse: invalid JSON: " << e.what() << '\n';
-      return 1;
+      std::cerr << "mokuto analyse: --tags-to-words: invalid JSON: " << e.what() << '\n';
+      return kUsage;
     } catch (const ZU::ZUError& e) {
-      std::cerr << "mokuto analyse: cannot convert the value: " << e.description() << '\n';
-      return 1;
+      std::cerr << "mokuto analyse: --tags-to-words: cannot convert the value: " << e.description()
+                << '\n';
+      return kUsage;
     }
   }
   auto languages = std::make_shared<const ZU::ZULingLanguageMap>(ZU::makeLingLanguageMap());
-  if (languages->count(options.language) == 0)
-    std::cerr << "mokuto analyse: \"" << options.language
-              << "\" is not a language key: no automatic tags but those of --tags-to-words\n";
-
-  auto job = std::make_shared<ZU::MKTaskInstruction>(1, options.text, config, ZU::Standing);
-  ZU::ZUMokutoParser().parse(job, options.text, options.language == "Japanese");
+  if (!std::filesystem::is_regular_file(languages->at(options.language)))
+    std::cerr << "mokuto analyse: no linguistic database for " << options.language
+              << ": no automatic tags but those of --tags-to-words\n";
+  auto job = std::make_shared<ZU::MKTaskInstruction>(1, text, config, ZU::Standing);
+  ZU::ZUMokutoParser().parse(job, text, options.language == "Japanese");
   Json structures;
   if (options.structures) {
     ZU::ZULingSyntacticAnalyzer analyzer(languages);
@@ -109,7 +111,7 @@ int analyse(const AnalyseOptions& options) {
   if (options.structures)
     out["analysis"] = std::move(structures);
   std::cout << dumpJson(out) << '\n';
-  return std::cout.good() ? 0 : 1;
+  return std::cout.flush().good() ? kSuccess : kFailure;
 }
 
 }  // namespace
@@ -119,27 +121,24 @@ void addAnalyseCommand(CLI::App& app, int& status) {
       "analyse",
       "Parse a text and add its automatic tags as in contextual mode; print the job as JSON");
   auto options = std::make_shared<AnalyseOptions>();
-  command->add_option("--language", options->language,
-                      "The speech engine's language (English, French, Japanese, fr_FR, ...); "
-                      "default English");
-  command->add_option("--mode", options->mode,
-                      "The body language mode: disabled, random or contextual (default)");
-  command->add_option("--pause", options->pause,
-                      "The pause before speech in milliseconds (default 500)");
-  command->add_option("--tags-to-words", options->tagsToWords,
-                      "Words bound to tags, as addTagsToWords takes them: "
-                      "[[\"tag\", [\"word\", ...]], ...]");
+  addLanguageOption(*command, options->language, analysisLanguages(),
+                    "The speech engine's language, a key of the linguistic databases");
+  command->add_option("--mode", options->mode, "The body language mode")
+      ->check(CLI::IsMember({"disabled", "random", "contextual"}))
+      ->capture_default_str();
+  command->add_option("--pause", options->pause, "The pause before speech in milliseconds")
+      ->check(CLI::Range(0, std::numeric_limits<std::int32_t>::max()))
+      ->capture_default_str();
+  command
+      ->add_option("--tags-to-words", options->tagsToWords,
+                   "Words bound to tags, as addTagsToWords takes them: "
+                   "[[\"tag\", [\"word\", ...]], ...] (default: none)")
+      ->type_name("JSON");
   command->add_flag("--structures", options->structures,
                     "Also print the analysis of the speech text: its chunks with their "
                     "classes and its structures");
-  CLI::Option* text = command->add_option("text", options->text,
-                                          "The annotated text; read from standard input if absent");
-  command->callback([options, text, &status]() {
-    if (text->count() == 0)
-      options->text.assign(std::istreambuf_iterator<char>(std::cin),
-                           std::istreambuf_iterator<char>());
-    status = analyse(*options);
-  });
+  addTextArgument(*command, options->text, "The annotated text");
+  command->callback([options, &status]() { status = analyse(*options, readText(options->text)); });
 }
 
 }  // namespace mokuto::cli

@@ -1,11 +1,14 @@
 // mokuto config --apply JSON: applies a configuration value to the default
-// configuration and prints the result. Log lines go to standard error.
+// configuration and prints the result. What the service would log and skip (an unknown
+// key, a value of the wrong type, a mode that does not exist) is an error of the command.
 #include <iostream>
 #include <memory>
 #include <string>
 
 #include "cli_commands.h"
+#include "cli_common.h"
 #include "ko/json.hpp"
+#include "ko/log.hpp"
 #include "mokuto/mokutoconfig.h"
 #include "zu/zuerror.h"
 #include "zu/zuvalue.h"
@@ -20,20 +23,35 @@ int applyConfig(const std::string& text) {
   try {
     any = ko::fromJson(text);
   } catch (const ko::JsonError& e) {
-    std::cerr << "mokuto config: invalid JSON: " << e.what() << std::endl;
-    return 1;
+    std::cerr << "mokuto config: --apply: invalid JSON: " << e.what() << std::endl;
+    return kUsage;
+  }
+  if (any.kind() != ko::Kind::List) {
+    std::cerr << "mokuto config: --apply takes a JSON array" << std::endl;
+    return kUsage;
   }
   ZU::ZUValue value;
   try {
     value = ZU::fromAnyReference(any);
   } catch (const ZU::ZUError& e) {
-    std::cerr << "mokuto config: cannot convert the value: " << e.description() << std::endl;
-    return 1;
+    std::cerr << "mokuto config: --apply: cannot convert the value: " << e.description()
+              << std::endl;
+    return kUsage;
   }
   ZU::MokutoConfig config;
-  config.fromZUValue(value);
+  std::vector<std::string> errors;
+  {
+    ko::log::ScopedCapture capture(ko::log::Error, true);
+    config.fromZUValue(value);
+    for (const auto& record : capture.sink().records())
+      errors.push_back(record.message);
+  }
+  for (const auto& error : errors)
+    std::cerr << "mokuto config: --apply: " << error << std::endl;
+  if (!errors.empty())
+    return kUsage;
   std::cout << config << std::endl;
-  return 0;
+  return std::cout.good() ? kSuccess : kFailure;
 }
 
 }  // namespace
@@ -46,6 +64,7 @@ void addConfigCommand(CLI::App& app, int& status) {
       ->add_option("--apply", *json,
                    "The configuration as JSON: an array of [key, value] pairs, for example "
                    "[[\"bodyLanguageMode\", \"random\"], [\"msPauseBeforeSpeech\", 0]]")
+      ->type_name("JSON")
       ->required();
   command->callback([json, &status] { status = applyConfig(*json); });
 }

@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "cli_commands.h"
+#include "cli_common.h"
 #include "mokuto/zulingsyntacticanalyzerbinarydatabase.h"
 
 namespace mokuto::cli {
@@ -29,9 +30,13 @@ Json lookUp(const ZU::ZULingSyntacticAnalyzerBinaryDatabase& database, const std
   for (const ZU::ZULingClassFeatures& record : database.wordClasses(word)) {
     std::string baseForm;
     const bool hasBaseForm = database.lemma(word, record.wordClass, baseForm) && !baseForm.empty();
+    // The feature bytes as numbers: they are bytes, not text.
+    Json features = Json::array();
+    for (const char byte : record.features)
+      features.push_back(static_cast<unsigned char>(byte));
     records.push_back({{"class", ZU::lingWordClassToStr(record.wordClass)},
                        {"classValue", record.wordClass},
-                       {"features", record.features},
+                       {"features", std::move(features)},
                        {"lemma", hasBaseForm ? Json(baseForm) : Json(nullptr)}});
   }
   return {{"word", word},
@@ -47,8 +52,11 @@ void printText(const Json& entry) {
   std::cout << dump(entry["word"]) << ": " << (entry["found"].get<bool>() ? "found" : "not found")
             << ", longest stored prefix " << entry["longestPrefix"].get<std::size_t>() << '\n';
   for (const Json& record : entry["records"]) {
+    std::string features;
+    for (const Json& byte : record["features"])
+      features += static_cast<char>(byte.get<unsigned char>());
     std::cout << "  " << record["class"].get<std::string>() << " ("
-              << record["classValue"].get<int>() << ")  features " << dump(record["features"])
+              << record["classValue"].get<int>() << ")  features " << dump(Json(features))
               << "  lemma " << (record["lemma"].is_null() ? "none" : dump(record["lemma"])) << '\n';
   }
 }
@@ -60,14 +68,15 @@ void addLookupCommand(CLI::App& app, int& status) {
       "lookup", "Look words up in a linguistic database and print their records");
   auto options = std::make_shared<LookupOptions>();
   CLI::Option* language =
-      command->add_option("--language", options->language,
-                          "A language key of the speech engine (French, fr_FR, English, Japanese, "
-                          "EnglishEmotions, ...); default English");
+      addLanguageOption(*command, options->language, databaseKeys(),
+                        "A key of the linguistic databases (French, fr_FR, English, Japanese, "
+                        "EnglishEmotions, ...)");
   command->add_option("--database", options->database, "A database file to read instead")
+      ->type_name("FILE")
       ->excludes(language);
   command->add_flag("--json", options->json,
                     "Print one JSON object per word: word, found, longestPrefix, records "
-                    "(class, classValue, features, lemma)");
+                    "(class, classValue, features as an array of byte values, lemma)");
   command->add_option("words", options->words, "The words, as stored (lowercase)")->required();
   command->callback([options, &status]() {
     ZU::ZULingDatabasePtr database;
@@ -80,12 +89,10 @@ void addLookupCommand(CLI::App& app, int& status) {
       ZU::ZULingDatabaseUser user(languages);
       user.setLanguage(options->language);
       database = user.database();
-      if (languages->count(options->language) == 0)
-        std::cerr << "mokuto lookup: \"" << options->language << "\" is not a language key\n";
     }
     if (!database) {
       std::cerr << "mokuto lookup: no linguistic database to read\n";
-      status = 1;
+      status = kFailure;
       return;
     }
     Json all = Json::array();

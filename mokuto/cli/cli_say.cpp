@@ -1,34 +1,40 @@
 // mokuto say [options] [TEXT]: speaks an annotated text on the simulated robot with the
-// service embedded in the process, prints the live timeline and a summary, and can write
-// the audio (WAV) and the whole timeline (JSON lines). --dry-run shows the prepared job
-// without speaking.
-#include <pthread.h>
-
+// service embedded in the process, or through the running service of other processes
+// (mokuto --connect), prints the live timeline and a summary, and can write the audio (WAV,
+// in the process only) and the whole timeline (JSON lines). --dry-run shows the prepared
+// job without speaking.
+#include <algorithm>
 #include <atomic>
-#include <csignal>
 #include <filesystem>
 #include <fstream>
 #include <functional>
 #include <iostream>
-#include <iterator>
+#include <map>
 #include <memory>
 #include <optional>
 #include <sstream>
 #include <string>
-#include <thread>
 #include <tuple>
 #include <utility>
 #include <vector>
 
 #include "cli_commands.h"
+#include "cli_common.h"
 #include "cli_json.h"
 #include "cli_sayperformance.h"
 #include "cli_saytimeline.h"
 #include "cli_service.h"
+#include "cli_signals.h"
+#include "cli_textcheck.h"
 #include "ko/json.hpp"
 #include "ko/log.hpp"
 #include "ko/os.hpp"
+#include "ko/path.hpp"
+#include "mokuto/mokutoconfig.h"
+#include "robotsim/soundlibrary.h"
 #include "zu/zuerror.h"
+#include "zu/zuproxy.h"
+#include "zu/zuserviceproxies.h"
 #include "zu/zuvalue.h"
 #include "zu/zuvalueconverter.h"
 
@@ -36,63 +42,8 @@ namespace mokuto::cli {
 
 namespace {
 
-constexpr int kUsage = 2;
-constexpr int kFailure = 1;
-// The shell's status for a command ended by SIGINT.
-constexpr int kInterrupted = 128 + SIGINT;
-
-// SIGINT and SIGTERM blocked in the constructing thread (and in every thread it starts
-// afterwards) for the object's life.
-class InterruptMask {
- public:
-  InterruptMask() {
-    sigemptyset(&fSignals);
-    sigaddset(&fSignals, SIGINT);
-    sigaddset(&fSignals, SIGTERM);
-    pthread_sigmask(SIG_BLOCK, &fSignals, &fPrevious);
-  }
-  ~InterruptMask() { pthread_sigmask(SIG_SETMASK, &fPrevious, nullptr); }
-  InterruptMask(const InterruptMask&) = delete;
-  InterruptMask& operator=(const InterruptMask&) = delete;
-
-  const sigset_t& signals() const { return fSignals; }
-
- private:
-  sigset_t fSignals{};
-  sigset_t fPrevious{};
-};
-
-// While a text is spoken, Ctrl-C (SIGINT) or SIGTERM stops it rather than the process, so
-// that the summary and the files still come. A thread of its own waits for the signal;
-// the destructor wakes and joins it.
-class InterruptWatcher {
- public:
-  InterruptWatcher(const InterruptMask& mask, std::function<void()> stop)
-      : fThread([this, signals = mask.signals(), stop = std::move(stop)] {
-          int received = 0;
-          sigwait(&signals, &received);
-          if (!fDone.load()) {
-            fInterrupted.store(true);
-            std::cerr << "mokuto say: " << (received == SIGINT ? "SIGINT" : "SIGTERM")
-                      << ", stopping the text" << std::endl;
-            stop();
-          }
-        }) {}
-  ~InterruptWatcher() {
-    fDone.store(true);
-    pthread_kill(fThread.native_handle(), SIGTERM);
-    fThread.join();
-  }
-  InterruptWatcher(const InterruptWatcher&) = delete;
-  InterruptWatcher& operator=(const InterruptWatcher&) = delete;
-
-  bool interrupted() const { return fInterrupted.load(); }
-
- private:
-  std::atomic<bool> fDone{false};
-  std::atomic<bool> fInterrupted{false};
-  std::thread fThread;  // last: it uses the flags
-};
+// At most this many warnings about the text are written; the others are counted.
+constexpr std::size_t kShownWarnings = 10;
 
 struct SayOptions {
   std::string mode;
@@ -111,6 +62,11 @@ struct SayOptions {
   bool dryRun = false;
   bool quiet = false;
   std::optional<std::string> text;
+};
+
+// An unusable argument or option: what to write (the status is kUsage).
+struct Refusal {
+  std::string message;
 };
 
 // A usable option value, or the message that says why it is not.
@@ -137,6 +93,24 @@ Parsed parseJsonOption(const std::string& option, const std::string& json) {
   return parsed;
 }
 
+// What the service logs (or throws) as it takes a configuration value, tried on a copy of
+// the configuration first: the service logs these and goes on, the command refuses them.
+std::vector<std::string> configurationErrors(ZU::MokutoConfig probe,
+                                             const std::function<void(ZU::MokutoConfig&)>& take) {
+  ko::log::ScopedCapture capture(ko::log::Error, true);
+  try {
+    take(probe);
+  } catch (const std::exception& e) {
+    return {e.what()};
+  }
+  std::vector<std::string> errors;
+  for (const auto& record : capture.sink().records()) {
+    if (record.level <= ko::log::Error)
+      errors.push_back(record.message);
+  }
+  return errors;
+}
+
 // A file the command is to write: its folder must exist.
 std::string checkOutputPath(const std::string& option, const std::string& path) {
   if (path.empty())
@@ -150,9 +124,193 @@ std::string checkOutputPath(const std::string& option, const std::string& path) 
   return {};
 }
 
+// The option values, checked as the service will take them, before the robot starts.
+struct Values {
+  std::optional<ZU::ZUValue> configuration;
+  std::optional<ZU::ZUValue> tagsToWords;
+  std::optional<ZU::ZUValue> tagsToAnimations;
+};
+
+std::optional<Refusal> checkValues(const SayOptions& o, Values& values) {
+  for (auto [option, json, target] :
+       {std::tuple{"--config", &o.config, &values.configuration},
+        std::tuple{"--tags-to-words", &o.tagsToWords, &values.tagsToWords},
+        std::tuple{"--tags-to-animations", &o.tagsToAnimations, &values.tagsToAnimations}}) {
+    if (json->empty())
+      continue;
+    Parsed parsed = parseJsonOption(option, *json);
+    if (!parsed.value)
+      return Refusal{parsed.error};
+    *target = std::move(parsed.value);
+  }
+  // The packages as the service declares them: with a "/" appended.
+  ZU::MokutoConfig probe;
+  for (const auto& package : o.packages) {
+    const std::string declared = package + "/";
+    if (std::find(probe.animationsPackages.begin(), probe.animationsPackages.end(), declared) ==
+        probe.animationsPackages.end())
+      probe.animationsPackages.push_back(declared);
+  }
+  using Take = std::function<void(ZU::MokutoConfig&)>;
+  const std::vector<std::tuple<const char*, const std::optional<ZU::ZUValue>*, Take>> takes = {
+      {"--config", &values.configuration,
+       [&values](ZU::MokutoConfig& c) { c.fromZUValue(*values.configuration); }},
+      {"--tags-to-words", &values.tagsToWords,
+       [&values](ZU::MokutoConfig& c) { c.updateWordsToTags(*values.tagsToWords); }},
+      {"--tags-to-animations", &values.tagsToAnimations,
+       [&values](ZU::MokutoConfig& c) { c.updateTagsToAnimations(*values.tagsToAnimations); }}};
+  for (const auto& [option, value, take] : takes) {
+    if (!*value)
+      continue;
+    const std::vector<std::string> errors = configurationErrors(probe, take);
+    if (!errors.empty()) {
+      std::string message;
+      for (const auto& error : errors)
+        message += (message.empty() ? "" : "\nmokuto say: ") + std::string(option) + ": " + error;
+      return Refusal{message};
+    }
+  }
+  for (const auto& [option, path] :
+       {std::pair{"--wav", &o.wav}, {"--html", &o.html}, {"--timeline", &o.timeline}}) {
+    if (const std::string error = checkOutputPath(option, *path); !error.empty())
+      return Refusal{error};
+  }
+  if (o.dryRun && !o.wav.empty())
+    return Refusal{"--wav has no audio to write with --dry-run"};
+  if (o.dryRun && !o.html.empty())
+    return Refusal{"--html has no performance to draw with --dry-run"};
+  return std::nullopt;
+}
+
+// With --connect, the options that belong to the robot's process or that need the service
+// in this one.
+std::optional<Refusal> checkRemote(const CLI::App& command) {
+  if (!connected())
+    return std::nullopt;
+  for (const char* option : {"--speech", "--fast", "--language", "--posture"}) {
+    if (command.count(option) > 0)
+      return Refusal{std::string(option) +
+                     " belongs to the robot's process with --connect (zefoko serve --listen)"};
+  }
+  if (command.count("--dry-run") > 0)
+    return Refusal{"--dry-run needs the service in this process (without --connect)"};
+  for (const char* option : {"--wav", "--html"}) {
+    if (command.count(option) > 0)
+      return Refusal{std::string(option) + " needs the robot in this process (without --connect)"};
+  }
+  return std::nullopt;
+}
+
+// The configuration calls, before the text: each package must hold animations.
+std::optional<Refusal> configureService(const SayOptions& o, const Values& values,
+                                        ServiceHandle& service) {
+  try {
+    const std::vector<std::string> installed =
+        o.packages.empty() ? std::vector<std::string>() : service.installedBehaviors();
+    for (const auto& package : o.packages) {
+      const std::string declared = package + "/";
+      if (std::none_of(installed.begin(), installed.end(), [&declared](const std::string& path) {
+            return path.rfind(declared, 0) == 0;
+          })) {
+        return Refusal{"--package " + package + ": no installed animation begins with \"" +
+                       declared + "\" (the service appends \"/\" to the package)"};
+      }
+      service.declareAnimationsPackage(package);
+    }
+    if (!o.mode.empty())
+      service.setBodyLanguageModeFromStr(o.mode);
+    if (values.tagsToWords)
+      service.addTagsToWords(*values.tagsToWords);
+    if (values.tagsToAnimations)
+      service.declareTagForAnimations(*values.tagsToAnimations);
+  } catch (const ZU::ZUError& e) {
+    return Refusal{e.description()};
+  } catch (const std::exception& e) {
+    return Refusal{e.what()};
+  }
+  if (o.checkTimes)
+    service._setCheckExecutionTimes(true);
+  return std::nullopt;
+}
+
+void warnAboutText(const std::string& text) {
+  const std::vector<TextWarning> warnings = checkInstructions(text);
+  const bool lines = text.find('\n') != std::string::npos;
+  for (std::size_t k = 0; k < std::min(warnings.size(), kShownWarnings); ++k) {
+    const TextWarning& w = warnings[k];
+    std::cerr << "mokuto say: warning: "
+              << (lines ? "line " + std::to_string(w.line) + ", " : std::string()) << "column "
+              << w.column << ": " << w.message << '\n';
+  }
+  if (warnings.size() > kShownWarnings) {
+    std::cerr << "mokuto say: warning: " << warnings.size() - kShownWarnings
+              << " more like these\n";
+  }
+  std::cerr << std::flush;
+}
+
+// What the director's calls will make of an action that the loader accepted, as far as it
+// can be known before: a sound that its set lacks, a call whose arguments are not a JSON
+// list or that no method of the service takes; an automatic tag without an animation.
+class DryRunCheck {
+ public:
+  std::optional<std::string> operator()(const ZU::MKTaskAction& action) {
+    if (actionErrorCode(action))
+      return std::nullopt;
+    if (action.type == ZU::UNKNOWN && dynamic_cast<const ZU::MKAnimationAction*>(&action))
+      return "no animation";
+    if (const auto* sound = dynamic_cast<const ZU::MKSoundAction*>(&action)) {
+      if (action.type == ZU::START_SOUND || action.type == ZU::RUN_SOUND)
+        return xSound(*sound);
+    } else if (const auto* call = dynamic_cast<const ZU::MKCallAction*>(&action)) {
+      if (call->proxy)
+        return xCall(*call);
+    }
+    return std::nullopt;
+  }
+
+ private:
+  std::optional<std::string> xSound(const ZU::MKSoundAction& sound) {
+    auto set = fSets.find(sound.soundSet);
+    if (set == fSets.end()) {
+      robotsim::SoundSet read;
+      try {
+        read = robotsim::readSoundSet(
+            std::filesystem::path(ko::path::findData("zefoko", "sounds")) / sound.soundSet);
+      } catch (const robotsim::SoundFileError&) {
+      }
+      set = fSets.emplace(sound.soundSet, std::move(read)).first;
+    }
+    const std::string name = soundFileName(sound.soundName);
+    if (set->second.files.count(name) > 0)
+      return std::nullopt;
+    return "No sound \"" + name + "\" in the sound set \"" + sound.soundSet + "\"";
+  }
+
+  static std::optional<std::string> xCall(const ZU::MKCallAction& call) {
+    std::vector<ko::AnyValue> arguments;
+    try {
+      arguments = ko::fromJson(call.arguments).to<std::vector<ko::AnyValue>>();
+    } catch (const ko::JsonError& e) {
+      return failureReason(e.what());
+    } catch (const ko::ConversionError&) {
+      return "the arguments are not a list";
+    }
+    try {
+      call.proxy->getObject()->resolveMethod(call.method, arguments);
+    } catch (const std::exception& e) {
+      return std::string(e.what());
+    }
+    return std::nullopt;
+  }
+
+  std::map<std::string, robotsim::SoundSet> fSets;
+};
+
 Json preparedJobToJson(const ZU::MKTaskInstruction& job) {
   Json out = jobToJson(job);
   Json& actions = out["actions"];
+  DryRunCheck check;
   std::size_t k = 0;
   for (const auto& action : job.actions) {
     if (!action)
@@ -175,55 +333,39 @@ Json preparedJobToJson(const ZU::MKTaskInstruction& job) {
     }
     entry["resolved"] = resolved;
     entry["error"] = error ? Json(*error) : Json();
+    const auto failure = check(*action);
+    entry["failure"] = failure ? Json(*failure) : Json();
   }
   return out;
 }
 
-int say(SayOptions& o) {
-  const auto usage = [](const std::string& message) {
-    std::cerr << "mokuto say: " << message << std::endl;
+int say(SayOptions& o, const CLI::App& command) {
+  // First: the signals are blocked before any thread starts.
+  StopSignals signals("mokuto say");
+  const auto refuse = [](const Refusal& refusal) {
+    std::cerr << "mokuto say: " << refusal.message << std::endl;
     return kUsage;
   };
-  if (!o.text || *o.text == "-") {
-    o.text.emplace(std::istreambuf_iterator<char>(std::cin), std::istreambuf_iterator<char>());
-  }
-  if (o.text->find_first_not_of(" \t\r\n") == std::string::npos)
-    return usage("the text is empty");
-  std::optional<ZU::ZUValue> configuration;
-  std::optional<ZU::ZUValue> tagsToWords;
-  std::optional<ZU::ZUValue> tagsToAnimations;
-  for (auto [option, json, target] :
-       {std::tuple{"--config", &o.config, &configuration},
-        std::tuple{"--tags-to-words", &o.tagsToWords, &tagsToWords},
-        std::tuple{"--tags-to-animations", &o.tagsToAnimations, &tagsToAnimations}}) {
-    if (json->empty())
-      continue;
-    Parsed parsed = parseJsonOption(option, *json);
-    if (!parsed.value)
-      return usage(parsed.error);
-    *target = std::move(parsed.value);
-  }
-  for (const auto& [option, path] :
-       {std::pair{"--wav", &o.wav}, {"--html", &o.html}, {"--timeline", &o.timeline}}) {
-    if (const std::string error = checkOutputPath(option, *path); !error.empty())
-      return usage(error);
-  }
-  if (o.dryRun && !o.wav.empty())
-    return usage("--wav has no audio to write with --dry-run");
-  if (o.dryRun && !o.html.empty())
-    return usage("--html has no performance to draw with --dry-run");
+  if (const auto refusal = checkRemote(command))
+    return refuse(*refusal);
+  const std::string text = readText(o.text);
+  if (text.find_first_not_of(" \t\r\n") == std::string::npos)
+    return refuse({"the text is empty"});
+  Values values;
+  if (const auto refusal = checkValues(o, values))
+    return refuse(*refusal);
   std::ofstream timelineFile;
   if (!o.timeline.empty()) {
     timelineFile.open(o.timeline);
     if (!timelineFile)
-      return usage("--timeline: cannot write " + o.timeline);
+      return refuse({"--timeline: cannot write " + o.timeline});
   }
-  int status = 0;
   // The live timeline is the command's output; the service's log keeps to its warnings
   // unless ZEFOKO_LOG says otherwise.
   if (ko::os::getenv("ZEFOKO_LOG").empty())
     ko::log::setLevels("*=warning");
 
+  int status = kSuccess;
   try {
     EmbeddedServiceOptions serviceOptions;
     serviceOptions.speech = o.speech;
@@ -233,92 +375,100 @@ int say(SayOptions& o) {
     serviceOptions.recordAudio = !o.wav.empty() || !o.html.empty();
     if (!o.html.empty() || !o.timeline.empty())
       serviceOptions.angleSamplesPerSecond = kAngleSamplesPerSecond;
-    // Blocked before the robot's threads start, so that they all inherit the mask and the
-    // watcher below alone takes the signals.
-    const InterruptMask interruptMask;
-    EmbeddedService embedded(serviceOptions);
-    ZU::ZUMokuto& service = embedded.service();
-    robotsim::Robot& robot = embedded.robot();
-
-    try {
-      if (!o.mode.empty())
-        service.setBodyLanguageModeFromStr(o.mode);
-      if (tagsToWords)
-        service.addTagsToWords(*tagsToWords);
-      if (tagsToAnimations)
-        service.declareTagForAnimations(*tagsToAnimations);
-      for (const auto& package : o.packages)
-        service.declareAnimationsPackage(package);
-    } catch (const ZU::ZUError& e) {
-      return usage(e.description());
-    } catch (const std::exception& e) {
-      return usage(e.what());
-    }
-    if (o.checkTimes)
-      service._setCheckExecutionTimes(true);
+    const std::unique_ptr<ServiceHandle> handle = openService(serviceOptions);
+    ServiceHandle& service = *handle;
+    // In this process alone: with --connect, the audio and the samples stay with the robot.
+    robotsim::Robot* const robot = service.localRobot();
+    if (const auto refusal = configureService(o, values, service))
+      return refuse(*refusal);
+    warnAboutText(text);
     const ZU::ZUValue noConfiguration;
+    const ZU::ZUValue& configuration =
+        values.configuration ? *values.configuration : noConfiguration;
 
     if (o.dryRun) {
-      robot.timeline()->clear();
-      const auto job = service.prepare(*o.text, configuration ? *configuration : noConfiguration);
+      service.timeline()->clear();
+      const auto job = service.prepare(text, configuration);
       std::cout << dumpJson(preparedJobToJson(*job)) << std::endl;
       if (timelineFile.is_open())
-        robot.timeline()->writeJsonLines(timelineFile);
+        service.timeline()->writeJsonLines(timelineFile);
     } else {
-      const auto recorder = SayTimeline::create(robot.timeline(), o.quiet ? nullptr : &std::cout);
+      const auto recorder =
+          SayTimeline::create(service.timeline(), o.quiet ? nullptr : &std::cout, o.fast);
+      // Set once a signal has asked the text to stop while the service had it.
+      std::atomic<bool> stopAsked{false};
       service.setDirectorObserver(recorder);
-      const bool drawn = serviceOptions.angleSamplesPerSecond > 0;
-      embedded.setStageObserver([recorder, drawn, &robot](ZU::ZUMokutoStage stage, ZU::MKID id) {
+      const bool drawn = robot != nullptr && serviceOptions.angleSamplesPerSecond > 0;
+      service.setStageObserver([&](ZU::ZUMokutoStage stage, ZU::MKID id) {
+        recorder->stage(stage, id);
         if (stage != ZU::ZUMokutoStage::Compiler)
           return;
-        recorder->accepted(id);
         // The pose the performance starts from; the samples tell the joints that move.
         if (drawn)
-          robot.motion()->recordPose();
+          robot->motion()->recordPose();
+        // A signal that came before the service registered the text stopped nothing yet.
+        if (signals.received()) {
+          stopAsked.store(true);
+          service.stop(id);
+        }
       });
-      robot.timeline()->clear();
-      const std::int64_t originUs = robot.timeline()->now();
-      recorder->begin(*o.text);
-      bool interrupted = false;
+      service.timeline()->clear();
+      const std::int64_t originUs = service.timeline()->now();
+      recorder->begin(text);
       {
-        const InterruptWatcher watcher(interruptMask, [&service] { service._stopAll(false); });
-        if (configuration)
-          service.say(*o.text, *configuration);
-        else
-          service.say(*o.text);
-        interrupted = watcher.interrupted();
+        // Whatever say does, the signals and the service forget the callbacks on its way
+        // out; a signal after it is only remembered, so that the summary and files come.
+        const std::shared_ptr<void> detach(nullptr, [&](void*) {
+          signals.onStop([] {});
+          service.setStageObserver(nullptr);
+          service.setDirectorObserver(nullptr);
+        });
+        signals.onStop([&] {
+          stopAsked.store(true);
+          service.stopText(recorder->id());
+        });
+        if (!signals.received()) {
+          if (values.configuration)
+            service.say(text, configuration);
+          else
+            service.say(text);
+        }
+        // From a service of another process, the last reports and the robot's last entries
+        // may still be on their way.
+        service.settle(recorder->id());
       }
-      if (interrupted)
-        status = kInterrupted;
       ZU::MKID id = 0;
-      const SaySummary summary = recorder->end(&id);
-      embedded.setStageObserver(nullptr);
-      service.setDirectorObserver(nullptr);
-      const std::int64_t endUs = robot.timeline()->now();
+      const SaySummary summary = recorder->end(stopAsked.load() || signals.received(), &id);
+      const std::int64_t endUs = service.timeline()->now();
       SayTimeline::printSummary(std::cout, id, summary);
-      std::ostringstream summaryText;
-      SayTimeline::printSummary(summaryText, id, summary);
-      writePerformanceFiles({o.wav, o.html}, robot, *recorder, *o.text, summaryText.str(),
-                            originUs, endUs, std::cout);
+      if (robot) {
+        std::ostringstream summaryText;
+        SayTimeline::printSummary(summaryText, id, summary);
+        writePerformanceFiles({o.wav, o.html}, *robot, *recorder, text, summaryText.str(), originUs,
+                              endUs, std::cout);
+      }
       if (timelineFile.is_open()) {
         recorder->writeJsonLines(timelineFile);
-        std::cout << "Timeline written to " << o.timeline << std::endl;
+        std::cout << "Timeline written to " << o.timeline << '\n';
       }
+      std::cout << std::flush;
     }
     if (timelineFile.is_open() && !timelineFile.flush()) {
       std::cerr << "mokuto say: cannot write " << o.timeline << std::endl;
-      return kFailure;
+      status = kFailure;
     }
   } catch (const ServiceError& e) {
     std::cerr << "mokuto say: the service cannot start: " << e.what() << std::endl;
-    return kFailure;
+    status = kFailure;
   } catch (const ZU::ZUError& e) {
     std::cerr << "mokuto say: " << e.description() << std::endl;
-    return kFailure;
+    status = kFailure;
   } catch (const std::exception& e) {
     std::cerr << "mokuto say: " << e.what() << std::endl;
-    return kFailure;
+    status = kFailure;
   }
+  if (signals.received())
+    return kStopped;
   return std::cout.good() ? status : kFailure;
 }
 
@@ -328,18 +478,18 @@ void addSayCommand(CLI::App& app, int& status) {
   auto o = std::make_shared<SayOptions>();
   CLI::App* command = app.add_subcommand(
       "say",
-      "Speak an annotated text on the simulated robot, with the service in the process: "
-      "print the timeline live, then a summary of the actions and of their sync with the "
-      "speech");
+      "Speak an annotated text on the simulated robot, with the service in the process (or "
+      "the running one, with mokuto --connect): print the timeline live, then a summary of "
+      "the actions and of their sync with the speech");
   command
       ->add_option("--mode", o->mode,
                    "The body language mode, set before the text: disabled, random or "
-                   "contextual (default: the service's own)")
+                   "contextual (default: the service's own, contextual)")
       ->check(CLI::IsMember({"disabled", "random", "contextual"}));
-  command->add_option("--language", o->language, "The speech language")
-      ->check(CLI::IsMember({"English", "French", "Japanese"}))
-      ->capture_default_str();
-  command->add_option("--posture", o->posture, "The robot's posture family at start")
+  addLanguageOption(*command, o->language, speechLanguages(), "The speech engine's language");
+  command
+      ->add_option("--posture", o->posture,
+                   "The robot's posture family at start (default: Standing, the robot's own)")
       ->check(CLI::IsMember({"Standing", "Sitting", "SittingOnChair"}));
   command
       ->add_option("--speech", o->speech,
@@ -347,29 +497,35 @@ void addSayCommand(CLI::App& app, int& status) {
                    "from the text, no audio)")
       ->check(CLI::IsMember({"espeak", "timing"}))
       ->capture_default_str();
-  command->add_flag("--fast", o->fast, "Play the speech without waiting in real time");
+  command->add_flag("--fast", o->fast,
+                    "Play the speech without waiting in real time (default: real time; the "
+                    "sync figures mean nothing then)");
   command
       ->add_option("--config", o->config,
                    "A configuration value form for the two-argument say: "
-                   "[[\"bodyLanguageMode\", \"random\"], [\"msPauseBeforeSpeech\", 0], ...]")
+                   "[[\"bodyLanguageMode\", \"random\"], [\"msPauseBeforeSpeech\", 0], ...] "
+                   "(default: none)")
       ->type_name("JSON");
   command
       ->add_option("--tags-to-words", o->tagsToWords,
                    "Words bound to tags, given to addTagsToWords before the text: "
-                   "[[\"tag\", [\"word\", ...]], ...]")
+                   "[[\"tag\", [\"word\", ...]], ...] (default: none)")
       ->type_name("JSON");
   command
       ->add_option("--tags-to-animations", o->tagsToAnimations,
                    "Animations bound to tags, given to declareTagForAnimations before the "
-                   "text: [[\"tag\", [\"animation\", ...]], ...]")
+                   "text: [[\"tag\", [\"animation\", ...]], ...] (default: none)")
       ->type_name("JSON");
   command
       ->add_option("--package", o->packages,
-                   "An animations package to declare before the text (repeatable)")
-      ->type_name("NAME");
+                   "An animations package to declare before the text, as "
+                   "declareAnimationsPackage takes it (repeatable; default: only "
+                   "\"animations/\")")
+      ->type_name("NAME")
+      ->allow_extra_args(false);
   command->add_flag("--check-times", o->checkTimes,
                     "Switch the timing checker on (ZUMokuto/StartOfMK and StopOfMK, and the "
-                    "durations in the log category mokuto.times)");
+                    "durations in the log category mokuto.times; default: off)");
   command
       ->add_option("--wav", o->wav,
                    "Write the audio of the whole performance to this WAV file: the speech and "
@@ -385,16 +541,22 @@ void addSayCommand(CLI::App& app, int& status) {
       ->type_name("FILE");
   command->add_flag("--dry-run", o->dryRun,
                     "Run the compiler and loader stages only and print the prepared job as "
-                    "JSON, without speaking");
+                    "JSON, with the error of each action that the loader knows or that its "
+                    "call would meet, without speaking");
   command->add_flag("--quiet", o->quiet, "Print the summary only, not the live timeline");
-  command->add_option("text", o->text,
-                      "The annotated text; read from standard input when absent or \"-\"");
+  addTextArgument(*command, o->text, "The annotated text (see mokuto syntax)");
   command->footer(
-      "Exit status: 0 when the text was spoken (instruction errors included), 2 for an "
-      "unusable argument or option, 1 when the service fails, 130 when Ctrl-C (SIGINT) or "
-      "SIGTERM stopped the text (its summary and files still come).\nLog lines go to standard "
-      "error, warnings and errors only unless ZEFOKO_LOG sets the levels.");
-  command->callback([o, &status] { status = say(*o); });
+      "Exit status: 0 when the text was spoken (instruction errors and failed actions "
+      "included: the summary counts them); 2 for an unusable argument or option, or a "
+      "configuration value that the service rejects, before anything is spoken; 1 when the "
+      "service fails; 130 when SIGINT (Ctrl-C) or SIGTERM stopped the text (its summary and "
+      "files still come; a second signal, or one before the text is handed to the service, "
+      "ends the command at once).\nWith mokuto --connect, --speech, --fast, --language and "
+      "--posture belong to the robot's process (zefoko serve --listen), and --wav and "
+      "--dry-run need the service in this one: they are usage errors.\nWarnings about the text "
+      "and log lines go to standard error, warnings and errors only unless ZEFOKO_LOG sets "
+      "the levels.");
+  command->callback([o, command, &status] { status = say(*o, *command); });
 }
 
 }  // namespace mokuto::cli

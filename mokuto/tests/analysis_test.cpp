@@ -222,14 +222,14 @@ TEST_F(AnalysisTest, TheTokeniserCutsTagsSpacesLinksPunctuationAndWords) {
       // Unspaced: the longest stored word wherever it ends; unknown runs of katakana or
       // latin letters stay whole, other unknown characters go one by one.
       {"Japanese",
-       "りんごとペッパーが好き。Pepper犬",
+       "りんごとメロンが好き。Melon犬",
        {{"りんご", 11},
         {"と", 12},
-        {"ペッパー", 4},
+        {"メロン", 4},
         {"が", 12},
         {"好き", 5},
         {"。", 3},
-        {"Pepper", 17},
+        {"Melon", 17},
         {"犬", 4}}},
       {"Unspaced", "ithe theme", {{"i", 13}, {"the", 9}, {" ", 1}, {"the", 9}, {"me", 4}}},
       // Without a database every word is unknown.
@@ -271,7 +271,7 @@ TEST_F(AnalysisTest, AnyTextIsCutWithoutLosingAByte) {
       "l'",
       "'l",
       "n'",
-      "ペッパーーー",
+      "メロンーーー",
       std::string(300, 'x') + " and y",
   };
   std::mt19937 random(7);
@@ -369,6 +369,23 @@ TEST_F(AnalysisTest, TheLookBackDropsTagsNearTheCallersGestures) {
   // A pause counts its milliseconds.
   EXPECT_THAT(autoTags(*compile("^start(a) \\pau=1300\\ apples and pears")),
               ::testing::ElementsAre("two"));
+}
+
+// A bookmark that the anticipation would bring within 1300 ms of speech after the
+// caller's gesture stays before its word, where the look-back accepted it.
+TEST_F(AnalysisTest, TheLookBackHoldsAfterTheMoveBack) {
+  const std::vector<std::pair<std::string, std::string>> cases = {
+      {"^start(a) I like many kinds of fruit: apples, pears and plums",
+       " \\mrk=1\\  I like many kinds of fruit:  \\mrk=2\\ apples"},
+      {"^stop(a) I like many kinds of fruit: apples, pears and plums",
+       " \\mrk=1\\  I like  \\mrk=4\\ many kinds of fruit: apples"},
+      {"^start(a) \\pau=1300\\ I like many kinds of fruit: apples",
+       " \\mrk=1\\   \\pau=1300\\   \\mrk=2\\ I"},
+      {"^start(a) I like many different kinds of fruit, for example apples, pears and plums",
+       " \\mrk=1\\  I like many different  \\mrk=2\\ kinds of fruit"},
+  };
+  for (const auto& [text, expected] : cases)
+    EXPECT_THAT(compile(text)->text, ::testing::HasSubstr(expected)) << text;
 }
 
 TEST_F(AnalysisTest, BookmarksStandBeforeTheirWordOrAheadWithTheFlag) {
@@ -533,3 +550,159 @@ TEST_F(RealDatabases, TheLibrarysWordTagsAreBaseForms) {
 }
 
 }  // namespace
+
+namespace {
+
+std::string cut(ZULingSyntacticAnalyzer& analyzer, const std::string& text) {
+  std::string out;
+  for (const auto& chunk : analyzer.analyse(text).chunks)
+    out += (out.empty() ? "" : "|") + chunk.text;
+  return out;
+}
+
+}  // namespace
+
+// The data of the databases: words with their cut, base form or emotion label.
+TEST_F(RealDatabases, WordsGetTheirCutBaseFormAndLabel) {
+  ZULingSyntacticAnalyzer japanese(languages_);
+  japanese.setLanguage("Japanese");
+  // Japanese is cut where MeCab cuts it; a katakana run is one word.
+  for (const auto& [text, expected] : std::vector<std::pair<std::string, std::string>>{
+           {"しています", "し|て|い|ます"},
+           {"ありません", "あり|ません"},
+           {"でください", "で|ください"},
+           {"プロンプト", "プロンプト"},
+           {"ファイルシステム", "ファイルシステム"},
+           {"楽しいですね", "楽しい|です|ね"},
+       })
+    EXPECT_EQ(cut(japanese, text), expected) << text;
+
+  // The base form of each word's first record; "" for none.
+  struct BaseForm {
+    std::string language, word, baseForm;
+  };
+  const std::vector<BaseForm> baseForms = {
+      {"Japanese", "し", "する"},   {"French", "au", "à"},        {"French", "aux", "à"},
+      {"French", "du", "de"},       {"French", "des", "de"},      {"French", "cela", "cela"},
+      {"French", "vi", "vi"},       {"French", "votre", "votre"}, {"French", "fichiers", "fichier"},
+      {"French", "four", ""},       {"English", "no", "no"},      {"English", "non", ""},
+      {"English", "files", "file"},
+  };
+  for (const BaseForm& b : baseForms) {
+    ZULingDatabaseUser user(languages_);
+    user.setLanguage(b.language);
+    ASSERT_TRUE(user.database()) << b.language;
+    std::string baseForm;
+    const auto classes = user.database()->wordClasses(b.word);
+    user.database()->lemma(b.word, classes.front().wordClass, baseForm);
+    EXPECT_EQ(baseForm, b.baseForm) << b.language << ": " << b.word;
+  }
+
+  // Emotion labels, and the emotion of a few sentences.
+  const std::vector<BaseForm> labels = {
+      {"FrenchEmotions", "réussi", "positive"},
+      {"FrenchEmotions", "succès", "positive"},
+      {"FrenchEmotions", "échec", "negative"},
+      {"FrenchEmotions", "bienvenue", "positive"},
+      {"FrenchEmotions", "félicitations", "very positive"},
+      {"FrenchEmotions", "tout", ""},
+      {"EnglishEmotions", "sorry", "negative"},
+      {"EnglishEmotions", "congratulations", "very positive"},
+      {"ja_JPEmotions", "ね", ""},
+      {"ja_JPEmotions", "ません", "negation"},
+      {"ja_JPEmotions", "ず", "negation"},
+      {"ja_JPEmotions", "ありがとう", "positive"},
+  };
+  for (const BaseForm& b : labels) {
+    ZULingDatabaseUser user(languages_);
+    user.setLanguage(b.language);
+    ASSERT_TRUE(user.database()) << b.language;
+    std::string label;
+    user.database()->lemma(b.word, WORD_CLASS_UNKNOWN, label);
+    EXPECT_EQ(label, b.baseForm) << b.language << ": " << b.word;
+  }
+  ZULingEmotionEstimator estimator(languages_);
+  for (const auto& [language, text, emotion] :
+       std::vector<std::tuple<std::string, std::string, int>>{
+           {"Japanese", "楽しいですね", 1},
+           {"Japanese", "満足していません", -1},
+           {"Japanese", "申し訳ありません", -1},
+           {"French", "Le test a réussi", 1},
+           {"English", "Sorry, I am late", -1},
+       })
+    EXPECT_EQ(estimator.getEmotion(language, text), emotion) << text;
+}
+
+// Structure tags count things: verbs and clauses joined by "and" or "or" get none; the
+// starter library's tags are words of one language.
+TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
+  struct Case {
+    std::string language, text;
+    bool enumeration;
+  };
+  const std::vector<Case> cases = {
+      {"English", "I like apples and pears.", true},
+      {"English", "Apples, pears, and plums are ripe.", true},
+      {"English", "You can read, write and remove files.", false},
+      {"English", "You can add or remove files.", false},
+      {"English", "Type your password and press the Enter key.", false},
+      {"English", "There is one disk, and everything is there.", false},
+      {"English", "It opens the library and the library calls the kernel.", false},
+      {"English", "It is a great feature and very useful.", false},
+      {"English", "It does more and comes with examples.", false},
+      {"English", "Follow the guide provided by the team and sent to the list.", false},
+      {"English", "Copy the files somewhere else and run the tool.", false},
+      {"English", "It is kept in the patches directory and the source tree is untouched.", false},
+      {"English", "Although books and documents are helpful, practice.", true},
+      {"English", "Learn how it works and how you can help.", false},
+      {"English", "Put a space between each directory or file in the name.", true},
+      {"English", "Changing the owner or the rights of a file changes its time.", true},
+      {"French", "Je mange des pommes et des poires.", true},
+      {"French", "Il ouvre le fichier et ferme la fenêtre.", false},
+      {"French", "Il crée le squelette du paquet et il utilise debhelper.", false},
+      {"French", "C'est une idée d'UNIX, et les noyaux de Linux ont développé cette idée.", false},
+  };
+  for (const Case& c : cases) {
+    ZULingSyntacticAnalyzer analyzer(languages_);
+    analyzer.setLanguage(c.language);
+    const std::string structures = describe(analyzer.analyse(c.text));
+    const bool enumeration =
+        structures.find("and") != std::string::npos || structures.find("or2") != std::string::npos;
+    EXPECT_EQ(enumeration, c.enumeration) << c.text << ": " << structures;
+  }
+  // Words of one language that another spells alike call for no gesture there: their
+  // tags are none of the library's.
+  const std::vector<std::string> library =
+      mkbdb::readBehaviorTags(ko::path::findData("zefoko", "behaviors/animations/Stand/Gestures"));
+  ZULingAutomaticTagging tagging(languages_);
+  for (const auto& [language, text, unwanted] :
+       std::vector<std::tuple<std::string, std::string, std::string>>{
+           {"English", "Read the contents of the file.", "content"},
+           {"English", "It works with no file.", "no"},
+           {"English", "No file, no answer.", "no"},
+           {"English", "A non-POSIX shell.", "non"},
+           {"English", "Log in as the super user.", "super"},
+           {"French", "Mettez le plat au four.", "four"},
+       }) {
+    MokutoConfig config;
+    config.msPauseBeforeSpeech = 0;
+    MKTaskInstruction job(1, text, config, Standing);
+    tagging.process(job, language);
+    std::vector<std::string> gestures;
+    for (const auto& action : job.actions) {
+      const std::string& tag = static_cast<const MKAnimationAction&>(*action).tag;
+      if (std::find(library.begin(), library.end(), tag) != library.end())
+        gestures.push_back(tag);
+    }
+    EXPECT_THAT(gestures, ::testing::Not(::testing::Contains(unwanted))) << text;
+  }
+  // The answer "No" shakes the head.
+  MokutoConfig config;
+  config.msPauseBeforeSpeech = 0;
+  MKTaskInstruction answer(1, "No, thank you.", config, Standing);
+  tagging.process(answer, "English");
+  std::vector<std::string> tags;
+  for (const auto& action : answer.actions)
+    tags.push_back(static_cast<const MKAnimationAction&>(*action).tag);
+  EXPECT_THAT(tags, ::testing::Contains("no"));
+}

@@ -6,6 +6,7 @@
 #include "robotsim/zumemory.h"
 #include "robotsim/zumotion.h"
 #include "robotsim/zurobotstate.h"
+#include "robotsim/zutimelineservice.h"
 
 namespace robotsim {
 
@@ -34,6 +35,8 @@ Robot::Robot(RobotOptions options, std::shared_ptr<ZU::ZUBroker> broker)
     options.speech.timeline = fTimeline;
     fSpeech = ZUModule::createModule<ZUTextToSpeech>(fBroker, "ZUTextToSpeech", options.speech);
     fServices.push_back(fSpeech);
+    fServices.push_back(ZUModule::createModule<ZUTimelineService>(
+        fBroker, ZUTimelineService::kServiceName, fTimeline));
   } catch (...) {
     xShutdown();
     throw;

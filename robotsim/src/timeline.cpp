@@ -34,15 +34,32 @@ std::int64_t Timeline::usAt(std::chrono::steady_clock::time_point moment) const 
   return std::chrono::duration_cast<std::chrono::microseconds>(moment - start_).count();
 }
 
+std::int64_t Timeline::originUs() const {
+  std::lock_guard lock(mutex_);
+  return std::chrono::duration_cast<std::chrono::microseconds>(start_.time_since_epoch()).count();
+}
+
 void Timeline::record(std::string service, std::string operation, ko::AnyValue arguments,
                       ko::AnyValue result) {
+  xRecord(std::nullopt, std::move(service), std::move(operation), std::move(arguments),
+          std::move(result));
+}
+
+void Timeline::recordAt(std::int64_t us, std::string service, std::string operation,
+                        ko::AnyValue arguments, ko::AnyValue result) {
+  xRecord(us, std::move(service), std::move(operation), std::move(arguments), std::move(result));
+}
+
+void Timeline::xRecord(std::optional<std::int64_t> us, std::string service, std::string operation,
+                       ko::AnyValue arguments, ko::AnyValue result) {
   TimelineEntry entry;
   std::vector<Listener> listeners;
   {
     std::lock_guard lock(mutex_);
-    entry = TimelineEntry{std::chrono::duration_cast<std::chrono::microseconds>(
-                              std::chrono::steady_clock::now() - start_)
-                              .count(),
+    entry = TimelineEntry{us ? *us
+                             : std::chrono::duration_cast<std::chrono::microseconds>(
+                                   std::chrono::steady_clock::now() - start_)
+                                   .count(),
                           std::move(service), std::move(operation), std::move(arguments),
                           std::move(result)};
     entries_.push_back(entry);

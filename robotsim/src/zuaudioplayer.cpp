@@ -150,44 +150,45 @@ void ZUAudioPlayer::playSoundSetFile(const std::string& soundSet, const std::str
 
 void ZUAudioPlayer::playSoundSetFile(const std::string& soundSet, const std::string& soundFile,
                                      double position, double volume, double balance, bool loop) {
-  if (!std::isfinite(position) || position < 0) {
-    ZU_THROW_ERROR(
-        getName(), "playSoundSetFile",
-        "The position must be a number of seconds from 0, not " + std::to_string(position));
-  }
-  if (!std::isfinite(volume) || !std::isfinite(balance)) {
-    ZU_THROW_ERROR(getName(), "playSoundSetFile", "The volume and balance must be numbers");
-  }
+  const std::string name = soundName(soundFile);
+  // A refused play is on the timeline too, with the reason, before the caller hears of it.
+  const auto refuse = [&](const std::string& reason) {
+    xRecord("playFailed", ko::AnyValue::list({soundSet, name}), reason);
+    ZU_THROW_ERROR(getName(), "playSoundSetFile", reason);
+  };
+  if (!std::isfinite(position) || position < 0)
+    refuse("The position must be a number of seconds from 0, not " + std::to_string(position));
+  if (!std::isfinite(volume) || !std::isfinite(balance))
+    refuse("The volume and balance must be numbers");
   volume = std::clamp(volume, 0.0, 1.0);
   balance = std::clamp(balance, -1.0, 1.0);
 
-  const std::string name = soundName(soundFile);
   const auto task = currentTask();
   double duration = 0;
   std::uint64_t play = 0;
+  std::string refusal;
   {
     std::lock_guard lock(fMutex);
     const auto set = fLoaded.find(soundSet);
     if (set == fLoaded.end()) {
-      ZU_THROW_ERROR(getName(), "playSoundSetFile",
-                     "Sound set " + quoted(soundSet) + " is not loaded");
+      refusal = "Sound set " + quoted(soundSet) + " is not loaded";
+    } else if (const auto file = set->second.files.find(name); file == set->second.files.end()) {
+      refusal = "No sound " + quoted(name) + " in the sound set " + quoted(soundSet);
+    } else {
+      duration = std::max(0.0, file->second.duration - position);
+      // stop(id) sets the task's flag before it looks the play up, so a stop that finds no
+      // play yet is seen here.
+      play = fNextPlay++;
+      fPlays[play] = Play{task ? task->id() : -1, task && task->isStopRequested()};
+      fHistory.emplace_back(
+          play, SoundPlayRecord{soundSet, name, file->second.path, position, volume, balance, loop,
+                                std::chrono::steady_clock::now(), std::nullopt, false});
+      while (fHistory.size() > kHistorySize)
+        fHistory.pop_front();
     }
-    const auto file = set->second.files.find(name);
-    if (file == set->second.files.end()) {
-      ZU_THROW_ERROR(getName(), "playSoundSetFile",
-                     "No sound " + quoted(name) + " in the sound set " + quoted(soundSet));
-    }
-    duration = std::max(0.0, file->second.duration - position);
-    // stop(id) sets the task's flag before it looks the play up, so a stop that finds no
-    // play yet is seen here.
-    play = fNextPlay++;
-    fPlays[play] = Play{task ? task->id() : -1, task && task->isStopRequested()};
-    fHistory.emplace_back(play, SoundPlayRecord{soundSet, name, file->second.path, position, volume,
-                                                balance, loop, std::chrono::steady_clock::now(),
-                                                std::nullopt, false});
-    while (fHistory.size() > kHistorySize)
-      fHistory.pop_front();
   }
+  if (!refusal.empty())
+    refuse(refusal);
   xRecord("playSoundSetFile", ko::AnyValue::list({soundSet, name, volume, balance, loop}),
           duration);
 

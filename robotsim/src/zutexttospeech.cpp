@@ -268,10 +268,13 @@ void ZUTextToSpeech::say(const std::string& text) {
     while (fHistory.size() > kHistorySize)
       fHistory.erase(fHistory.begin());
   }
-  for (const std::size_t index : performance->placedMarks()) {
-    KO_LOG_WARNING(kCategory) << "Text " << id << ": bookmark "
-                              << utterance->script.marks[index].number
-                              << " was not reported by the synthesis; placed by its neighbours";
+  // A stopped text's synthesis gives up before its last bookmarks: nothing to warn about.
+  if (!performance->isCancelled()) {
+    for (const std::size_t index : performance->placedMarks()) {
+      KO_LOG_WARNING(kCategory) << "Text " << id << ": bookmark "
+                                << utterance->script.marks[index].number
+                                << " was not reported by the synthesis; placed by its neighbours";
+    }
   }
   if (state != ko::FutureState::FinishedWithValue)
     ZU_THROW_ERROR(getName(), "say", ended.error());

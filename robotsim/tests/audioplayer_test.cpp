@@ -204,6 +204,11 @@ TEST_F(AudioPlayerService, BadPlaysAreErrors) {
   const int id = proxy_->post_playSoundSetFile("tones", "boop", 0, 1.0, 0, 0);
   EXPECT_FALSE(proxy_->wait(id, kBoundMs));
   EXPECT_TRUE(timeline_->entries("ZUAudioPlayer", "playSoundSetFile").empty());
+  // Each refusal is on the timeline, with its reason.
+  const auto refused = timeline_->entries("ZUAudioPlayer", "playFailed");
+  ASSERT_EQ(refused.size(), std::size(cases) + 1);
+  for (std::size_t k = 0; k < std::size(cases); ++k)
+    EXPECT_THAT(refused[k].result.to<std::string>(), HasSubstr(cases[k].reason));
 }
 
 TEST(StarterSounds, BellsAreShortRealSounds) {

@@ -310,3 +310,6 @@ hundred	determinant/p=hundred
 thousand	determinant/p=thousand
 million	determinant/p=million
 billion	determinant/p=billion
+# The prefix "non" ("non-POSIX") is no word of its own: no base form, so that it calls
+# for no gesture.
+non	adverb/n

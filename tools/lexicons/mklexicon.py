@@ -21,6 +21,7 @@ import glob
 import json
 import os
 import re
+import subprocess
 import sys
 
 # Emotion labels, stored as the base form of a class-4 ("unkonwn") record.
@@ -187,6 +188,11 @@ def english(args):
         analyses.setdefault(word, []).append(
             (0 if closed else 1, -frequency, order[0], word_class, features, base))
 
+    lemmas = set()
+    for pos in WORDNET_CLASSES:
+        with open(os.path.join(wordnet, "index." + pos), encoding="latin-1") as source:
+            lemmas.update(line.split(" ", 1)[0] for line in source if not line.startswith(" "))
+    dropped = []
     frequencies = {}
     for pos, word_class in WORDNET_CLASSES.items():
         with open(os.path.join(wordnet, "index." + pos), encoding="latin-1") as source:
@@ -221,8 +227,13 @@ def english(args):
                                      lemma, frequency)
                     elif frequency > 0 and "-" not in lemma and (
                             syllables(lemma) == 1 or (syllables(lemma) == 2 and lemma.endswith("y"))):
-                        analysis(english_degree(lemma, "er"), word_class, "c", lemma, frequency)
-                        analysis(english_degree(lemma, "est"), word_class, "u", lemma, frequency)
+                        for suffix, features in (("er", "c"), ("est", "u")):
+                            form = english_degree(lemma, suffix)
+                            # A word of its own ("owner" is no degree of "own").
+                            if form in lemmas:
+                                dropped.append((form, lemma))
+                            else:
+                                analysis(form, word_class, features, lemma, frequency)
                 else:
                     analysis(lemma, word_class, "", lemma, frequency)
                     for form in irregular:
@@ -238,7 +249,13 @@ def english(args):
     for word in analyses:
         for _, _, _, word_class, features, base in sorted(analyses[word]):
             lexicon.add(word, word_class, features, base)
-    print("english: %d words" % lexicon.write(args.lexicon), file=sys.stderr)
+    print("english: %d words, %d regular degrees that are words of their own left out"
+          % (lexicon.write(args.lexicon), len(dropped)), file=sys.stderr)
+    with open(args.lexicon + ".fixes", "w", encoding="utf-8") as out:
+        out.write("# Comparatives and superlatives made by the rule that are words of their own\n"
+                  "# in WordNet, left out: FORM<TAB>ADJECTIVE\n")
+        for form, lemma in sorted(dropped):
+            out.write("%s\t%s\n" % (form, lemma))
     write_frequencies(args.frequencies, frequencies)
 
 
@@ -278,10 +295,61 @@ def lefff_clean(text):
     return re.sub(r"__\w+$", "", text)
 
 
+# Invariable categories: a base form other than the word is one of Lefff's spelling
+# normalisations ("vi" -> "oui", "bcp" -> "beaucoup"), not the word's base form.
+LEFFF_INVARIABLE = {"adv", "prep", "coo", "csu", "pres", "advneg"}
+# The possessor of a possessive determiner (Lefff gives them all the base form "son").
+POSSESSIVES = {"P1s": "mon", "P2s": "ton", "P3s": "son", "P1p": "notre", "P2p": "votre",
+               "P3p": "leur"}
+# Words after which a word is read as a noun, or as a verb, when counting how a corpus
+# uses the words that can be both.
+NOUN_CONTEXT = {"le", "la", "les", "l", "un", "une", "des", "du", "de", "d", "ce", "cet",
+                "cette", "ces", "mon", "ma", "mes", "ton", "ta", "tes", "son", "sa", "ses",
+                "notre", "nos", "votre", "vos", "leur", "leurs", "au", "aux", "chaque"}
+VERB_CONTEXT = {"je", "j", "tu", "il", "elle", "on", "nous", "vous", "ils", "elles", "se",
+                "s", "ne", "n", "qui", "me", "m", "te", "t"}
+
+
+def french_corpus(paths):
+    """How often each word form occurs, and how often after a determiner or a subject."""
+    counts, as_noun, as_verb = {}, {}, {}
+    for path in paths:
+        with open(path, encoding="utf-8") as source:
+            for line in source:
+                previous = None
+                for word in re.findall(r"[^\W\d_]+", line.lower()):
+                    counts[word] = counts.get(word, 0) + 1
+                    if previous in NOUN_CONTEXT:
+                        as_noun[word] = as_noun.get(word, 0) + 1
+                    elif previous in VERB_CONTEXT:
+                        as_verb[word] = as_verb.get(word, 0) + 1
+                    previous = word
+    return counts, as_noun, as_verb
+
+
+def french_base_form(form, category, lemma, features, fixes):
+    """Lefff's base form, repaired where it is not the word's; the repairs go to fixes."""
+    fixed = lemma
+    if category in LEFFF_INVARIABLE and lemma != form and " " not in form:
+        fixed = form
+    elif category in ("caimp", "ilimp") and lemma.endswith("imp"):
+        fixed = form
+    elif category == "det" and lemma == "son":
+        possessor = re.search(r"P[123][sp]", features)
+        if possessor:
+            fixed = POSSESSIVES[possessor.group(0)]
+    if fixed != lemma:
+        fixes.add((form, category, lemma, fixed))
+    return fixed
+
+
 def french(args):
     analyses = {}
     frequencies = {}
+    counts, as_noun, as_verb = french_corpus(args.corpus or [])
+    fixes = set()
     order = 0
+    replaced = {ascii_lower(word) for word, _ in read_closed_lexicon(args.fixes)}
     with open(args.lefff, encoding="utf-8") as source:
         for line in source:
             parts = line.rstrip("\n").split("\t")
@@ -289,7 +357,7 @@ def french(args):
                 continue
             form = lefff_clean(parts[0])
             category = parts[1]
-            if form.startswith("_") or not has_letter(form):
+            if form.startswith("_") or not has_letter(form) or ascii_lower(form) in replaced:
                 continue
             words = form.split(" ")
             # A fixed phrase around a coordination or a negation ("pas de") would hide
@@ -298,27 +366,50 @@ def french(args):
                 continue
             word_class, rank = LEFFF_CLASSES[category]
             lemma = lefff_clean(parts[2]).rstrip("?")
-            if lemma in LEFFF_CLASSES or lemma.startswith("_") or not lemma:
+            # Lefff names some base forms after their category ("cln"); "ce" and "que"
+            # are words too.
+            if (lemma in LEFFF_CLASSES and lemma not in ("ce", "que")) or \
+                    lemma.startswith("_") or not lemma:
                 lemma = form
             features = parts[3] if len(parts) > 3 else ""
+            lemma = french_base_form(form, category, lemma, features, fixes)
             if category in LEFFF_NEGATIONS:
                 features = "n" + features
+            key = ascii_lower(form)
             order += 1
-            analyses.setdefault(ascii_lower(form), []).append(
-                (rank, order, word_class, features, lemma))
+            analyses.setdefault(key, []).append((rank, order, word_class, features, lemma))
             if rank < LEFFF_CLOSED_RANK:
                 frequencies[lemma] = CLOSED_CLASS_FREQUENCY
+            else:
+                frequencies[lemma] = frequencies.get(lemma, 0) + counts.get(key, 0)
 
     lexicon = LexiconWriter()
-    for word, records in read_closed_lexicon(args.extra):
-        for word_class, features, base in records:
-            lexicon.add(word, word_class, features, base)
-            if base is not None:
-                frequencies[base] = CLOSED_CLASS_FREQUENCY
-    for word in analyses:
-        for _, _, word_class, features, lemma in sorted(analyses[word]):
+    for path in (args.fixes, args.extra):
+        for word, records in read_closed_lexicon(path):
+            for word_class, features, base in records:
+                lexicon.add(word, word_class, features, base)
+                if base is not None:
+                    frequencies[base] = CLOSED_CLASS_FREQUENCY
+    for word, records in analyses.items():
+        # A noun that is also a verb is read as the noun first unless a corpus uses it
+        # more after a subject than after a determiner ("la base", "une commande", but
+        # "il parle"); a participle only when the corpus uses it more as a noun ("les
+        # données").
+        classes = {r[2] for r in records}
+        participle = any(r[2] == "verb" and re.search("[KG]", r[3]) for r in records)
+        nouns, verbs = as_noun.get(word, 0), as_verb.get(word, 0)
+        if "noun" in classes and "verb" in classes and (
+                nouns > verbs or (nouns == verbs and not participle)):
+            records = [(LEFFF_CLASSES["v"][1] - 0.5,) + r[1:] if r[2] == "noun" else r
+                       for r in records]
+        for _, _, word_class, features, lemma in sorted(records):
             lexicon.add(word, word_class, features, lemma)
-    print("french: %d words" % lexicon.write(args.lexicon), file=sys.stderr)
+    print("french: %d words, %d base forms of Lefff repaired" % (lexicon.write(args.lexicon),
+                                                                 len(fixes)), file=sys.stderr)
+    with open(args.lexicon + ".fixes", "w", encoding="utf-8") as out:
+        out.write("# Base forms of Lefff repaired: WORD<TAB>CATEGORY<TAB>LEFFF'S<TAB>OURS\n")
+        for fix in sorted(fixes):
+            out.write("\t".join(fix) + "\n")
     write_frequencies(args.frequencies, frequencies)
 
 
@@ -376,9 +467,187 @@ def read_ipadic(directory):
 
 
 JAPANESE_CLOSED = {"助詞", "助動詞", "接続詞", "連体詞", "感動詞", "フィラー"}
+# Forms stored as one word although MeCab cuts them: the polite negation, whose "ん"
+# alone would also be the "ん" of "なんです", and the apologies that end with it.
+JAPANESE_WORDS = [("ません", "auxiliary", "n", "ます"),
+                  # Apologies, which would otherwise end with the negation "ません".
+                  ("すみません", "interjection", "", "すみません"),
+                  ("申し訳ありません", "interjection", "", "申し訳ありません"),
+                  ("申し訳ございません", "interjection", "", "申し訳ございません")]
+
+
+def mecab_analyses(dictionary, lines):
+    """MeCab's cut of each line: (surface, pos1, pos2, base form), base form None for an
+    unknown word."""
+    result = subprocess.run(["mecab", "-d", dictionary], input="\n".join(lines) + "\n",
+                            capture_output=True, text=True, check=True)
+    out, current = [], []
+    for line in result.stdout.split("\n"):
+        if line == "EOS":
+            out.append(current)
+            current = []
+        elif "\t" in line:
+            surface, features = line.split("\t", 1)
+            fields = features.split(",")
+            base = fields[6] if len(fields) > 6 and fields[6] != "*" else None
+            current.append((surface, fields[0], fields[1] if len(fields) > 1 else "*", base))
+    return out
+
+
+# The character kinds of the analysis' tokeniser where words are not spaced.
+def is_space(c):
+    o = ord(c)
+    return (c == " " or "\t" <= c <= "\r" or o in (0xA0, 0x1680, 0x2028, 0x2029, 0x202F,
+                                                     0x205F, 0x3000) or 0x2000 <= o <= 0x200B)
+
+
+def is_link(c):
+    return c in "'-\u2019\u2010\u2011"
+
+
+def is_punctuation(c):
+    o = ord(c)
+    if o < 0x80:
+        return ("!" <= c <= "/" or ":" <= c <= "@" or "[" <= c <= "`" or "{" <= c <= "~")
+    return (o in (0xA1, 0xA7, 0xAB, 0xB6, 0xB7, 0xBB, 0xBF, 0x3030, 0x303D, 0x30FB)
+            or 0x2010 <= o <= 0x2027 or 0x2030 <= o <= 0x205E or 0x3001 <= o <= 0x3004
+            or 0x3008 <= o <= 0x3011 or 0x3014 <= o <= 0x301F or 0xFF01 <= o <= 0xFF0F
+            or 0xFF1A <= o <= 0xFF20 or 0xFF3B <= o <= 0xFF40 or 0xFF5B <= o <= 0xFF65)
+
+
+def unknown_run_script(c):
+    o = ord(c)
+    if c.isascii() and c.isalnum():
+        return 1
+    if 0x30A1 <= o <= 0x30FA or 0x30FC <= o <= 0x30FE:
+        return 2
+    if 0xFF10 <= o <= 0xFF19 or 0xFF21 <= o <= 0xFF3A or 0xFF41 <= o <= 0xFF5A:
+        return 3
+    return 0
+
+
+def covered(lower, p, q, stored, longest):
+    """Whether the longest stored word at p ends at q or after it."""
+    for length in range(min(longest, len(lower) - p), q - p - 1, -1):
+        if lower[p:p + length] in stored:
+            return True
+    return False
+
+
+def unspaced_cut(text, stored, longest):
+    """The words of the analysis' cut of text where words are not spaced: (start, end,
+    stored word or None), in characters."""
+    lower = ascii_lower(text)
+    words = []
+    p = 0
+    while p < len(text):
+        c = text[p]
+        if is_space(c) or is_punctuation(c) or is_link(c):
+            p += 1
+            continue
+        script = unknown_run_script(c)
+        if script == 2 and (p == 0 or unknown_run_script(text[p - 1]) != script):
+            q = p + 1
+            while q < len(text) and unknown_run_script(text[q]) == script:
+                q += 1
+            if not covered(lower, p, q, stored, longest):
+                words.append((p, q, None))
+                p = q
+                continue
+        for length in range(min(longest, len(text) - p), 0, -1):
+            if lower[p:p + length] in stored:
+                words.append((p, p + length, lower[p:p + length]))
+                p += length
+                break
+        else:
+            q = p + 1
+            script = unknown_run_script(c)
+            while script and q < len(text) and unknown_run_script(text[q]) == script:
+                q += 1
+            words.append((p, q, None))
+            p = q
+    return words
+
+
+def token_spans(text, tokens):
+    spans, at = [], 0
+    for token in tokens:
+        found = text.find(token[0], at)
+        if found < 0:
+            return None
+        spans.append((found, found + len(token[0])))
+        at = found + len(token[0])
+    return spans
+
+
+def behavior_tags(directory):
+    tags = set()
+    for path in glob.glob(os.path.join(directory, "**", "behavior.json"), recursive=True):
+        with open(path, encoding="utf-8") as source:
+            tags.update(json.load(source).get("tags", []))
+    return tags
+
+
+def choose_japanese_words(surfaces, corpus, report, keep):
+    """The IPADIC surfaces that the longest-prefix cut may take: those that win where
+    MeCab cuts a word as often as they win wrongly (ending inside a MeCab word or running
+    over several), measured on the corpus and again after each removal. The words in
+    keep (gesture tags: "はい", which a written text rarely says) are all kept."""
+    stored = set(surfaces)
+    longest = max(len(w) for w in stored)
+    removed = {}
+    for _ in range(10):
+        good, bad = {}, {}
+        for text, spans in corpus:
+            starts = {s for s, _ in spans}
+            ends = {e for _, e in spans}
+            exact = set(spans)
+            for start, end, word in unspaced_cut(text, stored, longest):
+                if word is None:
+                    continue
+                if (start, end) in exact:
+                    good[word] = good.get(word, 0) + 1
+                elif start in starts:
+                    bad[word] = bad.get(word, 0) + 1
+        losers = {w for w, n in bad.items() if n > good.get(w, 0) and w not in keep}
+        if not losers:
+            break
+        for word in losers:
+            removed[word] = (bad[word], good.get(word, 0))
+        stored -= losers
+    with open(report, "w", encoding="utf-8") as out:
+        out.write("# IPADIC words left out of the Japanese database: they won the longest-prefix\n"
+                  "# cut more often where MeCab cuts otherwise than where it agrees.\n"
+                  "# WORD<TAB>WRONG<TAB>RIGHT\n")
+        for word in sorted(removed):
+            out.write("%s\t%d\t%d\n" % (word, removed[word][0], removed[word][1]))
+    return stored, len(removed)
 
 
 def japanese(args):
+    lines = []
+    for path in args.corpus:
+        with open(path, encoding="utf-8") as source:
+            lines += [line.strip() for line in source if line.strip()]
+    analysed = mecab_analyses(args.mecab_dictionary, lines)
+    corpus = []
+    counts = {}  # (surface, class, base) -> occurrences in MeCab's cut of the corpus
+    base_counts = {}
+    for text, tokens in zip(lines, analysed):
+        spans = token_spans(text, tokens)
+        if spans is None:
+            continue
+        corpus.append((text, spans))
+        for surface, pos1, pos2, base in tokens:
+            word_class = ipadic_class(pos1, pos2)
+            if word_class is None:
+                continue
+            if base is None:
+                continue
+            key = (ascii_lower(surface), word_class, base)
+            counts[key] = counts.get(key, 0) + 1
+            base_counts[base] = base_counts.get(base, 0) + 1
+
     analyses = {}
     # IPADIC's word costs (the lower, the likelier) are comparable within a part of
     # speech only: a base form ranks by the share of its part of speech that is likelier
@@ -389,15 +658,24 @@ def japanese(args):
         if word_class is None or not has_letter(surface):
             continue
         features = "n" if pos1 == "助動詞" and base in JAPANESE_NEGATIONS else ""
-        analyses.setdefault(surface, []).append((cost, word_class, features, base))
-        key = (base, pos1, pos2)
-        best_cost[key] = min(best_cost.get(key, cost), cost)
+        key = ascii_lower(surface)
+        seen = counts.get((key, word_class, base), 0)
+        analyses.setdefault(key, []).append((-seen, cost, word_class, features, base))
+        best = (base, pos1, pos2)
+        best_cost[best] = min(best_cost.get(best, cost), cost)
+
+    stored, removed = choose_japanese_words(analyses, corpus, args.lexicon + ".left-out",
+                                            behavior_tags(args.behaviors))
+    for surface, word_class, features, base in JAPANESE_WORDS:
+        analyses.setdefault(surface, []).insert(0, (-1e9, 0, word_class, features, base))
+        stored.add(surface)
 
     lexicon = LexiconWriter()
-    for word in analyses:
-        for _, word_class, features, base in sorted(analyses[word]):
+    for word in sorted(stored):
+        for _, _, word_class, features, base in sorted(analyses[word]):
             lexicon.add(word, word_class, features, base)
-    print("japanese: %d words" % lexicon.write(args.lexicon), file=sys.stderr)
+    print("japanese: %d words (%d of IPADIC left out)" % (lexicon.write(args.lexicon), removed),
+          file=sys.stderr)
 
     by_pos = {}
     for (base, pos1, pos2), cost in best_cost.items():
@@ -411,7 +689,8 @@ def japanese(args):
             elif pos2 == "固有名詞":
                 score = 0
             else:
-                score = 1 - rank / len(entries)
+                # Seen in the corpus first, by count; then by IPADIC's cost.
+                score = base_counts.get(base, 0) + 1 - rank / len(entries)
             frequencies[base] = max(frequencies.get(base, 0), score)
     write_frequencies(args.frequencies, frequencies)
 
@@ -455,6 +734,9 @@ def english_emotions(args):
         word = single or double
         if word and " " not in word:
             labels[word] = NEGATION
+    for word, records in read_closed_lexicon(args.extra):
+        for _, _, base in records:
+            labels[word] = base
     lexicon = LexiconWriter()
     add_labels(lexicon, labels)
     print("english emotions: %d words" % lexicon.write(args.lexicon), file=sys.stderr)
@@ -469,8 +751,13 @@ def french_emotions(args):
             continue
         polarity = float(entry.get("polarity") or 0)
         intensity = float(entry.get("intensity") or 1)
+        # Words of little subjectivity ("données", "autres", "physique") carry no
+        # emotion, whatever their polarity.
+        subjectivity = float(entry.get("subjectivity") or 0)
         if entry.get("pos") == "RB" and intensity >= 1.5:
             labels[word] = STRONG_ADVERB
+        elif subjectivity < 0.4:
+            continue
         elif polarity >= 0.75:
             labels[word] = VERY_POSITIVE
         elif polarity >= 0.1:
@@ -479,9 +766,25 @@ def french_emotions(args):
             labels[word] = VERY_NEGATIVE
         elif polarity <= -0.1:
             labels[word] = NEGATIVE
+    wanted, exact = {}, {}
     for word, records in read_closed_lexicon(args.extra):
         for _, _, base in records:
-            labels[word] = base
+            if word.startswith("="):
+                exact[word[1:]] = base
+            else:
+                wanted[word] = base
+    # The forms of the listed base forms, from Lefff.
+    forms = {word: label for word, label in wanted.items()}
+    with open(args.lefff, encoding="utf-8") as source:
+        for line in source:
+            parts = line.split("\t", 3)
+            if len(parts) >= 3 and " " not in parts[0]:
+                lemma = lefff_clean(parts[2])
+                if lemma in wanted:
+                    forms.setdefault(ascii_lower(lefff_clean(parts[0])), wanted[lemma])
+    labels.update(forms)
+    labels.update(exact)
+    labels = {word: label for word, label in labels.items() if label != "none"}
     lexicon = LexiconWriter()
     add_labels(lexicon, labels)
     print("french emotions: %d words" % lexicon.write(args.lexicon), file=sys.stderr)
@@ -517,9 +820,19 @@ def main():
     command = commands.add_parser("french")
     command.add_argument("--lefff", required=True)
     command.add_argument("--extra", required=True)
+    command.add_argument("--fixes", required=True,
+                         help="words whose records replace Lefff's, with their reasons")
+    command.add_argument("--corpus", action="append",
+                         help="a French text: how often words occur orders the base forms")
     command.set_defaults(run=french)
     command = commands.add_parser("japanese")
     command.add_argument("--ipadic", required=True)
+    command.add_argument("--mecab-dictionary", required=True,
+                         help="MeCab's compiled IPADIC (UTF-8), whose cut is the reference")
+    command.add_argument("--corpus", action="append", required=True,
+                         help="a text, one sentence a line")
+    command.add_argument("--behaviors", required=True,
+                         help="the behaviour library, whose tags are all kept")
     command.set_defaults(run=japanese)
     for name in ("english", "french", "japanese"):
         commands.choices[name].add_argument("--frequencies", required=True)
@@ -527,10 +840,12 @@ def main():
     command = commands.add_parser("english-emotions")
     command.add_argument("--vader-lexicon", required=True)
     command.add_argument("--vader-source", required=True)
+    command.add_argument("--extra", required=True)
     command.set_defaults(run=english_emotions)
     command = commands.add_parser("french-emotions")
     command.add_argument("--pattern", required=True)
     command.add_argument("--extra", required=True)
+    command.add_argument("--lefff", required=True)
     command.set_defaults(run=french_emotions)
     command = commands.add_parser("japanese-emotions")
     command.add_argument("--list", required=True)

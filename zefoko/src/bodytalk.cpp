@@ -154,8 +154,17 @@ void addBodyTalkCommand(CLI::App& app, int& status) {
       "bodytalk",
       "Run the speaking body talk on the simulated robot and print its head moves and arm "
       "animations");
-  command->add_option("--seconds", options->seconds, "How long it runs")
-      ->check(CLI::PositiveNumber)
+  command->add_option("--seconds", options->seconds, "How long it runs, above 0 and at most 3600")
+      ->check(CLI::Validator(
+          [](const std::string& value) {
+            double seconds = 0;
+            return CLI::detail::lexical_cast(value, seconds) && seconds > 0 && seconds <= 3600
+                       ? std::string()
+                       : value +
+                             " is not a number of seconds above 0 and at "
+                             "most 3600";
+          },
+          "SECONDS"))
       ->capture_default_str();
   command->add_option("--posture", options->posture, "The robot's posture family")
       ->check(CLI::IsMember({"Standing", "Sitting", "SittingOnChair"}))

@@ -5,12 +5,16 @@
 
 namespace zefoko {
 
-// zefoko speak [--wav FILE] [--timing] [--fast] [--language L] [--json] [TEXT]
+// zefoko speak [--wav FILE] [--speech espeak|timing] [--fast] [--language L] [--json] [TEXT]
 void addSpeakCommand(CLI::App& app, int& status);
 // zefoko bodytalk [--seconds N] [--posture Standing|Sitting|SittingOnChair] [--json]
 void addBodyTalkCommand(CLI::App& app, int& status);
-// zefoko serve [--speech espeak|timing] [--posture P] [--http ADDRESS:PORT [--http-token T]]
-//              MODULE.so...
+// zefoko serve [--speech espeak|timing] [--fast] [--posture P] [--listen E | --connect E]
+//              [--heartbeat MS] [--max-message BYTES] [--secret-key F] [--client-key F]...
+//              [--server-key F] [--http ADDRESS:PORT [--http-token T]]
+//              [MODULE.so...]
 void addServeCommand(CLI::App& app, int& status);
+// zefoko keys DIR [--name NAME] [--force]
+void addKeysCommand(CLI::App& app, int& status);
 
 }  // namespace zefoko

@@ -436,16 +436,20 @@ void HttpServer::xEval(const httplib::Request& req, httplib::Response& res) {
 
 namespace zefoko {
 
-void addHttpOptions(CLI::App& command, HttpCommandOptions& options) {
-  command
-      .add_option("--http", options.address,
-                  "Serve the modules' pages, their calls and the live page of the robot over "
-                  "HTTP at ADDRESS:PORT (port 0: any free one); loopback unless a token is given")
-      ->type_name("ADDRESS:PORT");
+CLI::Option* addHttpOptions(CLI::App& command, HttpCommandOptions& options) {
+  CLI::Option* http =
+      command
+          .add_option("--http", options.address,
+                      "Serve the modules' pages, their calls and the live page of the robot over "
+                      "HTTP at ADDRESS:PORT (port 0: any free one); loopback unless a token is "
+                      "given (default: none)")
+          ->type_name("ADDRESS:PORT");
   command
       .add_option("--http-token", options.token,
                   "The token that every HTTP request must carry (?token= once, then a cookie)")
-      ->type_name("TOKEN");
+      ->type_name("TOKEN")
+      ->needs(http);
+  return http;
 }
 
 std::unique_ptr<HttpServer> startHttpServer(Host& host, const HttpCommandOptions& options,

@@ -83,7 +83,8 @@ struct HttpCommandOptions {
   std::string address;  // empty: no server
   std::string token;
 };
-void addHttpOptions(CLI::App& command, HttpCommandOptions& options);
+// Answers the --http option.
+CLI::Option* addHttpOptions(CLI::App& command, HttpCommandOptions& options);
 // The server those options ask for, its address told on `out`; null when they ask for
 // none. Raises HttpError.
 std::unique_ptr<HttpServer> startHttpServer(Host& host, const HttpCommandOptions& options,

@@ -2,6 +2,7 @@
 // robot, prints the timeline of what happened, and can write the speech to a WAV file.
 #include <iostream>
 #include <iterator>
+#include <optional>
 #include <string>
 
 #include "commands.h"
@@ -14,19 +15,19 @@ namespace zefoko {
 namespace {
 
 struct SpeakOptions {
-  std::string text;
+  std::optional<std::string> text;
   std::string wav;
   std::string language = "English";
-  bool timing = false;
+  std::string speech = "espeak";
   bool fast = false;
   bool json = false;
 };
 
-int speak(const SpeakOptions& o) {
+int speak(const SpeakOptions& o, const std::string& text) {
   robotsim::RobotOptions options;
   options.speech.language = o.language;
   options.speech.notifications = true;
-  if (o.timing)
+  if (o.speech == "timing")
     options.speech.backend = robotsim::ZUTextToSpeechOptions::Backend::Timing;
   if (o.fast)
     options.speech.playbackRate = robotsim::kSpeechAsFastAsPossible;
@@ -34,7 +35,7 @@ int speak(const SpeakOptions& o) {
     robotsim::Robot robot(options);
     ZU::ZUTextToSpeechProxy tts(robot.broker());
     robot.timeline()->clear();
-    const int id = tts.post_say(o.text);
+    const int id = tts.post_say(text);
     tts.wait(id, 0);
     if (o.json) {
       robot.timeline()->writeJsonLines(std::cout);
@@ -65,20 +66,28 @@ void addSpeakCommand(CLI::App& app, int& status) {
       "Speak a bookmarked text on the simulated robot and print the timeline of its events");
   command->add_option("text", options->text,
                       "The text, with \\mrk=N\\, \\mrkpause=N\\ and \\pau=N\\ tags; read from "
-                      "standard input when absent");
-  command->add_option("--wav", options->wav, "Write the speech to this WAV file");
-  command->add_option("--language", options->language, "The speech language")
+                      "standard input when absent or \"-\"");
+  command->add_option("--wav", options->wav, "Write the speech to this WAV file")
+      ->type_name("FILE");
+  command->add_option("--language", options->language, "The speech engine's language")
+      ->check(CLI::IsMember({"English", "French", "Japanese"}))
       ->capture_default_str();
-  command->add_flag("--timing", options->timing,
-                    "Estimate durations from the text instead of synthesising speech");
-  command->add_flag("--fast", options->fast, "Play as fast as possible instead of in real time");
+  command
+      ->add_option("--speech", options->speech,
+                   "The speech engine: espeak (real speech) or timing (durations estimated "
+                   "from the text, no audio)")
+      ->check(CLI::IsMember({"espeak", "timing"}))
+      ->capture_default_str();
+  command->add_flag("--fast", options->fast,
+                    "Play as fast as possible instead of in real time (default: real time)");
   command->add_flag("--json", options->json, "Print the timeline as JSON lines");
   command->callback([options, &status] {
-    if (options->text.empty()) {
-      options->text.assign(std::istreambuf_iterator<char>(std::cin),
-                           std::istreambuf_iterator<char>());
-    }
-    status = speak(*options);
+    std::string text;
+    if (options->text && *options->text != "-")
+      text = *options->text;
+    else
+      text.assign(std::istreambuf_iterator<char>(std::cin), std::istreambuf_iterator<char>());
+    status = speak(*options, text);
   });
 }
 

@@ -150,6 +150,10 @@ class DynamicObject {
 
   // ---- the object's interface, for callers and for subclasses to override ----
 
+  // Whether the object stands for a service of another process: its calls answer futures
+  // that finish when the answer comes, and never need a thread of an event loop.
+  virtual bool isRemote() const { return false; }
+
   // 1: the member table published last; the reference stays valid for the object's life.
   virtual const MetaObject& metaObject() const;
   // 2: calls a method by id. Direct (and Auto) run it in the calling thread and answer a

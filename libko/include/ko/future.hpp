@@ -114,6 +114,22 @@ class FutureSharedState {
     return true;
   }
 
+  // As finish(), unless continuations are attached (they would run in this thread):
+  // answers false then, or when the state has finished, and leaves the arguments.
+  bool finishWithoutContinuations(FutureState state, std::optional<Stored>& value,
+                                  std::string& error) {
+    {
+      std::lock_guard lock(mutex_);
+      if (state_ != FutureState::Running || !callbacks_.empty())
+        return false;
+      state_ = state;
+      value_ = std::move(value);
+      error_ = std::move(error);
+    }
+    cv_.notify_all();
+    return true;
+  }
+
   // Runs `cb` when the state finishes, at once (in this thread) if it already has.
   void onFinished(std::function<void()> cb) {
     {
@@ -323,6 +339,18 @@ class Promise {
   void setValue() requires std::is_void_v<T> { setValue(Stored{}); }
   void setError(std::string error) { check(trySetError(std::move(error))); }
   void setCanceled() { check(state_ && state_->finish(FutureState::Canceled, std::nullopt, {})); }
+
+  // Settle the future in this thread unless continuations are attached to it (which would
+  // run in this thread): answer false then (or when it has finished) and leave the
+  // argument, for the caller to settle it in another thread.
+  bool trySetValueWithoutContinuations(std::optional<Stored>& value) {
+    std::string none;
+    return state_ && state_->finishWithoutContinuations(FutureState::FinishedWithValue, value, none);
+  }
+  bool trySetErrorWithoutContinuations(std::string& error) {
+    std::optional<Stored> none;
+    return state_ && state_->finishWithoutContinuations(FutureState::FinishedWithError, none, error);
+  }
 
   // Like the above, but answer false instead of throwing.
   bool trySetValue(Stored value) {

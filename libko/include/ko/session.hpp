@@ -2,8 +2,12 @@
 // The registry of named services of a process, and the lookup of a service by name.
 //
 // Services are registered under unique names and found by name, in the "local" scope
-// (this process) or in any scope (""); only the local scope exists for now. All functions
-// are thread-safe.
+// (this process) or in any scope (""). A session may link its process with others
+// (ko/remote.hpp, docs/protocol.md): one session listens on an endpoint and keeps the
+// directory of services of every process linked with it, the others connect to it; then
+// the scope "" finds the services of every process, a service registered here is
+// published in the directory under a name unique in it, and withdrawn when it is
+// unregistered or its process ends. All functions are thread-safe.
 //
 // The signals announce the registrations and withdrawals one at a time, in the order they
 // were made, outside the session's lock (a subscriber may use the session). Each is
@@ -12,6 +16,7 @@
 // announcement has been made, except when called from a subscriber (then it follows when
 // the subscriber returns).
 
+#include <chrono>
 #include <condition_variable>
 #include <cstdint>
 #include <deque>
@@ -26,9 +31,14 @@
 
 #include "ko/anyvalue.hpp"
 #include "ko/future.hpp"
+#include "ko/remote.hpp"
 #include "ko/signal.hpp"
 
 namespace ko {
+
+namespace detail {
+class RemoteNode;
+}
 
 class Session {
  public:
@@ -58,6 +68,26 @@ class Session {
 
   void setLookupHook(LookupHook hook);
 
+  // ---- links with other processes ----
+  // Listens on `endpoint` ("tcp://HOST:PORT", "tcp://127.0.0.1:*" for a port of the
+  // system's choice, "ipc://PATH") and keeps the directory; answers the endpoint bound.
+  // Connects to the session listening on `endpoint`, now and again whenever its process
+  // comes back; the link is made in the background (waitForLink). Both raise ko::Error
+  // for an endpoint that cannot be used, one that reaches the network without CURVE keys,
+  // or a session already linked.
+  std::string listen(const std::string& endpoint, RemoteOptions options = {});
+  void connect(const std::string& endpoint, RemoteOptions options = {});
+  // Ends the link; the other processes' services leave this one, calls to them fail.
+  void closeLink();
+  // Listening, or connected and welcomed by the listening process.
+  bool isLinked() const;
+  bool waitForLink(std::chrono::milliseconds bound) const;
+  // Called in a framework thread with true each time the link is made (again after the
+  // listening process came back), false when it is lost.
+  void setLinkListener(std::function<void(bool)> listener);
+  // The names of every service of the directory (this process's alone when unlinked).
+  Future<std::vector<std::string>> directory() const;
+
   Signal<unsigned, std::string> serviceRegistered;    // (id, name)
   Signal<unsigned, std::string> serviceUnregistered;  // (id, name)
 
@@ -82,6 +112,8 @@ class Session {
   std::map<unsigned, std::string> byId_;
   unsigned nextId_ = 1;
   LookupHook hook_;
+  std::shared_ptr<detail::RemoteNode> remote_;  // under mutex_
+  std::mutex linkMutex_;                        // listen, connect and closeLink, one at a time
 
   std::mutex announceMutex_;  // after mutex_
   std::condition_variable announced_;

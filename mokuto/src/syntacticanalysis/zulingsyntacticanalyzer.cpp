@@ -28,6 +28,15 @@ constexpr std::array<std::string_view, 8> kAndWords = {"and",  "et",     "と", 
 constexpr std::array<std::string_view, 10> kOrWords = {
     "or", "ou", "か", "または", "又は", "あるいは", "或いは", "もしくは", "若しくは", "それとも"};
 constexpr std::array<std::string_view, 3> kParticles = {"と", "や", "か"};
+// The agent of a passive: "run by dpkg".
+constexpr std::array<std::string_view, 2> kAgentWords = {"by", "par"};
+// Determiners that are also the preposition "de": they follow nouns as often as verbs.
+constexpr std::array<std::string_view, 4> kPartitives = {"d", "de", "du", "des"};
+// Words that begin an indirect question or a relative clause.
+constexpr std::array<std::string_view, 10> kQuestionWords = {
+    "how", "why", "what", "whether", "comment", "pourquoi", "combien", "quoi", "lorsque", "quand"};
+constexpr std::array<std::string_view, 9> kRelativeWords = {
+    "that", "which", "who", "whom", "whose", "qui", "que", "dont", "où"};
 constexpr std::array<std::string_view, 4> kItemSeparators = {",", "、", "，", "､"};
 
 template <std::size_t N>
@@ -130,11 +139,12 @@ bool isAsciiAlnum(char32_t c) noexcept {
 }
 
 // The scripts whose unknown runs stay one chunk where words are not spaced.
+constexpr int kKatakana = 2;
 int unknownRunScript(char32_t c) noexcept {
   if (isAsciiAlnum(c))
     return 1;
   if ((c >= 0x30A1 && c <= 0x30FA) || (c >= 0x30FC && c <= 0x30FE))
-    return 2;  // katakana and the prolonged sound mark
+    return kKatakana;  // and the prolonged sound mark
   if ((c >= 0xFF10 && c <= 0xFF19) || (c >= 0xFF21 && c <= 0xFF3A) || (c >= 0xFF41 && c <= 0xFF5A))
     return 3;  // full-width letters and digits
   return 0;
@@ -149,7 +159,8 @@ int unknownRunScript(char32_t c) noexcept {
 // next space, punctuation or link, is one unknown word. Numbers follow the digit rule.
 // Where words are not spaced (flag 0), the stored word is taken wherever it ends, and
 // unknown text is cut by character, except runs of latin letters and digits, of katakana
-// or of full-width letters, which stay whole.
+// or of full-width letters, which stay whole. A katakana run is a written word of its
+// own: a stored word counts there only when it ends with the run or after it.
 class Cutter {
  public:
   Cutter(const ZULingSyntacticAnalyzerBinaryDatabase* database, std::string_view text,
@@ -278,23 +289,35 @@ class Cutter {
   std::size_t xUnspacedWord(std::size_t p, std::size_t end, CodePoint cp) {
     std::optional<std::uint32_t> node;
     const std::size_t stored = xLongestStored(p, end, node);
+    // A run of katakana is written as one word: a stored word that ends inside it does
+    // not count ("プロンプト" although "プロ" is stored, "ファイルシステム").
+    const int script = unknownRunScript(cp.value);
+    if (script == kKatakana && p >= fRunEnd) {
+      fRunEnd = xRunEnd(p, end, script);
+      if (p + stored < fRunEnd) {
+        xPushWord(p, fRunEnd, std::nullopt);
+        return fRunEnd;
+      }
+    }
     if (stored > 0 &&
         (p + stored == end || (static_cast<unsigned char>(fText[p + stored]) & 0xC0) != 0x80)) {
       xPushWord(p, p + stored, node);
       return p + stored;
     }
-    std::size_t q = p + cp.length;
-    if (const int script = unknownRunScript(cp.value); script != 0) {
-      while (q < end) {
-        const CodePoint next = decode(fText.substr(0, end), q);
-        if (unknownRunScript(next.value) != script)
-          break;
-        q += next.length;
-      }
-    }
+    const std::size_t q = script != 0 ? xRunEnd(p, end, script) : p + cp.length;
     // Not stored: a stored word would have been the longest prefix.
     xPushWord(p, q, std::nullopt);
     return q;
+  }
+
+  std::size_t xRunEnd(std::size_t p, std::size_t end, int script) const {
+    while (p < end) {
+      const CodePoint next = decode(fText.substr(0, end), p);
+      if (unknownRunScript(next.value) != script)
+        break;
+      p += next.length;
+    }
+    return p;
   }
 
   void xPush(std::size_t begin, std::size_t end, ZULingWordClass wordClass) {
@@ -328,6 +351,8 @@ class Cutter {
   std::string_view fLower;
   std::vector<Chunk>& fChunks;
   bool fSpaced;
+  // The end of the last run of one script that was checked, where words are not spaced.
+  std::size_t fRunEnd = 0;
 };
 
 // ---- structures --------------------------------------------------------------------
@@ -394,8 +419,11 @@ struct Token {
   bool particle = false;
   // The word lowercased, in the builder's buffer.
   std::string_view lower;
-  std::uint32_t records = 0;  // bit per word class the word has
-  bool infinitive = false;    // a verb record of the infinitive
+  std::uint32_t records = 0;                        // bit per word class the word has
+  ZULingWordClass firstClass = WORD_CLASS_UNKNOWN;  // the class of its first record
+  bool infinitive = false;                          // a verb record of the infinitive
+  bool participle = false;                          // a verb record of a participle
+  bool negativeDeterminer = false;                  // a determiner record of negation ("no")
 
   bool has(ZULingWordClass wordClass) const noexcept { return (records >> wordClass) & 1u; }
 };
@@ -467,11 +495,18 @@ class StructureBuilder {
         fLower += lowerByte(b);
       token.lower = std::string_view(fLower).substr(from);
       token.role = roleOfClass(wordClass);
+      token.firstClass = wordClass;
       for (const ZULingClassFeatures& record : chunk.classes) {
         if (record.wordClass >= 0 && record.wordClass < 32)
           token.records |= 1u << record.wordClass;
         if (record.wordClass == WORD_CLASS_VERB && record.features.find('W') != std::string::npos)
           token.infinitive = true;
+        if (record.wordClass == WORD_CLASS_VERB &&
+            record.features.find_first_of("KG") != std::string::npos)
+          token.participle = true;
+        if (record.wordClass == WORD_CLASS_DETERMINANT &&
+            record.features.find('n') != std::string::npos)
+          token.negativeDeterminer = true;
       }
       if (kCoordinationFirstBytes[static_cast<unsigned char>(token.lower[0])]) {
         if (isOneOf(token.lower, kAndWords))
@@ -554,6 +589,10 @@ class StructureBuilder {
             !next.has(WORD_CLASS_NOUN) && !next.has(WORD_CLASS_ADJECTIVE))
           role = Role::Clitic;
       }
+      // The answer "No." or "No, ..." rather than the determiner of "no file".
+      if (role == Role::Determiner && token.negativeDeterminer &&
+          token.has(WORD_CLASS_INTERJECTION) && !xIsWord(t + 1))
+        role = Role::Interjection;
       token.role = role;
       verbContext = role == Role::Pronoun || role == Role::Auxiliary || role == Role::Clitic ||
                     (verbContext && role == Role::Adverb);
@@ -649,6 +688,10 @@ class StructureBuilder {
           break;
         }
         default: {
+          // A determiner of negation ("with no file") belongs to no group: it asks for
+          // no gesture of its own, the head shake being the answer "No."'s.
+          if (token.role == Role::Determiner && token.negativeDeterminer)
+            break;
           // Nominal words. Where words are spaced, a determiner or a pronoun after a
           // noun or pronoun, or a word after a pronoun, begins another group.
           bool same = currentKind() == STRUCTURE_NOMINAL;
@@ -712,10 +755,11 @@ class StructureBuilder {
 
   // Coordinations: around each "and" or "or" word, the item after it (more items after
   // further same words) and the items before it, separated by commas or by the same
-  // word ("apples, pears and plums", "A と B と C"); all items are groups of one kind,
-  // nominal groups ending in a noun or pronoun for the Japanese particles. Items begin with a
-  // preposition only when the last one does; otherwise a preposition ends the list. A pronoun after
-  // the word that begins a clause ("I like tea and he likes coffee") coordinates nothing.
+  // word ("apples, pears and plums", "A と B と C"). The items are things: nominal
+  // groups, all ending in an adjective or all in another word, and in a noun or pronoun
+  // for the Japanese particles. Items begin with a preposition only when the last one
+  // does; otherwise a preposition ends the list. Verbs and clauses joined by the word
+  // coordinate nothing (see xStartsClause).
   std::vector<Structure> xCoordinations() {
     std::vector<Structure> structures;
     std::vector<bool> consumed(fTokens.size(), false);
@@ -727,25 +771,32 @@ class StructureBuilder {
       Item item{};
       if (!xItemAt(c + 1, item))
         continue;
+      // Things only: verbs joined by the word ("read, write and remove") are actions,
+      // and make no enumeration.
       const ZULingStructureKind kind = fGroups[item.group].kind;
-      if (word.particle && !xNounHeaded(item.group))
+      if (kind != STRUCTURE_NOMINAL || (word.particle && !xNounHeaded(item.group)))
         continue;
+      const bool adjectives = fGroups[item.group].lastRole == Role::Adjective;
+      const auto sameKind = [&](std::size_t g) {
+        return fGroups[g].kind == kind && (fGroups[g].lastRole == Role::Adjective) == adjectives &&
+               (!word.particle || xNounHeaded(g));
+      };
       after.push_back(item);
       std::vector<std::size_t> words{c};
       for (std::size_t k = fGroups[item.group].lastToken + 1;
            xIsWord(k) && fTokens[k].coordination == word.coordination && xItemAt(k + 1, item) &&
-           fGroups[item.group].kind == kind && (!word.particle || xNounHeaded(item.group));
+           sameKind(item.group);
            k = fGroups[item.group].lastToken + 1) {
         words.push_back(k);
         after.push_back(item);
       }
       std::vector<Item> before;
       std::size_t end = c;
-      if (end > 0 && fTokens[end - 1].type == Token::Comma && fSpaced)
+      const bool commaBefore = end > 0 && fTokens[end - 1].type == Token::Comma && fSpaced;
+      if (commaBefore)
         --end;  // "apples, pears, and plums"
       const bool prepositions = after.front().firstToken != fGroups[after.front().group].firstToken;
-      while (end > 0 && xItemBefore(end - 1, item) && fGroups[item.group].kind == kind &&
-             (!word.particle || xNounHeaded(item.group))) {
+      while (end > 0 && xItemBefore(end - 1, item) && sameKind(item.group)) {
         if (item.firstToken != fGroups[item.group].firstToken && !prepositions) {
           // "for example apples, pears and plums": the preposition leads the list.
           item.firstToken = fGroups[item.group].firstToken;
@@ -769,7 +820,7 @@ class StructureBuilder {
       }
       if (before.empty())
         continue;
-      if (fSpaced && xStartsClause(after.front(), before.back()))
+      if (fSpaced && xStartsClause(after.front(), before.back(), commaBefore, before.size()))
         continue;
       for (std::size_t w : words)
         consumed[w] = true;
@@ -798,24 +849,84 @@ class StructureBuilder {
            (group.lastRole == Role::Noun || group.lastRole == Role::Pronoun);
   }
 
-  // A lone pronoun after the coordinating word, followed by a verb, while the first
-  // item follows a verb or a preposition: two clauses, not a list ("I like tea and he
-  // likes coffee", "I was born in Paris and I was happy").
-  bool xStartsClause(const Item& right, const Item& firstLeft) const {
+  // Two clauses, not a list, where the group after the coordinating word
+  // - begins with a question word ("learn how it works and how you can help");
+  // - is a lone word that can be a verb followed by its object, an adverb or "by", a
+  //   participle followed by a preposition, a lone word that is first a verb followed by
+  //   a preposition where the first item follows a verb, or an unknown word followed by
+  //   an object pronoun or a determiner: a second action ("type your name and press the
+  //   Enter key", "put in the archive and run by dpkg", "provided by the team and sent
+  //   to the list", "it does more and comes with examples", "unpack it and repack it");
+  // - begins with a verb that is first a verb, when the first item follows a verb ("copy
+  //   the files and run the tool");
+  // - or is a subject, followed by a verb (after a comma, past its prepositional
+  //   groups) and without a preposition before it, while the first item does not begin a
+  //   clause ("the skeleton of our package and it uses debhelper", "in the patches
+  //   directory and the source tree is untouched"), or the first item follows a verb or
+  //   a preposition ("I like tea and he likes coffee", "I was born in
+  //   Paris and I was happy", "it has packages for most programs, and the number of
+  //   packages is larger"), or stands alone before a comma ("there is one disk, and
+  //   everything is there"; but "apples, pears, and plums are ripe" stays a list).
+  bool xStartsClause(const Item& right, const Item& firstLeft, bool commaBefore,
+                     std::size_t leftItems) const {
     const Group& group = fGroups[right.group];
-    if (group.firstToken != group.lastToken || fTokens[group.firstToken].role != Role::Pronoun)
-      return false;
+    const Token& lone = fTokens[group.firstToken];
+    if (isOneOf(lone.lower, kQuestionWords))
+      return true;
     const std::size_t next = group.lastToken + 1;
-    if (next >= fTokens.size() || fGroupOfToken[next] == kNone ||
-        fGroups[fGroupOfToken[next]].kind != STRUCTURE_VERB)
+    if (next >= fTokens.size() || fTokens[next].type != Token::Word)
       return false;
     const std::size_t previous = firstLeft.firstToken;
-    if (previous == 0)
-      return false;
-    if (xIsPreposition(previous - 1))
+    const bool beginsClause = previous == 0 || xBeginsClause(previous - 1);
+    const bool afterVerb = previous > 0 && fGroupOfToken[previous - 1] != kNone &&
+                           fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB;
+    const Role after = fTokens[next].role;
+    const bool single = group.firstToken == group.lastToken;
+    const bool canBeVerb = lone.has(WORD_CLASS_VERB) || lone.has(WORD_CLASS_AUXILIARY);
+    const bool objectAfter = after == Role::Pronoun || after == Role::Clitic;
+    // "copy the files and run the tool": a verb first, before its object.
+    if (!single && afterVerb && lone.firstClass == WORD_CLASS_VERB && lone.infinitive)
       return true;
-    return fGroupOfToken[previous - 1] != kNone &&
-           fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB;
+    if (single && ((canBeVerb && (objectAfter || after == Role::Determiner || after == Role::Noun ||
+                                  after == Role::Adverb || after == Role::Adjective ||
+                                  isOneOf(fTokens[next].lower, kAgentWords))) ||
+                   (after == Role::Preposition &&
+                    (lone.participle || (lone.firstClass == WORD_CLASS_VERB && afterVerb))) ||
+                   (lone.firstClass == WORD_CLASS_UNKNOWN &&
+                    (objectAfter ||
+                     (after == Role::Determiner && !isOneOf(fTokens[next].lower, kPartitives))))))
+      return true;
+    // The verb of a subject; after a comma, past its prepositional groups ("the number of
+    // packages in the archive is"), which without a comma would rather belong to the
+    // list ("changing its owner or its rights of a file changes").
+    std::size_t k = next;
+    while (commaBefore && k < fTokens.size() && fTokens[k].type == Token::Word &&
+           (fTokens[k].role == Role::Preposition || fTokens[k].role == Role::Adverb ||
+            ((fTokens[k].role == Role::Noun || fTokens[k].role == Role::Determiner ||
+              fTokens[k].role == Role::Adjective) &&
+             !isOneOf(fTokens[k].lower, kRelativeWords))))
+      ++k;
+    if (k >= fTokens.size() || fGroupOfToken[k] == kNone ||
+        fGroups[fGroupOfToken[k]].kind != STRUCTURE_VERB)
+      return false;
+    // A subject has no preposition before it ("of books and of documents are", "de
+    // livres et de documents sont").
+    if (right.firstToken != group.firstToken || lone.lower == "de" || lone.lower == "d")
+      return false;
+    if (k == next && !beginsClause)
+      return true;
+    if (commaBefore && leftItems == 1)
+      return true;
+    return afterVerb || (previous > 0 && xIsPreposition(previous - 1));
+  }
+
+  // Whether a clause may begin after token t: a comma, a mark other than a slash
+  // ("debian/patches"), a subordinating or coordinating word ("although").
+  bool xBeginsClause(std::size_t t) const {
+    const Token& token = fTokens[t];
+    if (token.type != Token::Word)
+      return token.type == Token::Comma || fChunks[token.chunk].text != "/";
+    return token.role == Role::Subordinator || token.role == Role::Conjunction;
   }
 
   Structure xGroupStructure(const Group& group) const {

@@ -130,6 +130,13 @@ struct Candidate {
   std::size_t chunk;
 };
 
+// Where a bookmark goes: before a chunk, or, when pauseSplit is above 0, inside the
+// pause chunk, before its last pauseSplit milliseconds.
+struct InsertionPoint {
+  std::size_t chunk;
+  std::int64_t pauseSplit;
+};
+
 class TagInsertion {
  public:
   TagInsertion(ZULingSyntacticAnalysis& analysis, MKTaskInstruction& job)
@@ -165,19 +172,35 @@ class TagInsertion {
     }
   }
 
+  // Inserts a bookmark per candidate. Where the bookmarks go ahead of their words, a
+  // bookmark that the move back would bring within the window of speech after a
+  // caller's gesture or blocking sound stays before its word instead, where the
+  // look-back accepted it.
   void insertCandidates() {
     const bool ahead = fDatabase && fDatabase->flag != 0;
     // A bookmark per candidate, and a split pause at most.
     fChunks.reserve(2 * fCandidates.size());
     for (Candidate& candidate : fCandidates) {
+      InsertionPoint at{candidate.chunk, 0};
+      if (ahead) {
+        at = xMoveBack(candidate.chunk, ZULingSyntacticAnalyzerTagger::kWindowMs);
+        if (!xLookBackAccepts(at))
+          at = {candidate.chunk, 0};
+      }
       auto action = std::make_shared<MKAnimationAction>(AUTO_START_TAG);
       action->text = "AUTO_START_TAG(" + candidate.tag + ")";
       action->tag = std::move(candidate.tag);
       fJob.addAction(action);
-      const std::size_t at =
-          ahead ? xMoveBack(candidate.chunk, ZULingSyntacticAnalyzerTagger::kWindowMs)
-                : candidate.chunk;
-      fChunks.insertBefore(at, tagChunk("mrk", action->id));
+      std::size_t before = at.chunk;
+      if (at.pauseSplit > 0) {
+        // The pause ends with the part that is left before the word.
+        const ZULingSpeechTag pause = lingSpeechTag(fChunks[at.chunk]);
+        if (pause.value > at.pauseSplit) {
+          fChunks[at.chunk] = tagChunk("pau", pause.value - at.pauseSplit);
+          before = fChunks.insertAfter(at.chunk, tagChunk("pau", at.pauseSplit));
+        }
+      }
+      fChunks.insertBefore(before, tagChunk("mrk", action->id));
     }
   }
 
@@ -250,15 +273,20 @@ class TagInsertion {
   }
 
   void xPropose(std::string tag, std::size_t c) {
-    if (xLookBackAccepts(c))
+    if (xLookBackAccepts({c, 0}))
       fCandidates.push_back({std::move(tag), c});
   }
 
   // False when a gesture or blocking sound of the caller has its bookmark within the
-  // window of speech before the chunk.
-  bool xLookBackAccepts(std::size_t c) const {
+  // window of speech before the insertion point.
+  bool xLookBackAccepts(InsertionPoint at) const {
     std::int64_t budget = ZULingSyntacticAnalyzerTagger::kWindowMs;
-    for (std::size_t k = c; budget >= 1 && fChunks.previous(k) != kNone;) {
+    std::size_t k = at.chunk;
+    if (at.pauseSplit > 0) {
+      // The point stands inside the pause: the pause's first part comes before it.
+      budget -= lingSpeechTag(fChunks[k]).value - at.pauseSplit;
+    }
+    while (budget >= 1 && fChunks.previous(k) != kNone) {
       k = fChunks.previous(k);
       const Chunk& chunk = fChunks[k];
       if (chunk.wordClass() > WORD_CLASS_BOOKMARK) {
@@ -278,10 +306,10 @@ class TagInsertion {
     return true;
   }
 
-  // The chunk before which a bookmark starts `duration` ms of speech ahead of chunk c:
-  // the start of a word (or a space) once the duration is spent, or a pause split so
-  // that its second part is what remains.
-  std::size_t xMoveBack(std::size_t c, std::int64_t duration) {
+  // Where a bookmark starts `duration` ms of speech ahead of chunk c: before the start
+  // of a word (or a space) once the duration is spent, or inside a pause, whose last
+  // `pauseSplit` ms are what remains.
+  InsertionPoint xMoveBack(std::size_t c, std::int64_t duration) const {
     std::int64_t remaining = duration;
     std::size_t k = c;
     while (fChunks.previous(k) != kNone) {
@@ -290,7 +318,7 @@ class TagInsertion {
       if (chunk.wordClass() > WORD_CLASS_BOOKMARK) {
         remaining -= chunk.length * ZULingSyntacticAnalyzerTagger::kMsPerByte;
         if (remaining < 1)
-          return xWordStart(k);
+          return {xWordStart(k), 0};
         continue;
       }
       const ZULingSpeechTag tag = lingSpeechTag(chunk);
@@ -300,12 +328,9 @@ class TagInsertion {
         remaining -= tag.value;
         continue;
       }
-      if (tag.value == remaining)
-        return k;
-      fChunks[k] = tagChunk("pau", tag.value - remaining);
-      return fChunks.insertAfter(k, tagChunk("pau", remaining));
+      return {k, tag.value == remaining ? 0 : remaining};
     }
-    return k;
+    return {k, 0};
   }
 
   std::size_t xWordStart(std::size_t k) const {

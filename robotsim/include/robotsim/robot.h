@@ -2,7 +2,8 @@
 // The whole simulated robot: a session with a broker, the shared timeline, and every
 // service the speech-animation service drives ("ZUMemory", "ZUTextToSpeech",
 // "ZUBehaviorManager", "ZUMotion", "ZUAudioPlayer", "ZURobotPosture", "ZURobotModel",
-// "ZUAutonomousMoves"), registered under those names.
+// "ZUAutonomousMoves"), registered under those names, and the timeline itself as the service
+// "ZUTimeline" (robotsim/zutimelineservice.h).
 //
 // Built and destroyed by one thread; the services themselves serve any thread. On
 // destruction every service exits (stopping what it plays) in the reverse order of its

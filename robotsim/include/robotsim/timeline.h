@@ -11,6 +11,7 @@
 #include <cstdint>
 #include <functional>
 #include <mutex>
+#include <optional>
 #include <ostream>
 #include <string>
 #include <vector>
@@ -37,6 +38,12 @@ class Timeline {
   std::int64_t now() const;
   // The same of a moment of the steady clock (negative before the timeline began).
   std::int64_t usAt(std::chrono::steady_clock::time_point moment) const;
+  // When it began, on ko::os::ustime()'s clock (the steady clock of the machine).
+  std::int64_t originUs() const;
+  // Records an entry that happened at `us` (on this timeline's clock), elsewhere: a mirror
+  // of another process's timeline.
+  void recordAt(std::int64_t us, std::string service, std::string operation,
+                ko::AnyValue arguments = {}, ko::AnyValue result = {});
 
   std::vector<TimelineEntry> entries() const;
   // The entries of one service and operation, in order.
@@ -54,6 +61,9 @@ class Timeline {
   void addListener(Listener listener);
 
  private:
+  void xRecord(std::optional<std::int64_t> us, std::string service, std::string operation,
+               ko::AnyValue arguments, ko::AnyValue result);
+
   mutable std::mutex mutex_;
   std::chrono::steady_clock::time_point start_;
   std::vector<TimelineEntry> entries_;

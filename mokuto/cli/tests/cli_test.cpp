@@ -1,0 +1,659 @@
+// The `mokuto` and `zefoko` commands, run as a user runs them: the executable with its
+// arguments, its status, its output and the files it writes.
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <sndfile.h>
+#include <spawn.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cmath>
+#include <csignal>
+#include <cstdint>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include <nlohmann/json.hpp>
+
+extern char** environ;
+
+namespace {
+
+using Json = nlohmann::json;
+
+// In random mode a text keeps only its own actions (no automatic tags), so that the
+// tests below can name them one by one.
+const std::string kText =
+    "Hello ^start(animations/Stand/Gestures/Hey_1) my friend "
+    "^wait(animations/Stand/Gestures/Hey_1) bye ^runSound(bells/ding, 50) $done=1";
+
+struct Ran {
+  int status = -1;
+  std::string out;
+  std::string err;
+};
+
+std::string quoted(const std::string& text) {
+  std::string out = "'";
+  for (const char c : text)
+    out += c == '\'' ? std::string("'\\''") : std::string(1, c);
+  return out + "'";
+}
+
+std::string readFile(const std::filesystem::path& path) {
+  std::ifstream in(path);
+  std::stringstream text;
+  text << in.rdbuf();
+  return text.str();
+}
+
+// "mokuto ..." and "zefoko ..." with the executables of the build.
+std::string commandLine(const std::string& arguments) {
+  for (const auto& [name, path] :
+       {std::pair{"mokuto ", MOKUTO_EXECUTABLE}, std::pair{"zefoko ", ZEFOKO_EXECUTABLE}}) {
+    if (arguments.rfind(name, 0) == 0)
+      return std::string(path) + arguments.substr(std::string(name).size() - 1);
+  }
+  return std::string(MOKUTO_EXECUTABLE) + " " + arguments;
+}
+
+class MokutoCommand : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    folder = std::filesystem::temp_directory_path() /
+             ("mokuto_cli_" + std::to_string(::getpid()) + "_" +
+              ::testing::UnitTest::GetInstance()->current_test_info()->name());
+    std::filesystem::create_directories(folder);
+  }
+  void TearDown() override { std::filesystem::remove_all(folder); }
+
+  Ran run(const std::string& arguments, const std::string& input = {}) const {
+    std::string command = commandLine(arguments);
+    command += input.empty() ? " </dev/null" : " <" + quoted((folder / "in.txt").string());
+    if (!input.empty())
+      std::ofstream(folder / "in.txt") << input;
+    command += " >" + quoted((folder / "out.txt").string()) + " 2>" +
+               quoted((folder / "err.txt").string());
+    Ran result;
+    const int raw = std::system(command.c_str());
+    result.status = WIFEXITED(raw) ? WEXITSTATUS(raw) : -1;
+    result.out = readFile(folder / "out.txt");
+    result.err = readFile(folder / "err.txt");
+    return result;
+  }
+
+  std::vector<Json> timeline() const {
+    std::vector<Json> lines;
+    std::ifstream in(folder / "timeline.jsonl");
+    for (std::string line; std::getline(in, line);)
+      lines.push_back(Json::parse(line));
+    return lines;
+  }
+
+  std::filesystem::path folder;
+};
+
+// Index of the first entry that `match` accepts at or after `from`, or -1.
+template <class Match>
+long find(const std::vector<Json>& lines, Match match, std::size_t from = 0) {
+  for (std::size_t k = from; k < lines.size(); ++k) {
+    if (match(lines[k]))
+      return static_cast<long>(k);
+  }
+  return -1;
+}
+
+auto entry(const std::string& service, const std::string& operation) {
+  return [service, operation](const Json& line) {
+    return line["service"] == service && line["operation"] == operation;
+  };
+}
+
+auto entryWith(const std::string& service, const std::string& operation, std::size_t k,
+               const Json& value) {
+  return [=](const Json& line) {
+    return line["service"] == service && line["operation"] == operation &&
+           line["arguments"].size() > k && line["arguments"][k] == value;
+  };
+}
+
+std::vector<Json> actionsOf(const std::vector<Json>& lines) {
+  std::vector<Json> actions;
+  for (const auto& line : lines) {
+    if (entry("ZUMokuto", "action")(line))
+      actions.push_back(line["arguments"]);
+  }
+  return actions;
+}
+
+enum class Stream { Out, Err };
+
+struct Case {
+  std::string arguments;
+  int status;
+  Stream stream;
+  std::string fragment;
+  // What the stream must not hold; empty: nothing.
+  std::string absent = {};
+  std::string input = {};
+  // Reads the linguistic databases of the build.
+  bool databases = false;
+};
+
+TEST_F(MokutoCommand, AnswersEachCaseWithItsStatusAndMessage) {
+  const std::string fast = "mokuto say --speech timing --fast --mode random ";
+  const std::string deep = std::string(5000, '[') + std::string(5000, ']');
+  std::vector<Case> cases = {
+      // What became of each action.
+      {fast + "'Hi ^runSound(bells/dingg) there'", 0, Stream::Out,
+       "^runSound(bells/dingg)  failed: No sound \"dingg\" in the sound set \"bells\""},
+      {fast + "'Hi ^startSound(bells/dongg) there'", 0, Stream::Out,
+       "^startSound(bells/dongg)  failed: No sound \"dongg\" in the sound set \"bells\""},
+      {fast + "'Hi ^call(ZUMemory.nosuch(1)) there'", 0, Stream::Out,
+       "^call(ZUMemory.nosuch(1))  failed: Cannot find method 'nosuch' on ZUMemory"},
+      {fast + "'Hi ^pCall(ZUMemory.nosuch(1)) there'", 0, Stream::Out,
+       "^pCall(ZUMemory.nosuch(1))  failed: "},
+      {fast + "'Hi ^call(ZUMemory.raiseEvent(abc)) there'", 0, Stream::Out,
+       "failed: the arguments are not JSON"},
+      {fast + "'Hi ^call(ZUMemory.raiseEvent(abc)) ^runSound(bells/ding) there'", 0, Stream::Out,
+       "actions: 1 executed, 1 failed, 0 skipped", "sync, from"},
+      {fast + "'Hi ^wait(animations/Stand/Gestures/Hey_1) there'", 0, Stream::Out,
+       "(the animation was not running)"},
+      {"mokuto say --speech timing --fast --tags-to-words '[[\"nosuchtag\", [\"hello\"]]]' hello",
+       0, Stream::Out, "AUTO_START_TAG(nosuchtag)  no animation"},
+      {fast + "'Hi ^foo(x) and ^start(no/such/animation) there'", 0, Stream::Out,
+       "instruction errors: 2"},
+      {fast + "Hi", 0, Stream::Out, "sync figures are meaningless with --fast"},
+      {fast + "-", 0, Stream::Out, "say 1 (300 characters): " + std::string(200, 'a') + "\u2026",
+       "", std::string(300, 'a')},
+      {fast + "-", 0, Stream::Out, "say 1 (9 characters): Hi\uFFFDthere ", "", "Hi\x01there\n"},
+      {"mokuto say --speech timing --dry-run 'Hi ^runSound(bells/dingg) ^call(ZUMemory.nosuch())'",
+       0, Stream::Out, "\"failure\": \"No sound \\\"dingg\\\" in the sound set \\\"bells\\\"\""},
+      // Instructions that did not parse, with their column; the status stays.
+      {fast + "'Hello ^start(animations/Stand/Gestures/Hey_1 my friend'", 0, Stream::Err,
+       "column 7: \"^start(\" has no closing parenthesis"},
+      {"mokuto say --speech timing --dry-run 'x ^wait y $x= ^Start(a)'", 0, Stream::Err,
+       "column 3: \"^wait\" is not followed by \"(\""},
+      {fast + "'x ^Start(a)'", 0, Stream::Err,
+       "column 3: \"^Start\" is not an instruction: skipped (did you mean \"^start\"?)"},
+      // Configuration values that the service would log and skip.
+      {fast + "--config '[[\"bodyLanguageMode\", \"randm\"]]' Hi", 2, Stream::Err,
+       "--config: Invalid body language mode: \"randm\"", "say 1"},
+      {fast + "--config '[[\"msPauseBeforeSpeech\", \"abc\"]]' Hi", 2, Stream::Err,
+       "--config: uknown key \"msPauseBeforeSpeech\""},
+      {fast + "--tags-to-animations '[[\"a\", [\"animations/Stand/x\"]], \"bad\"]' Hi", 2,
+       Stream::Err, "--tags-to-animations: The new tags to animations should be an array"},
+      {fast + "--package nonexistent/ hello", 2, Stream::Err,
+       "no installed animation begins with \"nonexistent//\""},
+      {fast + "--package animations --package animations hello", 0, Stream::Out, "say 1"},
+      {"mokuto config --apply '[[\"bodyLanguageMode\", 1]]'", 2, Stream::Err,
+       "uknown key \"bodyLanguageMode\""},
+      {"mokuto config --apply '[[\"bodyLanguageMode\", \"random\"], [\"msPauseBeforeSpeech\", 0]]'",
+       0, Stream::Out, "config: bodyLanguageMode: random\n        msPauseBeforeSpeech: 0"},
+      {"mokuto config --apply '[[\"msPauseBeforeSpeech\", '", 2, Stream::Err, "invalid JSON"},
+      {"mokuto config --apply '" + deep + "'", 2, Stream::Err,
+       "invalid JSON: JSON nested deeper than 128 levels"},
+      // Unusable arguments and options.
+      {"mokuto say --mode wild Hi", 2, Stream::Err,
+       "--mode: wild not in {disabled,random,contextual}"},
+      {"mokuto say --speech festival Hi", 2, Stream::Err, "--speech"},
+      {"mokuto say --config '[[\"msPauseBeforeSpeech\", ' Hi", 2, Stream::Err,
+       "--config: invalid JSON"},
+      {"mokuto say --tags-to-words '{\"a\": 1}' Hi", 2, Stream::Err,
+       "--tags-to-words takes a JSON array"},
+      {"mokuto say --wav /no/such/folder/x.wav Hi", 2, Stream::Err,
+       "--wav: no folder /no/such/folder"},
+      {"mokuto say --speech timing --fast '  '", 2, Stream::Err, "the text is empty"},
+      {"mokuto say --bogus Hi", 2, Stream::Err, "--bogus"},
+      {"zefoko speak --bogus", 2, Stream::Err, "--bogus"},
+      {"zefoko bodytalk --seconds 0", 2, Stream::Err, "0 is not a number of seconds above 0"},
+      // --connect: the robot's options belong to its process, what needs the service here
+      // and what does not use the service refuse it; the network needs keys.
+      {"mokuto --connect ipc:///nonexistent say --speech timing Hi", 2, Stream::Err,
+       "--speech belongs to the robot's process with --connect"},
+      {"mokuto --connect ipc:///nonexistent say --wav x.wav Hi", 2, Stream::Err,
+       "--wav needs the robot in this process"},
+      {"mokuto --connect ipc:///nonexistent say --dry-run Hi", 2, Stream::Err,
+       "--dry-run needs the service in this process"},
+      {"mokuto --connect ipc:///nonexistent diagnosis --posture Sitting", 2, Stream::Err,
+       "--posture belongs to the robot's process with --connect"},
+      {"mokuto --connect ipc:///nonexistent sounds", 2, Stream::Err,
+       "mokuto sounds does not use the running service"},
+      {"mokuto --connect ipc:///nonexistent parse Hi", 2, Stream::Err,
+       "mokuto parse does not use the running service"},
+      {"mokuto --connect tcp://192.0.2.1:5555 methods", 2, Stream::Err,
+       "goes through the network: it needs CURVE keys"},
+      {"mokuto --server-key /dev/null methods", 2, Stream::Err, "--server-key requires --connect"},
+      {"zefoko serve --listen tcp://0.0.0.0:0 --speech timing", 2, Stream::Err,
+       "opens the service to the network: it needs CURVE keys"},
+      {"zefoko serve --connect ipc:///nonexistent", 2, Stream::Err,
+       "--connect needs module libraries to serve"},
+      {"zefoko serve --connect ipc:///nonexistent --speech timing /dev/null", 2, Stream::Err,
+       "--speech excludes --connect"},
+      {"zefoko serve --heartbeat 5 --listen ipc:///nonexistent", 2, Stream::Err, "--heartbeat"},
+      {"zefoko serve", 2, Stream::Err, "nothing to serve"},
+      // One language option: an unknown language is a usage error everywhere.
+      {"mokuto say --language Klingon Hi", 2, Stream::Err, "--language: Klingon not in"},
+      {"mokuto say --language fr_FR Hi", 2, Stream::Err, "--language: fr_FR not in"},
+      {"mokuto parse --language Klingon Hi", 2, Stream::Err, "--language: Klingon not in"},
+      {"mokuto analyse --language Klingon Hi", 2, Stream::Err, "--language: Klingon not in"},
+      {"mokuto emotion --language Klingon Hi", 2, Stream::Err, "--language: Klingon not in"},
+      {"mokuto lookup --language Klingon hi", 2, Stream::Err, "--language: Klingon not in"},
+      {"zefoko speak --language Klingon Hi", 2, Stream::Err, "--language: Klingon not in"},
+      {"mokuto lookup --database /nonexistent x", 1, Stream::Err, "no linguistic database"},
+      // "-" reads standard input wherever a text is read.
+      {"mokuto parse --language Japanese -", 0, Stream::Out,
+       "\"text\": \"\\\\mrk=1\\\\ ,\\\\pau=300\\\\ hi\"", "", "\\mrk=1\\ \\pau=300\\ hi"},
+      {"mokuto parse 'Hi ^run(wave) there $x=1 ^runSound(bells/ding, 50)'", 0, Stream::Out,
+       "\"text\": \"Hi \\\\mrkpause=1\\\\ there \\\\mrk=2\\\\ \\\\mrkpause=3\\\\\""},
+      {"mokuto analyse --tags-to-words '[[\"greet\", [\"hello\"]]]' -", 0, Stream::Out,
+       "\"tag\": \"greet\"", "", "Hello world"},
+      {"zefoko speak --speech timing --fast -", 0, Stream::Out,
+       "ZUMemory.raiseEvent [\"ZUTextToSpeech/CurrentBookMark\", 2]", "",
+       "One \\mrk=1\\ two \\mrk=2\\ three"},
+      {"zefoko speak --wav " + quoted((folder / "speak.wav").string()) + " 'Hi \\mrk=1\\ there.'",
+       0, Stream::Err, "wrote " + (folder / "speak.wav").string()},
+      // What the robot and the service offer.
+      {"mokuto animations hello --posture Sitting", 0, Stream::Out, "animations/Sit/Gestures/Hey_1",
+       "animations/Stand/"},
+      {"mokuto animations", 0, Stream::Out, "animations/Stand/BodyTalk/Speaking_1"},
+      {"mokuto animations nosuchtag", 1, Stream::Err, "no animation for the tag \"nosuchtag\""},
+      {"mokuto tags --posture SittingOnChair", 0, Stream::Out, "hello\n"},
+      {"mokuto sounds", 0, Stream::Out, "bells/ding\n"},
+      {"mokuto syntax", 0, Stream::Out, "  SECOND_PARAMETER_NOT_VALID "},
+      {"mokuto syntax", 0, Stream::Out, "^pCall(SERVICE.METHOD(ARGUMENTS))"},
+      {"mokuto --version", 0, Stream::Out, std::string("mokuto ") + MOKUTO_VERSION},
+      {"zefoko --version", 0, Stream::Out, std::string("zefoko ") + MOKUTO_VERSION},
+      // The linguistic databases of the build.
+      {"mokuto lookup thinking", 0, Stream::Out, "verb (14)  features \"G\"  lemma \"think\"", "",
+       "", true},
+      {"mokuto lookup --language fr_FR était", 0, Stream::Out,
+       "auxiliary (15)  features \"I3s\"  lemma \"être\"", "", "", true},
+      {"mokuto lookup --language Japanese 思っ", 0, Stream::Out,
+       "verb (14)  features \"\"  lemma \"思う\"", "", "", true},
+      {"mokuto lookup --language EnglishEmotions great", 0, Stream::Out,
+       "unkonwn (4)  features \"\"  lemma \"very positive\"", "", "", true},
+      {"mokuto lookup --language FrenchEmotions pas", 0, Stream::Out,
+       "unkonwn (4)  features \"\"  lemma \"negation\"", "", "", true},
+      {"mokuto lookup --language ja_JPEmotions なかっ", 0, Stream::Out,
+       "unkonwn (4)  features \"\"  lemma \"negation\"", "", "", true},
+      {"mokuto analyse --pause 0 'I like apples, pears and plums.'", 0, Stream::Out,
+       "AUTO_START_TAG(three)", "", "", true},
+      {"mokuto analyse --language French 'Je ne mange pas de pommes.'", 0, Stream::Out,
+       "AUTO_START_TAG(oppose)", "", "", true},
+      {"mokuto analyse --language Japanese 紅茶かコーヒー", 0, Stream::Out, "AUTO_START_TAG(pick)",
+       "", "", true},
+      {"mokuto emotion -", 0, Stream::Out, "emotion: -1\n  \"not\": negation", "", "I am not happy",
+       true},
+      {"mokuto emotion --language French 'Je ne suis pas content'", 0, Stream::Out, "emotion: -1",
+       "", "", true},
+      {"mokuto emotion --language Japanese とても嬉しい", 0, Stream::Out, "emotion: 2", "", "",
+       true},
+  };
+  for (const std::string command :
+       {"say", "syntax", "parse", "analyse", "emotion", "lookup", "config", "methods", "tags",
+        "animations", "sounds", "diagnosis", "page"})
+    cases.push_back({"mokuto " + command + " --help", 0, Stream::Out, "Usage"});
+  for (const std::string command : {"speak", "bodytalk", "serve", "keys"})
+    cases.push_back({"zefoko " + command + " --help", 0, Stream::Out, "Usage"});
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.arguments);
+    if (c.databases && !MOKUTO_HAVE_LINGDATA)
+      continue;
+    const Ran r = run(c.arguments, c.input);
+    EXPECT_EQ(r.status, c.status) << r.out << r.err;
+    const std::string& text = c.stream == Stream::Out ? r.out : r.err;
+    EXPECT_NE(text.find(c.fragment), std::string::npos) << r.out << r.err;
+    if (!c.absent.empty()) {
+      EXPECT_EQ(text.find(c.absent), std::string::npos) << r.out << r.err;
+    }
+  }
+}
+
+TEST_F(MokutoCommand, SaysAnAnnotatedTextOnTheTimingEngine) {
+  const Ran r = run("say --mode random --speech timing --fast --timeline " +
+                    quoted((folder / "timeline.jsonl").string()) + " " + quoted(kText));
+  ASSERT_EQ(r.status, 0) << r.err;
+  EXPECT_NE(r.out.find("actions: 4 executed, 0 skipped"), std::string::npos) << r.out;
+  EXPECT_NE(r.out.find("instruction errors: 0"), std::string::npos) << r.out;
+  const auto lines = timeline();
+  ASSERT_FALSE(lines.empty());
+
+  const long say = find(lines, entryWith("ZUMokuto", "say", 0, 1));
+  ASSERT_EQ(say, 0);
+  const long speech = find(lines, entry("ZUTextToSpeech", "say"));
+  ASSERT_GE(speech, 0);
+  const int speechId = lines[static_cast<std::size_t>(speech)]["arguments"][0];
+  std::vector<long> bookmarks;
+  for (const int number : {1, 2, 3, 4}) {
+    // The engine raises a bookmark's event, then records the bookmark; a blocking one
+    // it records before the call that holds the speech.
+    const long at = find(lines, [&](const Json& line) {
+      return (line["service"] == "ZUTextToSpeech" &&
+              (line["operation"] == "bookmark" || line["operation"] == "hold") &&
+              line["arguments"] == Json::array({speechId, number})) ||
+             (line["service"] == "ZUMemory" && line["operation"] == "raiseEvent" &&
+              line["arguments"] == Json::array({"ZUTextToSpeech/CurrentBookMark", number}));
+    });
+    EXPECT_GE(at, 0) << "bookmark " << number;
+    bookmarks.push_back(at);
+  }
+  const auto actions = actionsOf(lines);
+  ASSERT_EQ(actions.size(), 4u);
+  const std::vector<std::string> types = {"START", "WAIT", "RUN_SOUND", "AFFECTATION"};
+  for (std::size_t k = 0; k < actions.size(); ++k) {
+    SCOPED_TRACE(actions[k].dump());
+    EXPECT_EQ(actions[k]["bookmark"], k + 1);
+    EXPECT_EQ(actions[k]["type"], types[k]);
+    EXPECT_EQ(actions[k]["outcome"], "executed");
+    EXPECT_TRUE(actions[k]["error"].is_null());
+    EXPECT_TRUE(actions[k]["failure"].is_null());
+    ASSERT_TRUE(actions[k]["bookmarkUs"].is_number());
+    EXPECT_GE(actions[k]["startUs"].get<std::int64_t>(),
+              actions[k]["bookmarkUs"].get<std::int64_t>());
+    EXPECT_GE(actions[k]["endUs"].get<std::int64_t>(), actions[k]["startUs"].get<std::int64_t>());
+  }
+
+  const std::string hey = "animations/Stand/Gestures/Hey_1";
+  const long started = find(lines, entryWith("ZUBehaviorManager", "startBehavior", 0, hey));
+  const long stopped = find(lines, entryWith("ZUBehaviorManager", "behaviorStopped", 0, hey));
+  ASSERT_GE(started, 0);
+  ASSERT_GE(stopped, 0);
+  EXPECT_GT(started, bookmarks[0]);
+  EXPECT_LE(lines[static_cast<std::size_t>(stopped)]["us"].get<std::int64_t>(),
+            actions[1]["endUs"].get<std::int64_t>());
+  EXPECT_GE(find(lines, entryWith("ZUAudioPlayer", "playSoundSetFile", 0, "bells")), bookmarks[2]);
+  const long done = find(lines, entryWith("ZUMemory", "raiseEvent", 0, "done"));
+  EXPECT_GE(done, bookmarks[3]);
+
+  // The end event is the last thing the robot did for the text (the body talk may still
+  // be settling); the service's "end" closes the timeline with the summary's figures.
+  const long end = find(lines, entryWith("ZUMemory", "raiseEvent", 0, "ZUMokuto/EndOfMokuto"));
+  ASSERT_GT(end, done);
+  EXPECT_EQ(lines[static_cast<std::size_t>(end)]["arguments"][1], 1);
+  for (std::size_t k = static_cast<std::size_t>(end) + 1; k < lines.size(); ++k) {
+    const Json& line = lines[k];
+    EXPECT_FALSE(
+        line["service"] == "ZUTextToSpeech" || line["service"] == "ZUAudioPlayer" ||
+        line["operation"] == "raiseEvent" ||
+        (line["arguments"].is_array() && !line["arguments"].empty() && line["arguments"][0] == hey))
+        << line.dump();
+  }
+  const Json& last = lines.back();
+  EXPECT_TRUE(entry("ZUMokuto", "end")(last)) << last.dump();
+  EXPECT_EQ(last["result"]["outcome"], "done");
+  EXPECT_EQ(last["result"]["executed"], 4);
+  // --fast: no sync figures.
+  EXPECT_TRUE(last["result"]["syncMedianUs"].is_null());
+}
+
+struct Sound {
+  std::vector<float> samples;
+  int rate = 0;
+};
+
+Sound readSound(const std::filesystem::path& path) {
+  SF_INFO info{};
+  SNDFILE* file = sf_open(path.c_str(), SFM_READ, &info);
+  EXPECT_NE(file, nullptr) << path << ": " << sf_strerror(nullptr);
+  if (!file)
+    return {};
+  Sound sound{std::vector<float>(static_cast<std::size_t>(info.frames * info.channels)),
+              info.samplerate};
+  sf_readf_float(file, sound.samples.data(), info.frames);
+  sf_close(file);
+  return sound;
+}
+
+// The loudness of seconds [from, to) of a sound.
+double rms(const Sound& sound, double from, double to) {
+  const auto rate = static_cast<double>(sound.rate);
+  const auto begin = static_cast<std::size_t>(std::max(0.0, from) * rate);
+  const auto end = std::min(sound.samples.size(), static_cast<std::size_t>(to * rate));
+  double sum = 0;
+  for (std::size_t i = begin; i < end; ++i)
+    sum += static_cast<double>(sound.samples[i]) * sound.samples[i];
+  return end > begin ? std::sqrt(sum / static_cast<double>(end - begin)) : 0.0;
+}
+
+TEST_F(MokutoCommand, TheWavHoldsTheSpeechAndEverySoundAtItsTime) {
+  struct WavCase {
+    const char* name;
+    std::string options;
+    std::string text;
+    const char* sound;  // of the set "bells"
+    double volume;
+    bool stopped;
+  };
+  const std::vector<WavCase> cases = {
+      // The README's example: the speech waits while the sound plays.
+      {"the README's example", "",
+       "Hello ^start(animations/Stand/Gestures/Hey_1) my friend, "
+       "^wait(animations/Stand/Gestures/Hey_1) how are you today? ^runSound(bells/ding, 50) "
+       "$greeted=1 See you soon!",
+       "ding", 0.5, false},
+      // No speech audio from the timing engine: the sound alone, cut at its stop.
+      {"a sound that the text stops", "--speech timing --mode disabled",
+       "^startSound(bells/chime, 100) Hi ^stopSound(bells/chime) there", "chime", 1.0, true},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.name);
+    const Ran r =
+        run("say " + c.options + " --wav " + quoted((folder / "out.wav").string()) +
+            " --timeline " + quoted((folder / "timeline.jsonl").string()) + " " + quoted(c.text));
+    ASSERT_EQ(r.status, 0) << r.err;
+    const auto lines = timeline();
+    const long play = find(lines, entryWith("ZUAudioPlayer", "playSoundSetFile", 1, c.sound));
+    const long end = find(lines, [&](const Json& line) {
+      return line["service"] == "ZUAudioPlayer" && line["arguments"].size() == 2 &&
+             (line["operation"] == "soundEnded" || line["operation"] == "soundStopped");
+    });
+    ASSERT_GE(play, 0);
+    ASSERT_GT(end, play);
+    EXPECT_EQ(lines[static_cast<std::size_t>(end)]["operation"],
+              c.stopped ? "soundStopped" : "soundEnded");
+    // The audio begins when the text is handed to the service, as the timeline does.
+    const double start = lines[static_cast<std::size_t>(play)]["us"].get<double>() / 1e6;
+    const double stop = lines[static_cast<std::size_t>(end)]["us"].get<double>() / 1e6;
+    const Sound wav = readSound(folder / "out.wav");
+    const Sound file = readSound(std::filesystem::path(MOKUTO_SOUNDS_DIR) / "bells" /
+                                 (std::string(c.sound) + ".wav"));
+    // 10 ms inside either end: the times of the timeline are those of the calls.
+    const double heard = rms(wav, start + 0.01, stop - 0.01);
+    const double expected = c.volume * rms(file, 0.01, stop - start - 0.01);
+    EXPECT_NEAR(heard, expected, expected * 0.15) << "from " << start << " s to " << stop << " s";
+    if (c.stopped) {
+      EXPECT_EQ(rms(wav, stop + 0.005, static_cast<double>(wav.samples.size()) / wav.rate), 0.0);
+      EXPECT_GT(rms(file, stop - start + 0.005, 1.0), 0.01) << "the file goes on after the stop";
+    } else {
+      // Speech, not silence, around it: a few tenths of a second of clearly non-zero samples.
+      const auto loud = std::count_if(wav.samples.begin(), wav.samples.end(),
+                                      [](float v) { return std::fabs(v) > 0.05F; });
+      EXPECT_GT(loud, wav.rate / 10);
+      for (const auto& action : actionsOf(lines)) {
+        SCOPED_TRACE(action.dump());
+        EXPECT_EQ(action["outcome"], "executed");
+        ASSERT_TRUE(action["bookmarkUs"].is_number());
+        EXPECT_GE(action["startUs"].get<std::int64_t>(), action["bookmarkUs"].get<std::int64_t>());
+      }
+      EXPECT_TRUE(lines.back()["result"]["syncMedianUs"].is_number());
+    }
+  }
+}
+
+TEST_F(MokutoCommand, DryRunShowsWhatTheLoaderResolvedWithoutSpeaking) {
+  const Ran r = run("say --mode random --speech timing --dry-run --timeline " +
+                    quoted((folder / "timeline.jsonl").string()) +
+                    " 'Hi ^start(animations/Stand/Gestures/Hey_1) and ^run(no/such) "
+                    "^runSound(bells/ding) $x=2 ^startSound(bells/dingg) "
+                    "^call(ZUMemory.nosuch(1)) ^pCall(ZUMemory.raiseEvent(x))'");
+  ASSERT_EQ(r.status, 0) << r.err;
+  const Json job = Json::parse(r.out);
+  ASSERT_EQ(job["actions"].size(), 7u);
+  const Json& actions = job["actions"];
+  EXPECT_EQ(actions[0]["resolved"]["animation"], "animations/Stand/Gestures/Hey_1");
+  EXPECT_TRUE(actions[0]["error"].is_null());
+  EXPECT_EQ(actions[1]["error"], "ANIMATION_NOT_FOUND");
+  EXPECT_EQ(actions[1]["typeName"], "UNKNOWN");
+  EXPECT_EQ(actions[2]["resolved"]["soundSet"], "bells");
+  EXPECT_EQ(actions[3]["name"], "x");
+  for (const std::size_t k : {0u, 1u, 2u, 3u})
+    EXPECT_TRUE(actions[k]["failure"].is_null()) << k;
+  // What the director's calls would meet.
+  EXPECT_EQ(actions[4]["failure"], "No sound \"dingg\" in the sound set \"bells\"");
+  EXPECT_EQ(actions[5]["failure"], "Cannot find method 'nosuch' on ZUMemory");
+  EXPECT_EQ(actions[6]["failure"].get<std::string>().rfind("the arguments are not JSON", 0), 0u);
+
+  const auto lines = timeline();
+  EXPECT_GE(find(lines, entryWith("ZUBehaviorManager", "preloadBehavior", 0,
+                                  "animations/Stand/Gestures/Hey_1")),
+            0);
+  EXPECT_GE(find(lines, entryWith("ZUAudioPlayer", "loadSoundSet", 0, "bells")), 0);
+  EXPECT_EQ(find(lines, entry("ZUTextToSpeech", "say")), -1);
+}
+
+TEST_F(MokutoCommand, PublishesTheMethodTableInBindingOrder) {
+  const Ran r = run("methods");
+  ASSERT_EQ(r.status, 0) << r.err;
+  const Json methods = Json::parse(r.out);
+  std::vector<std::string> names;
+  for (const auto& method : methods)
+    names.push_back(method["name"]);
+  ASSERT_FALSE(names.empty());
+  EXPECT_EQ(std::count(names.begin(), names.end(), "say"), 2);
+  EXPECT_EQ(names.back(), "_dialogMatchedInputCallback");
+  EXPECT_NE(std::find(names.begin(), names.end(), "ping"), names.end());
+  const auto say =
+      static_cast<std::size_t>(std::find(names.begin(), names.end(), "say") - names.begin());
+  EXPECT_EQ(methods[say]["parameters"][0]["name"], "text");
+}
+
+// A command started in a process group of its own, as `timeout` starts one: its standard
+// error read line by line as it comes, its output in a file.
+class Spawned {
+ public:
+  Spawned(const std::string& command, const std::filesystem::path& out) {
+    int fds[2];
+    EXPECT_EQ(::pipe(fds), 0);
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    posix_spawn_file_actions_addopen(&actions, 0, "/dev/null", O_RDONLY, 0);
+    posix_spawn_file_actions_addopen(&actions, 1, out.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
+    posix_spawn_file_actions_adddup2(&actions, fds[1], 2);
+    posix_spawn_file_actions_addclose(&actions, fds[0]);
+    posix_spawnattr_t attributes;
+    posix_spawnattr_init(&attributes);
+    posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETPGROUP);
+    posix_spawnattr_setpgroup(&attributes, 0);
+    const std::string shell = "exec " + command;
+    const char* argv[] = {"sh", "-c", shell.c_str(), nullptr};
+    EXPECT_EQ(
+        ::posix_spawn(&fPid, "/bin/sh", &actions, &attributes, const_cast<char**>(argv), environ),
+        0);
+    posix_spawn_file_actions_destroy(&actions);
+    posix_spawnattr_destroy(&attributes);
+    ::close(fds[1]);
+    fErr = fds[0];
+  }
+  ~Spawned() {
+    if (fPid > 0)
+      wait();
+    ::close(fErr);
+  }
+
+  // Reads standard error until `fragment` has come; false at its end, or after a minute
+  // without a byte (a bound against a hang, never reached when all is well).
+  bool waitFor(const std::string& fragment) {
+    while (fSeen.find(fragment, fFrom) == std::string::npos) {
+      pollfd fd{fErr, POLLIN, 0};
+      char buffer[4096];
+      if (::poll(&fd, 1, 60'000) <= 0)
+        return false;
+      const ssize_t n = ::read(fErr, buffer, sizeof buffer);
+      if (n <= 0)
+        return false;
+      fSeen.append(buffer, static_cast<std::size_t>(n));
+    }
+    fFrom = fSeen.find(fragment, fFrom) + fragment.size();
+    return true;
+  }
+  void signal(int number, bool group) { ::kill(group ? -fPid : fPid, number); }
+  int wait() {
+    char buffer[4096];
+    for (ssize_t n; (n = ::read(fErr, buffer, sizeof buffer)) > 0;)
+      fSeen.append(buffer, static_cast<std::size_t>(n));
+    int raw = 0;
+    ::waitpid(fPid, &raw, 0);
+    fPid = -1;
+    return WIFEXITED(raw) ? WEXITSTATUS(raw) : 128 + WTERMSIG(raw);
+  }
+  const std::string& err() const { return fSeen; }
+
+ private:
+  pid_t fPid = -1;
+  int fErr = -1;
+  std::string fSeen;
+  std::size_t fFrom = 0;
+};
+
+TEST_F(MokutoCommand, SignalsStopTheTextAndTheSummaryStillComes) {
+  struct SignalCase {
+    int signal;
+    bool group;
+    bool quiet;
+    bool second;
+  };
+  const SignalCase cases[] = {
+      {SIGINT, false, false, false},
+      {SIGTERM, true, true, false},
+      {SIGINT, false, true, true},
+      {SIGTERM, true, false, true},
+  };
+  // The director's info line says the text goes on stage; after a stop, the behaviour at
+  // the end of the text (blocking, over 3 s) keeps the command busy for a second signal.
+  const std::string say = "env ZEFOKO_LOG='mokuto.main=info,*=warning' " +
+                          std::string(MOKUTO_EXECUTABLE) + " say --speech timing --mode random " +
+                          "--timeline " + quoted((folder / "timeline.jsonl").string()) + " ";
+  const std::string endBehavior =
+      "--config " +
+      quoted(
+          "[[\"behaviorAtEndOfMokuto\", \"animations/Stand/BodyTalk/Thinking_2\"], "
+          "[\"ifBehaviorAtEndOfMokutoIsBlocking\", true]]") +
+      " ";
+  for (const auto& c : cases) {
+    SCOPED_TRACE(std::string(c.signal == SIGINT ? "SIGINT" : "SIGTERM") +
+                 (c.group ? " to the group" : "") + (c.quiet ? ", --quiet" : "") +
+                 (c.second ? ", twice" : ""));
+    Spawned command(
+        say + (c.second ? endBehavior : "") + (c.quiet ? "--quiet " : "") + quoted(kText),
+        folder / "out.txt");
+    ASSERT_TRUE(command.waitFor("Animated saying")) << command.err();
+    command.signal(c.signal, c.group);
+    if (c.second) {
+      ASSERT_TRUE(command.waitFor("a second signal ends the command at once")) << command.err();
+      command.signal(c.signal, c.group);
+    }
+    EXPECT_EQ(command.wait(), 130) << command.err();
+    const std::string out = readFile(folder / "out.txt");
+    if (c.second) {
+      EXPECT_NE(command.err().find(" again, ending at once"), std::string::npos) << command.err();
+      EXPECT_EQ(out.find("Text 1"), std::string::npos) << out;
+      continue;
+    }
+    EXPECT_NE(out.find("Text 1 stopped after"), std::string::npos) << out;
+    EXPECT_NE(out.find(" stopped\n"), std::string::npos) << out;
+    // The stopped actions are listed live, unless --quiet.
+    EXPECT_EQ(out.find("  stopped\n") == std::string::npos, c.quiet) << out;
+    const Json end = timeline().back();
+    EXPECT_EQ(end["result"]["outcome"], "stopped") << end.dump();
+    EXPECT_GT(end["result"]["stopped"].get<int>(), 0) << end.dump();
+  }
+}
+
+}  // namespace
