@@ -101,6 +101,36 @@ std::string hostName(const std::string& header) {
   return header.substr(0, header.find(':'));
 }
 
+// A report of the signal "actionReported" as the viewer's action entry, its times on the
+// timeline's clock (ustime less `originUs`).
+robotsim::TimelineEntry actionEntry(const ko::AnyValue& report, std::int64_t originUs,
+                                    std::int64_t nowUs) {
+  using Json = nlohmann::ordered_json;
+  const Json r = ko::toJson(report);
+  const auto time = [&](const char* key) -> Json {
+    const std::int64_t us = r.value(key, std::int64_t{-1});
+    return us < 0 ? Json() : Json(us - originUs);
+  };
+  std::string outcome = r.value("outcome", "executed");
+  if (outcome == "dropped")
+    outcome = "stopped";
+  const Json end = time("endUs");
+  robotsim::TimelineEntry entry;
+  entry.us = end.is_null() ? nowUs : end.get<std::int64_t>();
+  entry.service = "ZUMokuto";
+  entry.operation = "action";
+  // The text carries the error code in front of a skipped instruction.
+  entry.arguments = ko::fromJsonValue(Json{{"bookmark", r.value("bookmark", 0)},
+                                           {"type", ""},
+                                           {"text", r.value("actionText", "")},
+                                           {"error", nullptr},
+                                           {"outcome", outcome},
+                                           {"arrivedUs", time("bookmarkUs")},
+                                           {"startUs", time("beginUs")},
+                                           {"endUs", end}});
+  return entry;
+}
+
 std::string indexPage(Host& host) {
   std::string page =
       "<!DOCTYPE html><html lang=\"en\"><head><meta charset=\"utf-8\"><title>zefoko</title>"
@@ -137,9 +167,8 @@ class HttpServer::Live {
         return;
       entry.serial = ++fSerial;
       fEntries.push_back(std::move(entry));
-      while (!fEntries.empty() &&
-             (fEntries.size() > kLiveHistoryEntries ||
-              fEntries.front().us < fEntries.back().us - kLiveHistoryUs)) {
+      while (!fEntries.empty() && (fEntries.size() > kLiveHistoryEntries ||
+                                   fEntries.front().us < fEntries.back().us - kLiveHistoryUs)) {
         // The angles that leave the history stay in the pose it starts from.
         if (fEntries.front().angles.is_object()) {
           for (const auto& [joint, angle] : fEntries.front().angles.items())
@@ -166,8 +195,8 @@ class HttpServer::Live {
     for (const auto& e : fEntries)
       entries += (entries.empty() ? "" : ",") + e.json;
     serial = fSerial;
-    return "{\"joints\":" + dump(viewer::jointsJson()) +
-           ",\"sampleUs\":" + std::to_string(static_cast<std::int64_t>(1e6 / kAngleSamplesPerSecond)) +
+    return "{\"joints\":" + dump(viewer::jointsJson()) + ",\"sampleUs\":" +
+           std::to_string(static_cast<std::int64_t>(1e6 / kAngleSamplesPerSecond)) +
            ",\"nowUs\":" + std::to_string(nowUs) + ",\"entries\":[" + entries + "]}";
   }
 
@@ -236,7 +265,8 @@ HttpOptions parseHttpAddress(std::string_view text) {
   int value = 0;
   for (const char c : port) {
     if (c < '0' || c > '9' || value > 65535)
-      throw HttpError("the port must be a number from 0 to 65535, not \"" + std::string(port) + "\"");
+      throw HttpError("the port must be a number from 0 to 65535, not \"" + std::string(port) +
+                      "\"");
     value = value * 10 + (c - '0');
   }
   if (value > 65535)
@@ -257,28 +287,28 @@ HttpServer::HttpServer(Host& host, HttpOptions options)
   }
   httplib::Server& server = *fServer;
 
-  server.set_pre_routing_handler([this, loopback](const httplib::Request& req,
-                                                  httplib::Response& res) {
-    using Handled = httplib::Server::HandlerResponse;
-    if (loopback && fOptions.token.empty() &&
-        !isLoopbackAddress(hostName(req.get_header_value("Host")))) {
-      answer(res, 403, {{"error", "this server answers loopback host names only"}});
-      return Handled::Handled;
-    }
-    if (fOptions.token.empty())
-      return Handled::Unhandled;
-    const std::string bearer = req.get_header_value("Authorization");
-    if ((bearer.rfind("Bearer ", 0) == 0 && sameSecret(bearer.substr(7), fOptions.token)) ||
-        sameSecret(cookieValue(req.get_header_value("Cookie"), kTokenCookie), fOptions.token))
-      return Handled::Unhandled;
-    if (req.has_param("token") && sameSecret(req.get_param_value("token"), fOptions.token)) {
-      res.set_header("Set-Cookie", std::string(kTokenCookie) + "=" + fOptions.token +
-                                       "; Path=/; HttpOnly; SameSite=Strict");
-      return Handled::Unhandled;
-    }
-    answer(res, 401, {{"error", "this server needs its token (?token=, or a Bearer header)"}});
-    return Handled::Handled;
-  });
+  server.set_pre_routing_handler(
+      [this, loopback](const httplib::Request& req, httplib::Response& res) {
+        using Handled = httplib::Server::HandlerResponse;
+        if (loopback && fOptions.token.empty() &&
+            !isLoopbackAddress(hostName(req.get_header_value("Host")))) {
+          answer(res, 403, {{"error", "this server answers loopback host names only"}});
+          return Handled::Handled;
+        }
+        if (fOptions.token.empty())
+          return Handled::Unhandled;
+        const std::string bearer = req.get_header_value("Authorization");
+        if ((bearer.rfind("Bearer ", 0) == 0 && sameSecret(bearer.substr(7), fOptions.token)) ||
+            sameSecret(cookieValue(req.get_header_value("Cookie"), kTokenCookie), fOptions.token))
+          return Handled::Unhandled;
+        if (req.has_param("token") && sameSecret(req.get_param_value("token"), fOptions.token)) {
+          res.set_header("Set-Cookie", std::string(kTokenCookie) + "=" + fOptions.token +
+                                           "; Path=/; HttpOnly; SameSite=Strict");
+          return Handled::Unhandled;
+        }
+        answer(res, 401, {{"error", "this server needs its token (?token=, or a Bearer header)"}});
+        return Handled::Handled;
+      });
 
   server.Get("/", [this](const httplib::Request&, httplib::Response& res) {
     res.set_content(indexPage(fHost), kHtml);
@@ -289,12 +319,10 @@ HttpServer::HttpServer(Host& host, HttpOptions options)
     res.set_content(lines.str(), "application/x-ndjson; charset=utf-8");
   });
   // Pages without an icon of their own (the modules') make the browser ask for one.
-  server.Get("/favicon.ico", [](const httplib::Request&, httplib::Response& res) {
-    res.status = 204;
-  });
-  server.Get("/live", [](const httplib::Request&, httplib::Response& res) {
-    res.set_redirect("/live/");
-  });
+  server.Get("/favicon.ico",
+             [](const httplib::Request&, httplib::Response& res) { res.status = 204; });
+  server.Get("/live",
+             [](const httplib::Request&, httplib::Response& res) { res.set_redirect("/live/"); });
   server.Get("/live/", [](const httplib::Request&, httplib::Response& res) {
     res.set_content(viewer::livePage("zefoko: the robot, live"), kHtml);
   });
@@ -348,19 +376,33 @@ HttpServer::HttpServer(Host& host, HttpOptions options)
     res.set_content(module->httpGet(), kHtml);
   });
 
-  fPort = fOptions.port == 0 ? server.bind_to_any_port(fOptions.address)
-                             : (server.bind_to_port(fOptions.address, fOptions.port)
-                                    ? fOptions.port
-                                    : -1);
+  fPort = fOptions.port == 0
+              ? server.bind_to_any_port(fOptions.address)
+              : (server.bind_to_port(fOptions.address, fOptions.port) ? fOptions.port : -1);
   if (fPort <= 0) {
-    throw HttpError("cannot listen on " + fOptions.address + ":" +
-                    std::to_string(fOptions.port));
+    throw HttpError("cannot listen on " + fOptions.address + ":" + std::to_string(fOptions.port));
   }
   // The live page draws the joints that move, from the pose it starts from.
   host.robot().timeline()->addListener([weak = std::weak_ptr<Live>(fLive)](const auto& entry) {
     if (const auto live = weak.lock())
       live->push(entry);
   });
+  const auto modules = host.moduleNames();
+  if (std::find(modules.begin(), modules.end(), "ZUMokuto") != modules.end()) {
+    try {
+      fReporter = host.broker()->session()->service("ZUMokuto").value(kServiceLookupMs);
+    } catch (const std::exception& e) {
+      KO_LOG_WARNING(kCategory) << "The live page shows no actions: " << e.what();
+    }
+  }
+  if (fReporter) {
+    fReports = fReporter->connect(
+        "actionReported", [weak = std::weak_ptr<Live>(fLive),
+                           timeline = host.robot().timeline()](ko::AnyValue report) {
+          if (const auto live = weak.lock())
+            live->push(actionEntry(report, timeline->originUs(), timeline->now()));
+        });
+  }
   host.robot().motion()->sampleAngles(kAngleSamplesPerSecond);
   host.robot().motion()->recordPose();
   fThread = std::thread([this] { fServer->listen_after_bind(); });
@@ -379,6 +421,14 @@ std::string HttpServer::url() const {
 
 void HttpServer::stop() {
   fLive->close();
+  if (fReporter) {
+    try {
+      fReporter->disconnect(fReports);
+    } catch (const std::exception& e) {
+      KO_LOG_WARNING(kCategory) << "The action reports stay linked: " << e.what();
+    }
+    fReporter.reset();
+  }
   if (fThread.joinable()) {
     fServer->stop();
     fThread.join();
@@ -396,8 +446,10 @@ void HttpServer::xEval(const httplib::Request& req, httplib::Response& res) {
   try {
     call = parseEvalCall(text);
   } catch (const EvalSyntaxError& e) {
-    answer(res, 400, {{"error", std::string("not a call of the form Module.method('text', 12, "
-                                            "0.5, ...): ") + e.what()}});
+    answer(res, 400,
+           {{"error", std::string("not a call of the form Module.method('text', 12, "
+                                  "0.5, ...): ") +
+                          e.what()}});
     return;
   }
   ko::AnyObject object;

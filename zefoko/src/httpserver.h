@@ -2,7 +2,8 @@
 // The host's pages over HTTP: an index of the modules, each module's page (its httpGet)
 // at /<Module>/ with the calls that the page asks for ("?eval=", see evalcall.h), the
 // robot's timeline as JSON lines at /timeline, and the live page of the robot at /live/,
-// which follows the timeline through server-sent events (/live/events).
+// which follows the timeline through server-sent events (/live/events), with the actions
+// that the service ZUMokuto of the process reports (its signal "actionReported").
 //
 // It listens on loopback addresses only, unless it has a token: then every request must
 // carry it (an "Authorization: Bearer" header, a "zefoko_token" cookie, or "?token=" once,
@@ -11,8 +12,9 @@
 // asks for are refused.
 //
 // Built and stopped by one thread; requests are served on the server's own threads; the
-// timeline's listener runs in the threads that record. The live streams share one queue
-// of recent entries under its own mutex.
+// timeline's listener runs in the threads that record, the reports of actions in the
+// threads that say the texts. The live streams share one queue of recent entries under its
+// own mutex.
 
 #include <memory>
 #include <ostream>
@@ -23,6 +25,8 @@
 
 #include <CLI/CLI.hpp>
 
+#include "ko/anyvalue.hpp"
+#include "ko/signal.hpp"
 #include "zefoko/host.h"
 
 namespace httplib {
@@ -74,6 +78,9 @@ class HttpServer {
   const HttpOptions fOptions;
   int fPort = 0;
   std::shared_ptr<Live> fLive;
+  // The service whose action reports the live page shows (null without one), and the link.
+  ko::AnyObject fReporter;
+  ko::SignalLink fReports = 0;
   std::unique_ptr<httplib::Server> fServer;
   std::thread fThread;
 };

@@ -261,7 +261,8 @@ async function timelineOf(base) {
 }
 
 async function liveScenario(zefoko, module, artefacts) {
-  const server = childProcess.spawn(zefoko, ["serve", "--speech", "timing", "--http", "127.0.0.1:0", module], { stdio: ["ignore", "pipe", "pipe"] });
+  // Listening for other processes too: the pages and they share the robot.
+  const server = childProcess.spawn(zefoko, ["serve", "--speech", "timing", "--listen", "tcp://127.0.0.1:*", "--http", "127.0.0.1:0", module], { stdio: ["ignore", "pipe", "pipe"] });
   let serverErrors = "";
   server.stderr.on("data", (chunk) => (serverErrors += chunk));
   const browser = await launchChromium();
@@ -286,6 +287,9 @@ async function liveScenario(zefoko, module, artefacts) {
     check(started, "a click on " + link.name + " runs it on the robot (its timeline)");
     check(true, "the live page shows " + link.name);
     await untilInPage(live, "window.mokutoViewer.model.behaviours.every((b) => b.endUs !== null)", "the behaviour's end on the live page");
+    const said = await get(base + "ZUMokuto/?eval=" + encodeURIComponent("ZUMokuto.say('Hi ^start(animations/Stand/Gestures/Hey_1) there')"));
+    check(said.status === 200 || said.status === 202, "a text said through a page's call", said.status + " " + said.body);
+    await untilInPage(live, "window.mokutoViewer.model.actions.some((a) => a.text.includes('Hey_1') && a.outcome === 'executed')", "the text's action on the live page");
     await screenshot(live, path.join(artefacts, "live.png"));
 
     const before = (await timelineOf(base)).filter((e) => !(e.service === "ZUMotion" && e.operation === "angles")).length;

@@ -295,11 +295,14 @@
         }
       });
       const actionRow = 18;
-      lane("actions", Math.max(24, model.actions.length * actionRow + 4), (g) => {
-        model.actions.forEach((a, k) => {
-          const start = a.startUs !== null && a.startUs !== undefined ? a.startUs : a.arrivedUs || a.bookmarkUs || a.us;
-          const end = a.endUs !== null && a.endUs !== undefined ? a.endUs : start;
-          if (end < fromUs || start > toUs) return;
+      const actionStart = (a) => (a.startUs !== null && a.startUs !== undefined ? a.startUs : a.arrivedUs || a.bookmarkUs || a.us);
+      const actionEnd = (a) => (a.endUs !== null && a.endUs !== undefined ? a.endUs : actionStart(a));
+      // One row per action in view (the live page's texts come and go).
+      const shownActions = model.actions.filter((a) => actionEnd(a) >= fromUs && actionStart(a) <= toUs);
+      lane("actions", Math.max(24, shownActions.length * actionRow + 4), (g) => {
+        shownActions.forEach((a, k) => {
+          const start = actionStart(a);
+          const end = actionEnd(a);
           const sync = a.startUs != null && a.bookmarkUs != null ? ((a.startUs - a.bookmarkUs) / 1000).toFixed(2) + " ms" : "";
           const shown = a.error ? a.text.substring(a.error.length + 1) : a.text;
           const label = (shown.startsWith(a.type) ? "" : a.type + " ") + shown + " · " + a.outcome + (a.error ? ": " + a.error : "") + (sync ? " · sync " + sync : "");
