@@ -1,5 +1,7 @@
 #include <gtest/gtest.h>
 
+#include <string>
+
 #include "robotsim/robot.h"
 #include "zu/zuerror.h"
 #include "zu/zuserviceproxies.h"
@@ -49,3 +51,15 @@ TEST(Robot, AServiceThatCannotStartWithdrawsTheOthers) {
 }
 
 }  // namespace
+
+TEST(Timeline, KeepsItsLastEntriesWhenBounded) {
+  robotsim::Timeline timeline;
+  for (int k = 0; k < 5; ++k)
+    timeline.record("S", std::to_string(k));
+  timeline.setCapacity(3);
+  timeline.record("S", "5");
+  const auto entries = timeline.entries();
+  ASSERT_EQ(entries.size(), 3u);
+  EXPECT_EQ(entries.front().operation, "3");
+  EXPECT_EQ(entries.back().operation, "5");
+}

@@ -27,6 +27,8 @@ struct ServeOptions {
   std::string speech = "espeak";
   bool fast = false;
   std::string posture;
+  // The robot's timeline keeps its last entries alone: hours of angle samples would not fit.
+  std::size_t timelineEntries = 50'000;
   std::string listen;
   std::string connect;
   int heartbeatMs = 500;
@@ -158,6 +160,8 @@ int serve(const ServeOptions& o) {
   try {
     options.remote = remote;
     Host host(options);
+    if (host.hasRobot())
+      host.robot().timeline()->setCapacity(o.timelineEntries);
     if (!o.listen.empty())
       std::cout << "zefoko serve: listening on " << host.endpoint() << std::endl;
     if (!o.connect.empty()) {
@@ -229,6 +233,14 @@ void addServeCommand(CLI::App& app, int& status) {
           ->add_option("--posture", options->posture,
                        "The robot's posture family at start (default: Standing, the robot's own)")
           ->check(CLI::IsMember({"Standing", "Sitting", "SittingOnChair"}));
+  auto* timelineEntries =
+      command
+          ->add_option("--timeline-entries", options->timelineEntries,
+                       "How many of its last entries the robot's timeline keeps (what --http "
+                       "serves at /timeline), 1000 to 10^7")
+          ->check(CLI::Range(std::size_t{1000}, std::size_t{10'000'000}))
+          ->type_name("N")
+          ->capture_default_str();
   auto* listen =
       command
           ->add_option("--listen", options->listen,
@@ -247,7 +259,7 @@ void addServeCommand(CLI::App& app, int& status) {
   // The pages follow the robot of this process.
   CLI::Option* http = addHttpOptions(*command, options->http);
   listen->excludes(connect);
-  for (auto* robotOption : {speech, fast, posture, http})
+  for (auto* robotOption : {speech, fast, posture, timelineEntries, http})
     robotOption->excludes(connect);
   command
       ->add_option("--heartbeat", options->heartbeatMs,

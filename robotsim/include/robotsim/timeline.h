@@ -9,6 +9,7 @@
 
 #include <chrono>
 #include <cstdint>
+#include <deque>
 #include <functional>
 #include <mutex>
 #include <optional>
@@ -50,6 +51,9 @@ class Timeline {
   std::vector<TimelineEntry> entries(const std::string& service,
                                      const std::string& operation) const;
   void clear();
+  // Keeps the last `entries` entries, the older ones dropped as new ones come (0, the
+  // default: every entry), for a robot that runs for hours. The listeners hear every entry.
+  void setCapacity(std::size_t entries);
 
   // One JSON object per line: {"us":…,"service":…,"operation":…,"arguments":…,"result":…},
   // for every entry or those that `keep` accepts.
@@ -66,7 +70,8 @@ class Timeline {
 
   mutable std::mutex mutex_;
   std::chrono::steady_clock::time_point start_;
-  std::vector<TimelineEntry> entries_;
+  std::deque<TimelineEntry> entries_;
+  std::size_t capacity_ = 0;
   std::vector<Listener> listeners_;
 };
 
