@@ -18,7 +18,7 @@ void addAnalyseCommand(CLI::App& app, int& status);
 void addEmotionCommand(CLI::App& app, int& status);
 // mokuto say [--mode M] [--language L] [--posture P] [--speech espeak|timing] [--fast]
 //            [--config JSON] [--tags-to-words JSON] [--tags-to-animations JSON]
-//            [--package NAME]... [--check-times] [--wav FILE] [--timeline FILE]
+//            [--package NAME]... [--check-times] [--wav FILE] [--html FILE] [--timeline FILE]
 //            [--dry-run] [--quiet] [TEXT]
 void addSayCommand(CLI::App& app, int& status);
 // mokuto syntax

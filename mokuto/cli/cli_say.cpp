@@ -12,6 +12,7 @@
 #include <map>
 #include <memory>
 #include <optional>
+#include <sstream>
 #include <string>
 #include <tuple>
 #include <utility>
@@ -20,6 +21,7 @@
 #include "cli_commands.h"
 #include "cli_common.h"
 #include "cli_json.h"
+#include "cli_sayperformance.h"
 #include "cli_saytimeline.h"
 #include "cli_service.h"
 #include "cli_signals.h"
@@ -56,6 +58,7 @@ struct SayOptions {
   std::vector<std::string> packages;
   bool checkTimes = false;
   std::string wav;
+  std::string html;
   std::string timeline;
   bool dryRun = false;
   bool quiet = false;
@@ -169,12 +172,15 @@ std::optional<Refusal> checkValues(const SayOptions& o, Values& values) {
       return Refusal{message};
     }
   }
-  for (const auto& [option, path] : {std::pair{"--wav", &o.wav}, {"--timeline", &o.timeline}}) {
+  for (const auto& [option, path] :
+       {std::pair{"--wav", &o.wav}, {"--html", &o.html}, {"--timeline", &o.timeline}}) {
     if (const std::string error = checkOutputPath(option, *path); !error.empty())
       return Refusal{error};
   }
   if (o.dryRun && !o.wav.empty())
     return Refusal{"--wav has no audio to write with --dry-run"};
+  if (o.dryRun && !o.html.empty())
+    return Refusal{"--html has no performance to draw with --dry-run"};
   return std::nullopt;
 }
 
@@ -190,7 +196,7 @@ std::optional<Refusal> checkRemote(const CLI::App& command) {
   }
   if (command.count("--dry-run") > 0)
     return Refusal{"--dry-run needs the service in this process (without --connect)"};
-  for (const char* option : {"--wav", "--faults"}) {
+  for (const char* option : {"--wav", "--html", "--faults"}) {
     if (command.count(option) > 0)
       return Refusal{std::string(option) + " needs the robot in this process (without --connect)"};
   }
@@ -368,10 +374,14 @@ int say(SayOptions& o, const CLI::App& command) {
     serviceOptions.fast = o.fast;
     serviceOptions.language = o.language;
     serviceOptions.posture = o.posture;
-    serviceOptions.recordAudio = !o.wav.empty();
+    serviceOptions.recordAudio = !o.wav.empty() || !o.html.empty();
+    if (!o.html.empty() || !o.timeline.empty())
+      serviceOptions.angleSamplesPerSecond = kAngleSamplesPerSecond;
     serviceOptions.faults = o.faults;
     const std::unique_ptr<ServiceHandle> handle = openService(serviceOptions);
     ServiceHandle& service = *handle;
+    // In this process alone: with --connect, the audio and the samples stay with the robot.
+    robotsim::Robot* const robot = service.localRobot();
     if (const auto refusal = configureService(o, values, service))
       return refuse(*refusal);
     warnAboutText(text);
@@ -391,15 +401,22 @@ int say(SayOptions& o, const CLI::App& command) {
       // Set once a signal has asked the text to stop while the service had it.
       std::atomic<bool> stopAsked{false};
       service.setDirectorObserver(recorder);
+      const bool drawn = robot != nullptr && serviceOptions.angleSamplesPerSecond > 0;
       service.setStageObserver([&](ZU::ZUMokutoStage stage, ZU::MKID id) {
         recorder->stage(stage, id);
+        if (stage != ZU::ZUMokutoStage::Compiler)
+          return;
+        // The pose the performance starts from; the samples tell the joints that move.
+        if (drawn)
+          robot->motion()->recordPose();
         // A signal that came before the service registered the text stopped nothing yet.
-        if (stage == ZU::ZUMokutoStage::Compiler && signals.received()) {
+        if (signals.received()) {
           stopAsked.store(true);
           service.stop(id);
         }
       });
       service.timeline()->clear();
+      const std::int64_t originUs = service.timeline()->now();
       recorder->begin(text);
       {
         // Whatever say does, the signals and the service forget the callbacks on its way
@@ -425,10 +442,13 @@ int say(SayOptions& o, const CLI::App& command) {
       }
       ZU::MKID id = 0;
       const SaySummary summary = recorder->end(stopAsked.load() || signals.received(), &id);
+      const std::int64_t endUs = service.timeline()->now();
       SayTimeline::printSummary(std::cout, id, summary);
-      if (!o.wav.empty()) {
-        service.saveRecording(o.wav);
-        std::cout << "Audio written to " << o.wav << '\n';
+      if (robot) {
+        std::ostringstream summaryText;
+        SayTimeline::printSummary(summaryText, id, summary);
+        writePerformanceFiles({o.wav, o.html}, *robot, *recorder, text, summaryText.str(), originUs,
+                              endUs, std::cout);
       }
       if (timelineFile.is_open()) {
         recorder->writeJsonLines(timelineFile);
@@ -509,7 +529,15 @@ void addSayCommand(CLI::App& app, int& status) {
   command->add_flag("--check-times", o->checkTimes,
                     "Switch the timing checker on (ZUMokuto/StartOfMK and StopOfMK, and the "
                     "durations in the log category mokuto.times; default: off)");
-  command->add_option("--wav", o->wav, "Write the audio of the whole performance to this WAV file")
+  command
+      ->add_option("--wav", o->wav,
+                   "Write the audio of the whole performance to this WAV file: the speech and "
+                   "every sound, mixed at the times they played")
+      ->type_name("FILE");
+  command
+      ->add_option("--html", o->html,
+                   "Write the viewer of the performance to this HTML file: one page, audio "
+                   "included, that draws the timeline and the robot and plays them")
       ->type_name("FILE");
   command
       ->add_option("--timeline", o->timeline, "Write the whole timeline to this file as JSON lines")
@@ -544,7 +572,8 @@ void addSayCommand(CLI::App& app, int& status) {
       "service fails; 130 when SIGINT (Ctrl-C) or SIGTERM stopped the text (its summary and "
       "files still come; a second signal, or one before the text is handed to the service, "
       "ends the command at once).\nWith mokuto --connect, --speech, --fast, --language and "
-      "--posture belong to the robot's process (zefoko serve --listen), and --wav, --faults "
+      "--posture belong to the robot's process (zefoko serve --listen), and --wav, --html, "
+      "--faults "
       "and --dry-run need the service in this one: they are usage errors.\nWarnings about the text "
       "and log lines go to standard error, warnings and errors only unless ZEFOKO_LOG sets "
       "the levels.");

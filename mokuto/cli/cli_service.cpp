@@ -35,6 +35,7 @@ EmbeddedService::EmbeddedService(const EmbeddedServiceOptions& options) {
   zefoko::HostOptions host;
   host.robot.speech.language = options.language;
   host.robot.speech.recordAudio = options.recordAudio;
+  host.robot.angleSamplesPerSecond = options.angleSamplesPerSecond;
   if (options.speech == "timing")
     host.robot.speech.backend = robotsim::ZUTextToSpeechOptions::Backend::Timing;
   if (options.fast)
@@ -419,9 +420,6 @@ void RemoteService::say(const std::string& text, const ZU::ZUValue& configuratio
 }
 void RemoteService::stop(ZU::MKID id) {
   fService->call<void>("stop", static_cast<int>(id));
-}
-void RemoteService::saveRecording(const std::string&) {
-  throw ServiceError("the audio stays in the robot's process");
 }
 
 std::vector<ZU::ZUMethodInfo> RemoteService::getMethodInfos() {

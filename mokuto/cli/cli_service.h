@@ -35,6 +35,8 @@ struct EmbeddedServiceOptions {
   bool recordAudio = false;
   // The robot's faults (robotsim/faults.h); empty for none.
   std::string faults;
+  // How often the joint angles go on the timeline while they move; 0 for never.
+  double angleSamplesPerSecond = 0;
 };
 
 // The robot or the module cannot start, or the index is not built in time.
@@ -91,7 +93,9 @@ class ServiceHandle {
   virtual void say(const std::string& text) = 0;
   virtual void say(const std::string& text, const ZU::ZUValue& configuration) = 0;
   virtual void stop(ZU::MKID id) = 0;
-  virtual void saveRecording(const std::string& path) = 0;
+  // The robot when it runs in this process, else null: the audio of a performance and the
+  // sampled pose stay in the robot's process.
+  virtual robotsim::Robot* localRobot() { return nullptr; }
   virtual std::vector<ZU::ZUMethodInfo> getMethodInfos() = 0;
   virtual std::vector<std::string> _getTagList() = 0;
   virtual std::vector<std::string> _getAnimationsByTag(const std::string& tag) = 0;
@@ -147,7 +151,7 @@ class EmbeddedService : public ServiceHandle {
     fService->say(text, configuration);
   }
   void stop(ZU::MKID id) override { fService->stop(id); }
-  void saveRecording(const std::string& path) override { robot().speech()->saveRecording(path); }
+  robotsim::Robot* localRobot() override { return &robot(); }
   std::vector<ZU::ZUMethodInfo> getMethodInfos() override { return fService->getMethodInfos(); }
   std::vector<std::string> _getTagList() override { return fService->_getTagList(); }
   std::vector<std::string> _getAnimationsByTag(const std::string& tag) override {
@@ -195,7 +199,6 @@ class RemoteService : public ServiceHandle {
   void say(const std::string& text) override;
   void say(const std::string& text, const ZU::ZUValue& configuration) override;
   void stop(ZU::MKID id) override;
-  void saveRecording(const std::string& path) override;
   std::vector<ZU::ZUMethodInfo> getMethodInfos() override;
   std::vector<std::string> _getTagList() override;
   std::vector<std::string> _getAnimationsByTag(const std::string& tag) override;

@@ -4,12 +4,14 @@
 #include <shared_mutex>
 #include <sstream>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "loadertask.h"
 #include "mokuto/zumokuto.h"
 #include "robotbodytalk/zurobotbodytalkposture.h"
 #include "zu/enums.h"
+#include "zu/zuhtml.h"
 #include "zu/zuserviceproxies.h"
 
 namespace ZU {
@@ -58,6 +60,25 @@ constexpr const char* kLinkEnd = "</a>";
 constexpr const char* kNextLink = "<br/><a href=\"javascript:runBehavior('";
 constexpr const char* kTableEnd = "</table>";
 constexpr const char* kPageEnd = "</body></html>";
+
+// A name inside runBehavior('...') in a link's javascript: address: every character that
+// the quoted string, the address's percent-decoding or the attribute could read otherwise
+// is written as a JavaScript escape, so the link runs the behaviour of that very name.
+std::string scriptArgument(const std::string& name) {
+  std::string out;
+  for (const char c : name) {
+    const auto byte = static_cast<unsigned char>(c);
+    if (byte < 0x20 || byte == 0x7f || std::string_view("\\'\"<>&%").find(c) != std::string_view::npos) {
+      static constexpr char kHex[] = "0123456789abcdef";
+      out += "\\x";
+      out += kHex[byte >> 4];
+      out += kHex[byte & 0xf];
+    } else {
+      out += c;
+    }
+  }
+  return out;
+}
 
 const char* trueFalse(bool value) {
   return value ? "true" : "false";
@@ -178,16 +199,16 @@ std::string ZUMokuto::httpGet() {
       if ((!tag.empty() && tag.front() == '.') || tag == "animationMode")
         continue;
       page += kRowStart;
-      page += tag;
+      page += escapeHtml(tag);
       page += kCellBreak;
       if (animations.empty() || animations.begin()->empty())
         continue;
       bool first = true;
       for (const auto& animation : animations) {
         page += first ? kFirstLink : kNextLink;
-        page += animation;
+        page += scriptArgument(animation);
         page += kLinkMiddle;
-        page += animation;
+        page += escapeHtml(animation);
         page += kLinkEnd;
         first = false;
       }

@@ -648,15 +648,19 @@ TEST_F(ServiceIndex, TagPageListsTheVisibleTags) {
 
   behaviors_->setLibrary({{"animations/Stand/A", {"hello", ".hidden"}},
                           {"animations/Stand/B", {"hello", "animationMode"}},
-                          {"animations/Sit/C", {"sit"}}});
+                          {"animations/Sit/C", {"sit"}},
+                          {"animations/Sit/O'Neil&%27<b>", {"<sit>"}}});
   changed({"animations/Stand/A"});
   EXPECT_EQ(mokuto_->_getTagList(),
-            (std::vector<std::string>{".hidden", "animationMode", "hello", "sit"}));
+            (std::vector<std::string>{".hidden", "<sit>", "animationMode", "hello", "sit"}));
   EXPECT_EQ(mokuto_->_getAnimationsByTag("hello"),
             (std::vector<std::string>{"animations/Stand/A", "animations/Stand/B"}));
   EXPECT_TRUE(mokuto_->_getAnimationsByTag("nothing").empty());
   const std::string link = "<a href=\"javascript:runBehavior('";
+  // Names are escaped: the text for HTML, the link's argument for its script.
   const std::string rows =
+      "<tr><td>&lt;sit&gt;</td><td>" + link +
+      "animations/Sit/O\\x27Neil\\x26\\x2527\\x3cb\\x3e');\">animations/Sit/O&#39;Neil&amp;%27&lt;b&gt;</a>" +
       "<tr><td>hello</td><td>" + link + "animations/Stand/A');\">animations/Stand/A</a><br/>" +
       link + "animations/Stand/B');\">animations/Stand/B</a>" + "<tr><td>sit</td><td>" + link +
       "animations/Sit/C');\">animations/Sit/C</a>";

@@ -31,9 +31,10 @@ Robot::Robot(RobotOptions options, std::shared_ptr<ZU::ZUBroker> broker)
     ZUMemoryOptions memory;
     memory.timeline = fTimeline;
     xStart<ZUMemory>("ZUMemory", memory);
-    xStart<ZUMotion>("ZUMotion", fTimeline);
+    fMotion = xStart<ZUMotion>("ZUMotion", fTimeline);
+    fMotion->sampleAngles(options.angleSamplesPerSecond);
     xStart<ZUBehaviorManager>("ZUBehaviorManager", fTimeline, options.behaviorsRoot, fFaults);
-    xStart<ZUAudioPlayer>("ZUAudioPlayer", fTimeline, options.soundsRoot);
+    fAudioPlayer = xStart<ZUAudioPlayer>("ZUAudioPlayer", fTimeline, options.soundsRoot);
     xStart<ZURobotPosture>("ZURobotPosture", fTimeline);
     xStart<ZURobotModel>("ZURobotModel", options.robotType);
     xStart<ZUAutonomousMoves>("ZUAutonomousMoves", fTimeline);
@@ -69,6 +70,8 @@ void Robot::xShutdown() noexcept {
     }
   }
   fSpeech.reset();
+  fMotion.reset();
+  fAudioPlayer.reset();
 }
 
 }  // namespace robotsim

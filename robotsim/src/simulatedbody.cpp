@@ -40,6 +40,41 @@ void SimulatedBody::setMoveEndListener(MoveEndListener listener) {
   fListener = std::move(listener);
 }
 
+void SimulatedBody::setAngleSampler(std::chrono::microseconds period, AngleSampler sampler) {
+  std::lock_guard lock(fMutex);
+  fSampler = std::move(sampler);
+  fSamplePeriod = std::max(period, fTick);
+  fSampled = fAngles;
+  fLastSample = Clock::now();
+}
+
+void SimulatedBody::xSample(std::unique_lock<std::mutex>& lock, bool now) {
+  if (!fSampler)
+    return;
+  const auto at = Clock::now();
+  // Half a tick early is on time: the ticks come every fTick, a little late at times.
+  if (!now && at - fLastSample + fTick / 2 < fSamplePeriod)
+    return;
+  std::vector<std::pair<std::size_t, double>> moved;
+  for (std::size_t j = 0; j < fAngles.size(); ++j) {
+    if (fAngles[j] != fSampled[j]) {
+      moved.emplace_back(j, fAngles[j]);
+      fSampled[j] = fAngles[j];
+    }
+  }
+  if (moved.empty())
+    return;
+  fLastSample = at;
+  const AngleSampler sampler = fSampler;
+  lock.unlock();
+  try {
+    sampler(moved);
+  } catch (const std::exception& e) {
+    KO_LOG_ERROR("robotsim.motion") << "The angle sampler threw: " << e.what();
+  }
+  lock.lock();
+}
+
 std::vector<double> SimulatedBody::angles(const std::vector<std::size_t>& joints) const {
   std::lock_guard lock(fMutex);
   std::vector<double> out;
@@ -233,6 +268,8 @@ void SimulatedBody::xRun() {
   std::unique_lock lock(fMutex);
   while (!fQuit) {
     if (fMoves.empty()) {
+      // Where the moves left the joints.
+      xSample(lock, true);
       fWake.wait(lock, [this] { return fQuit || !fMoves.empty(); });
       fLastTick = Clock::now();
       continue;
@@ -246,6 +283,7 @@ void SimulatedBody::xRun() {
       xNotifyEnded(finished, false);
       lock.lock();
     }
+    xSample(lock, false);
   }
 }
 

@@ -2,6 +2,8 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstring>
+#include <optional>
 #include <utility>
 
 #include "ko/log.hpp"
@@ -225,9 +227,30 @@ void SpeechPlayer::xPlay(const std::shared_ptr<SpeechUtterance>& shared) {
   }
   xNotify([this, shared] { fListener.onStarted(*shared); });
   SteadyClock::time_point origin = SteadyClock::now();
+  if (fRecording)
+    fRecording->setStart(origin);
   std::vector<std::pair<std::uint64_t, std::uint64_t>> holds;
   bool stopped = false;
   std::string error;
+  // Tells the words that begin before `sample` (all of them for none), each when playback
+  // reaches it; false when the text was stopped meanwhile.
+  std::size_t wordsTold = 0;
+  auto playWordsBefore = [&](std::optional<std::uint64_t> sample) {
+    const auto words = performance.words();
+    for (; wordsTold < words.size(); ++wordsTold) {
+      const SpeechPerformance::Word& word = words[wordsTold];
+      if (sample && word.sample >= *sample)
+        break;
+      const std::int64_t wordUs = audioUs(word.sample);
+      if (realTime && !performance.waitUntil(deadline(origin, wordUs)))
+        return false;
+      const std::int64_t playbackUs = realTime ? clockUs(origin) : wordUs;
+      xNotify([this, shared, word, wordUs, playbackUs] {
+        fListener.onWord(*shared, word, wordUs, playbackUs);
+      });
+    }
+    return true;
+  };
 
   for (std::size_t i = 0; i < utterance.script.marks.size(); ++i) {
     const SpeechMark& mark = utterance.script.marks[i];
@@ -247,6 +270,10 @@ void SpeechPlayer::xPlay(const std::shared_ptr<SpeechUtterance>& shared) {
       break;
     }
     SpeechMarkRecord record{mark.number, mark.blocking, audioUs(*position), 0, 0};
+    if (!playWordsBefore(*position)) {
+      stopped = true;
+      break;
+    }
     if (realTime) {
       record.dueUs = microseconds(deadline(origin, record.audioUs).time_since_epoch());
       if (!performance.waitUntil(deadline(origin, record.audioUs))) {
@@ -289,7 +316,8 @@ void SpeechPlayer::xPlay(const std::shared_ptr<SpeechUtterance>& shared) {
   if (!stopped && error.empty()) {
     if (const auto total = performance.waitForEnd()) {
       totalUs = audioUs(*total);
-      if (realTime && !performance.waitUntil(deadline(origin, totalUs)))
+      if (!playWordsBefore(std::nullopt) ||
+          (realTime && !performance.waitUntil(deadline(origin, totalUs))))
         stopped = true;
     } else if (performance.isCancelled()) {
       stopped = true;

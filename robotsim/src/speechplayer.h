@@ -64,6 +64,9 @@ class SpeechPlayerListener {
                                               std::int32_t number) = 0;
   // After each mark is dealt with (after the hold of a blocking one).
   virtual void onMarkDone(const SpeechUtterance& utterance, const SpeechMarkRecord& record) = 0;
+  // Playback reached a word: its audio time and the playback clock's time.
+  virtual void onWord(const SpeechUtterance& utterance, const SpeechPerformance::Word& word,
+                      std::int64_t audioUs, std::int64_t playbackUs) = 0;
   virtual void onEnded(const SpeechUtterance& utterance, bool stopped, std::int64_t playedUs,
                        const std::string& error) = 0;
 };

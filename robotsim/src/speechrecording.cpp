@@ -57,10 +57,35 @@ std::uint64_t SpeechRecording::length() const {
   return fLength;
 }
 
+void SpeechRecording::setStart(std::chrono::steady_clock::time_point start) {
+  std::lock_guard lock(fMutex);
+  if (!fStart)
+    fStart = start;
+}
+
+std::optional<std::chrono::steady_clock::time_point> SpeechRecording::start() const {
+  std::lock_guard lock(fMutex);
+  return fStart;
+}
+
+std::vector<std::int16_t> SpeechRecording::samples() const {
+  std::lock_guard lock(fMutex);
+  std::vector<std::int16_t> out;
+  out.reserve(fLength);
+  for (const auto& segment : fSegments) {
+    if (segment.audio.empty())
+      out.insert(out.end(), segment.silence, 0);
+    else
+      out.insert(out.end(), segment.audio.begin(), segment.audio.end());
+  }
+  return out;
+}
+
 void SpeechRecording::clear() {
   std::lock_guard lock(fMutex);
   fSegments.clear();
   fLength = 0;
+  fStart.reset();
 }
 
 void SpeechRecording::writeWav(const std::filesystem::path& path) const {

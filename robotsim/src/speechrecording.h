@@ -3,9 +3,11 @@
 // synthesis rate: each text's audio with the silences of its blocking bookmarks, and the
 // silences between texts. Silences are kept as lengths, not samples. Thread-safe.
 
+#include <chrono>
 #include <cstdint>
 #include <filesystem>
 #include <mutex>
+#include <optional>
 #include <utility>
 #include <vector>
 
@@ -23,6 +25,12 @@ class SpeechRecording {
                   const std::vector<std::pair<std::uint64_t, std::uint64_t>>& holds);
   void appendSilence(std::uint64_t length);
   std::uint64_t length() const;
+  // When the first sample played: the player sets it as the first text begins (later
+  // calls change nothing until clear).
+  void setStart(std::chrono::steady_clock::time_point start);
+  std::optional<std::chrono::steady_clock::time_point> start() const;
+  // Every sample, the silences written out.
+  std::vector<std::int16_t> samples() const;
   void clear();
   // Raises std::runtime_error with libsndfile's reason when the file cannot be written.
   void writeWav(const std::filesystem::path& path) const;
@@ -38,6 +46,7 @@ class SpeechRecording {
   mutable std::mutex fMutex;
   std::vector<Segment> fSegments;
   std::uint64_t fLength = 0;
+  std::optional<std::chrono::steady_clock::time_point> fStart;
 };
 
 }  // namespace robotsim

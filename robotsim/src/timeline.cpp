@@ -29,6 +29,11 @@ std::int64_t Timeline::now() const {
       .count();
 }
 
+std::int64_t Timeline::usAt(std::chrono::steady_clock::time_point moment) const {
+  std::lock_guard lock(mutex_);
+  return std::chrono::duration_cast<std::chrono::microseconds>(moment - start_).count();
+}
+
 std::int64_t Timeline::originUs() const {
   std::lock_guard lock(mutex_);
   return std::chrono::duration_cast<std::chrono::microseconds>(start_.time_since_epoch()).count();
@@ -58,6 +63,8 @@ void Timeline::xRecord(std::optional<std::int64_t> us, std::string service, std:
                           std::move(service), std::move(operation), std::move(arguments),
                           std::move(result)};
     entries_.push_back(entry);
+    if (capacity_ > 0 && entries_.size() > capacity_)
+      entries_.pop_front();
     listeners = listeners_;
   }
   for (const auto& listener : listeners) {
@@ -75,7 +82,7 @@ void Timeline::xRecord(std::optional<std::int64_t> us, std::string service, std:
 
 std::vector<TimelineEntry> Timeline::entries() const {
   std::lock_guard lock(mutex_);
-  return entries_;
+  return {entries_.begin(), entries_.end()};
 }
 
 std::vector<TimelineEntry> Timeline::entries(const std::string& service,
@@ -93,6 +100,13 @@ void Timeline::clear() {
   std::lock_guard lock(mutex_);
   entries_.clear();
   start_ = std::chrono::steady_clock::now();
+}
+
+void Timeline::setCapacity(std::size_t entries) {
+  std::lock_guard lock(mutex_);
+  capacity_ = entries;
+  while (capacity_ > 0 && entries_.size() > capacity_)
+    entries_.pop_front();
 }
 
 void Timeline::writeJsonLines(std::ostream& os,

@@ -21,6 +21,7 @@ namespace {
 constexpr const char* kCategory = "robotsim.audioplayer";
 constexpr const char* kClass = "ZUAudioPlayer";
 constexpr std::size_t kLoopThreads = 4;
+constexpr std::size_t kHistorySize = 256;
 
 fs::path defaultRoot(std::string root) {
   if (root.empty())
@@ -179,6 +180,11 @@ void ZUAudioPlayer::playSoundSetFile(const std::string& soundSet, const std::str
       // play yet is seen here.
       play = fNextPlay++;
       fPlays[play] = Play{task ? task->id() : -1, task && task->isStopRequested()};
+      fHistory.emplace_back(
+          play, SoundPlayRecord{soundSet, name, file->second.path, position, volume, balance, loop,
+                                std::chrono::steady_clock::now(), std::nullopt, false});
+      while (fHistory.size() > kHistorySize)
+        fHistory.pop_front();
     }
   }
   if (!refusal.empty())
@@ -200,6 +206,12 @@ void ZUAudioPlayer::playSoundSetFile(const std::string& soundSet, const std::str
     }
     stopped = fPlays.at(play).stopped;
     fPlays.erase(play);
+    for (auto& [serial, record] : fHistory) {
+      if (serial == play) {
+        record.end = std::chrono::steady_clock::now();
+        record.stopped = stopped;
+      }
+    }
   }
   xRecord(stopped ? "soundStopped" : "soundEnded", ko::AnyValue::list({soundSet, name}));
 }
@@ -230,6 +242,14 @@ void ZUAudioPlayer::stopAll() {
   }
   fPlayStopped.notify_all();
   xRecord("stopAll", ko::AnyValue::list({}));
+}
+
+std::vector<SoundPlayRecord> ZUAudioPlayer::playRecords() const {
+  std::lock_guard lock(fMutex);
+  std::vector<SoundPlayRecord> out;
+  for (const auto& [serial, record] : fHistory)
+    out.push_back(record);
+  return out;
 }
 
 void ZUAudioPlayer::exit() {

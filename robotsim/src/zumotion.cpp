@@ -1,6 +1,7 @@
 #include "robotsim/zumotion.h"
 
 #include <algorithm>
+#include <chrono>
 #include <cmath>
 #include <sstream>
 #include <utility>
@@ -87,6 +88,7 @@ ZUMotion::ZUMotion(const std::shared_ptr<ZU::ZUBroker>& broker, const std::strin
 
 ZUMotion::~ZUMotion() {
   fBody.setMoveEndListener(nullptr);
+  fBody.setAngleSampler({}, nullptr);
 }
 
 void ZUMotion::xBindMethods() {
@@ -325,6 +327,35 @@ int ZUMotion::_startBezierMove(const ko::AnyValue& jointNames, const ko::AnyValu
                               std::max(durationOf(tracks), static_cast<double>(minDuration))}),
           moveId);
   return moveId;
+}
+
+void ZUMotion::sampleAngles(double perSecond) {
+  if (!(perSecond > 0) || !std::isfinite(perSecond)) {
+    fBody.setAngleSampler({}, nullptr);
+    return;
+  }
+  const auto period = std::chrono::microseconds(static_cast<std::int64_t>(1e6 / perSecond));
+  fBody.setAngleSampler(period, [this](const auto& angles) { xRecordAngles(angles); });
+}
+
+void ZUMotion::recordPose() {
+  std::vector<std::size_t> joints(bodyJoints().size());
+  for (std::size_t j = 0; j < joints.size(); ++j)
+    joints[j] = j;
+  const std::vector<double> angles = fBody.angles(joints);
+  std::vector<std::pair<std::size_t, double>> pose;
+  for (std::size_t j = 0; j < joints.size(); ++j)
+    pose.emplace_back(j, angles[j]);
+  xRecordAngles(pose);
+}
+
+void ZUMotion::xRecordAngles(const std::vector<std::pair<std::size_t, double>>& angles) {
+  ko::AnyValue::Map map;
+  for (const auto& [joint, angle] : angles) {
+    // A hundred-thousandth of a radian is finer than any drawing.
+    map.emplace_back(bodyJoints()[joint].name, std::round(angle * 1e5) / 1e5);
+  }
+  xRecord("angles", ko::AnyValue::map(std::move(map)));
 }
 
 bool ZUMotion::_stopMove(int moveId) {

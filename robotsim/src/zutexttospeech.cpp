@@ -101,6 +101,16 @@ class ZUTextToSpeech::Listener : public SpeechPlayerListener {
                  markResult(record));
   }
 
+  void onWord(const SpeechUtterance& u, const SpeechPerformance::Word& word, std::int64_t audioUs,
+              std::int64_t playbackUs) override {
+    const std::string text =
+        word.offset < u.text.size() ? u.text.substr(word.offset, word.length) : std::string();
+    fTts.xRecord("word",
+                 ko::AnyValue::List{u.id, static_cast<std::int64_t>(word.offset),
+                                    static_cast<std::int64_t>(word.length), text},
+                 ko::AnyValue::map({{"audioUs", audioUs}, {"playbackUs", playbackUs}}));
+  }
+
   void onEnded(const SpeechUtterance& u, bool stopped, std::int64_t playedUs,
                const std::string& error) override {
     xReleaseHeld();
@@ -419,6 +429,10 @@ std::vector<SpeechWordRecord> ZUTextToSpeech::wordRecords(int id) const {
 
 int ZUTextToSpeech::sampleRate() const {
   return fSynthesizer->sampleRate();
+}
+
+SpeechAudio ZUTextToSpeech::recordedAudio() const {
+  return SpeechAudio{fRecording->sampleRate(), fRecording->samples(), fRecording->start()};
 }
 
 void ZUTextToSpeech::xRecord(const std::string& operation, ko::AnyValue arguments,

@@ -234,6 +234,41 @@ TEST_F(MotionService, BezierMoveEndsOnItsLastKey) {
   ASSERT_TRUE(waiter_->waitFor("ZUMotion", "moveEnded"));
 }
 
+TEST_F(MotionService, AnglesAreSampledWhileJointsMoveAndOnlyThoseThatMove) {
+  const auto sampled = [this] { return timeline_->entries("ZUMotion", "angles"); };
+  motion_->recordPose();
+  ASSERT_EQ(sampled().size(), 1u);
+  EXPECT_EQ(sampled()[0].arguments.asMap().size(), bodyJoints().size());
+
+  motion_->sampleAngles(50);
+  proxy_->angleInterpolationBezier(names("HeadYaw"), times(0.2), keys(0.5, 0.2));
+  ASSERT_TRUE(waiter_->waitFor("ZUMotion", "moveEnded"));
+  // The motion thread tells where the move left the joint before it sleeps.
+  ASSERT_TRUE(waiter_->waitUntil([&] {
+    const auto all = sampled();
+    return all.back().arguments.asMap().at(0).second.to<double>() == 0.5;
+  }));
+  const auto samples = sampled();
+  ASSERT_GE(samples.size(), 2u);
+  double previous = 0;
+  for (std::size_t k = 1; k < samples.size(); ++k) {
+    const auto& angles = samples[k].arguments.asMap();
+    ASSERT_EQ(angles.size(), 1u) << samples[k];
+    EXPECT_EQ(angles[0].first.to<std::string>(), "HeadYaw");
+    const double angle = angles[0].second.to<double>();
+    EXPECT_GE(angle, previous) << samples[k];
+    previous = angle;
+    if (k > 1) {  // a period apart, half a tick early at most
+      EXPECT_GE(samples[k].us - samples[k - 1].us, 15'000) << samples[k];
+    }
+  }
+
+  motion_->sampleAngles(0);
+  const std::size_t before = sampled().size();
+  proxy_->angleInterpolationBezier(names("HeadYaw"), times(0.1), keys(0.0, 0.1));
+  EXPECT_EQ(sampled().size(), before);
+}
+
 TEST_F(MotionService, SetAnglesReachesItsTargetsAtOnceReturning) {
   proxy_->setAngles(ZUValue::makeArray({"HeadYaw", "HeadPitch"}), ZUValue::makeArray({0.4, -0.2}),
                     1.0f);

@@ -2,6 +2,8 @@
 // state (posture family, model).
 #include <gtest/gtest.h>
 
+#include <string>
+
 #include "ko/log.hpp"
 #include "robotsim/robot.h"
 #include "robotsim/zurobotstate.h"
@@ -80,3 +82,15 @@ TEST(Robot, PostureFamilyChangesRaiseTheirEventOnce) {
 }
 
 }  // namespace
+
+TEST(Timeline, KeepsItsLastEntriesWhenBounded) {
+  robotsim::Timeline timeline;
+  for (int k = 0; k < 5; ++k)
+    timeline.record("S", std::to_string(k));
+  timeline.setCapacity(3);
+  timeline.record("S", "5");
+  const auto entries = timeline.entries();
+  ASSERT_EQ(entries.size(), 3u);
+  EXPECT_EQ(entries.front().operation, "3");
+  EXPECT_EQ(entries.back().operation, "5");
+}

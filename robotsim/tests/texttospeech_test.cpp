@@ -205,6 +205,20 @@ TEST(TextToSpeechEspeak, BookmarksArriveInOrderAtTheirAudioTimes) {
   const auto entries = robot.timeline->entries("ZUTextToSpeech", "bookmark");
   ASSERT_EQ(entries.size(), 5U);
   EXPECT_EQ(entries[1].arguments.asList().at(1).to<int>(), 2);
+  // And each word as playback reaches it, "there" after the bookmark before it.
+  const auto spoken = robot.timeline->entries("ZUTextToSpeech", "word");
+  ASSERT_EQ(spoken.size(), records.size());
+  for (std::size_t i = 0; i < spoken.size(); ++i) {
+    const auto& arguments = spoken[i].arguments.asList();
+    EXPECT_EQ(arguments.at(3).to<std::string>(), words[i]);
+    EXPECT_EQ(arguments.at(1).to<std::size_t>(), records[i].offset);
+    const auto& times = spoken[i].result.asMap();
+    EXPECT_EQ(times.at(0).second.to<std::int64_t>(), records[i].audioUs);
+    EXPECT_NEAR(times.at(1).second.to<double>(), static_cast<double>(records[i].audioUs),
+                kToleranceUs);
+  }
+  EXPECT_LT(entries[0].us, spoken[1].us);
+  EXPECT_GT(entries[0].us, spoken[0].us);
 }
 
 TEST(TextToSpeechEspeak, BlockingBookmarkHoldsTheSpeechUntilItsCallbackReturns) {

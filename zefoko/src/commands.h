@@ -9,9 +9,11 @@ namespace zefoko {
 void addSpeakCommand(CLI::App& app, int& status);
 // zefoko bodytalk [--seconds N] [--posture Standing|Sitting|SittingOnChair] [--json]
 void addBodyTalkCommand(CLI::App& app, int& status);
-// zefoko serve [--speech espeak|timing] [--fast] [--posture P] [--listen E | --connect E]
+// zefoko serve [--speech espeak|timing] [--fast] [--posture P] [--timeline-entries N]
+//              [--listen E | --connect E]
 //              [--heartbeat MS] [--max-message BYTES] [--secret-key F] [--client-key F]...
-//              [--server-key F] [MODULE.so...]
+//              [--server-key F] [--http ADDRESS:PORT [--http-token T]]
+//              [MODULE.so...]
 void addServeCommand(CLI::App& app, int& status);
 // zefoko keys DIR [--name NAME] [--force]
 void addKeysCommand(CLI::App& app, int& status);

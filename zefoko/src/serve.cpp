@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "commands.h"
+#include "httpserver.h"
 #include "ko/log.hpp"
 #include "ko/remote.hpp"
 #include "zefoko/host.h"
@@ -26,6 +27,8 @@ struct ServeOptions {
   std::string speech = "espeak";
   bool fast = false;
   std::string posture;
+  // The robot's timeline keeps its last entries alone: hours of angle samples would not fit.
+  std::size_t timelineEntries = 50'000;
   std::string listen;
   std::string connect;
   int heartbeatMs = 500;
@@ -34,6 +37,7 @@ struct ServeOptions {
   std::vector<std::string> clientKeys;
   std::string serverKey;
   std::vector<std::string> libraries;
+  HttpCommandOptions http;
 };
 
 // What the main thread waits for: a stop signal, or the robot's process coming back.
@@ -103,8 +107,9 @@ int serve(const ServeOptions& o) {
     std::cerr << "zefoko serve: --connect needs module libraries to serve" << std::endl;
     return 2;
   }
-  if (o.libraries.empty() && o.listen.empty()) {
-    std::cerr << "zefoko serve: nothing to serve: give module libraries, or --listen" << std::endl;
+  if (o.libraries.empty() && o.listen.empty() && o.http.address.empty()) {
+    std::cerr << "zefoko serve: nothing to serve: give module libraries, --listen or --http"
+              << std::endl;
     return 2;
   }
   // The keys and the endpoint, before anything starts.
@@ -155,6 +160,8 @@ int serve(const ServeOptions& o) {
   try {
     options.remote = remote;
     Host host(options);
+    if (host.hasRobot())
+      host.robot().timeline()->setCapacity(o.timelineEntries);
     if (!o.listen.empty())
       std::cout << "zefoko serve: listening on " << host.endpoint() << std::endl;
     if (!o.connect.empty()) {
@@ -173,6 +180,7 @@ int serve(const ServeOptions& o) {
         std::cout << ' ' << name;
       std::cout << std::endl;
     }
+    auto http = startHttpServer(host, o.http, std::cout);
     std::cout << "zefoko serve: serving; stop with Ctrl-C (SIGINT) or SIGTERM" << std::endl;
     int received = 0;
     while ((received = events.wait()) == 0) {
@@ -183,6 +191,7 @@ int serve(const ServeOptions& o) {
     }
     std::cout << "zefoko serve: " << (received == SIGINT ? "SIGINT" : "SIGTERM") << ", stopping"
               << std::endl;
+    http.reset();
     host.shutdown();
   } catch (const HostError& e) {
     std::cerr << "zefoko serve: " << e.what() << std::endl;
@@ -224,6 +233,14 @@ void addServeCommand(CLI::App& app, int& status) {
           ->add_option("--posture", options->posture,
                        "The robot's posture family at start (default: Standing, the robot's own)")
           ->check(CLI::IsMember({"Standing", "Sitting", "SittingOnChair"}));
+  auto* timelineEntries =
+      command
+          ->add_option("--timeline-entries", options->timelineEntries,
+                       "How many of its last entries the robot's timeline keeps (what --http "
+                       "serves at /timeline), 1000 to 10^7")
+          ->check(CLI::Range(std::size_t{1000}, std::size_t{10'000'000}))
+          ->type_name("N")
+          ->capture_default_str();
   auto* listen =
       command
           ->add_option("--listen", options->listen,
@@ -239,8 +256,10 @@ void addServeCommand(CLI::App& app, int& status) {
                        "robot's options (--speech, --fast, --posture); this one has no robot "
                        "(default: none, the robot in this process)")
           ->type_name("ENDPOINT");
+  // The pages follow the robot of this process.
+  CLI::Option* http = addHttpOptions(*command, options->http);
   listen->excludes(connect);
-  for (auto* robotOption : {speech, fast, posture})
+  for (auto* robotOption : {speech, fast, posture, timelineEntries, http})
     robotOption->excludes(connect);
   command
       ->add_option("--heartbeat", options->heartbeatMs,
@@ -276,7 +295,7 @@ void addServeCommand(CLI::App& app, int& status) {
   command
       ->add_option("libraries", options->libraries,
                    "The module libraries (.so) to load (default: none, the robot alone, which "
-                   "needs --listen)")
+                   "needs --listen or --http)")
       ->check(CLI::ExistingFile)
       ->type_name("LIBRARY");
   command->callback([options, &status] { status = serve(*options); });

@@ -401,34 +401,98 @@ TEST_F(MokutoCommand, SaysAnAnnotatedTextOnTheTimingEngine) {
   EXPECT_TRUE(last["result"]["syncMedianUs"].is_null());
 }
 
-TEST_F(MokutoCommand, SpeaksOnEspeakAsTheReadmeShows) {
-  const Ran r =
-      run("say --mode random --wav " + quoted((folder / "out.wav").string()) + " --timeline " +
-          quoted((folder / "timeline.jsonl").string()) + " " + quoted(kText));
-  ASSERT_EQ(r.status, 0) << r.err;
+struct Sound {
+  std::vector<float> samples;
+  int rate = 0;
+};
 
+Sound readSound(const std::filesystem::path& path) {
   SF_INFO info{};
-  SNDFILE* file = sf_open((folder / "out.wav").c_str(), SFM_READ, &info);
-  ASSERT_NE(file, nullptr) << sf_strerror(nullptr);
-  std::vector<float> samples(static_cast<std::size_t>(info.frames * info.channels));
-  sf_readf_float(file, samples.data(), info.frames);
+  SNDFILE* file = sf_open(path.c_str(), SFM_READ, &info);
+  EXPECT_NE(file, nullptr) << path << ": " << sf_strerror(nullptr);
+  if (!file)
+    return {};
+  Sound sound{std::vector<float>(static_cast<std::size_t>(info.frames * info.channels)),
+              info.samplerate};
+  sf_readf_float(file, sound.samples.data(), info.frames);
   sf_close(file);
-  std::size_t loud = 0;
-  for (const float sample : samples)
-    loud += std::fabs(sample) > 0.05F ? 1U : 0U;
-  // Speech, not silence: a few tenths of a second of clearly non-zero samples at least.
-  EXPECT_GT(loud, static_cast<std::size_t>(info.samplerate) / 10);
+  return sound;
+}
 
-  const auto lines = timeline();
-  const auto actions = actionsOf(lines);
-  ASSERT_EQ(actions.size(), 4u);
-  for (const auto& action : actions) {
-    SCOPED_TRACE(action.dump());
-    EXPECT_EQ(action["outcome"], "executed");
-    ASSERT_TRUE(action["bookmarkUs"].is_number());
-    EXPECT_GE(action["startUs"].get<std::int64_t>(), action["bookmarkUs"].get<std::int64_t>());
+// The loudness of seconds [from, to) of a sound.
+double rms(const Sound& sound, double from, double to) {
+  const auto rate = static_cast<double>(sound.rate);
+  const auto begin = static_cast<std::size_t>(std::max(0.0, from) * rate);
+  const auto end = std::min(sound.samples.size(), static_cast<std::size_t>(to * rate));
+  double sum = 0;
+  for (std::size_t i = begin; i < end; ++i)
+    sum += static_cast<double>(sound.samples[i]) * sound.samples[i];
+  return end > begin ? std::sqrt(sum / static_cast<double>(end - begin)) : 0.0;
+}
+
+TEST_F(MokutoCommand, TheWavHoldsTheSpeechAndEverySoundAtItsTime) {
+  struct WavCase {
+    const char* name;
+    std::string options;
+    std::string text;
+    const char* sound;  // of the set "bells"
+    double volume;
+    bool stopped;
+  };
+  const std::vector<WavCase> cases = {
+      // The README's example: the speech waits while the sound plays.
+      {"the README's example", "",
+       "Hello ^start(animations/Stand/Gestures/Hey_1) my friend, "
+       "^wait(animations/Stand/Gestures/Hey_1) how are you today? ^runSound(bells/ding, 50) "
+       "$greeted=1 See you soon!",
+       "ding", 0.5, false},
+      // No speech audio from the timing engine: the sound alone, cut at its stop.
+      {"a sound that the text stops", "--speech timing --mode disabled",
+       "^startSound(bells/chime, 100) Hi ^stopSound(bells/chime) there", "chime", 1.0, true},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.name);
+    const Ran r =
+        run("say " + c.options + " --wav " + quoted((folder / "out.wav").string()) +
+            " --timeline " + quoted((folder / "timeline.jsonl").string()) + " " + quoted(c.text));
+    ASSERT_EQ(r.status, 0) << r.err;
+    const auto lines = timeline();
+    const long play = find(lines, entryWith("ZUAudioPlayer", "playSoundSetFile", 1, c.sound));
+    const long end = find(lines, [&](const Json& line) {
+      return line["service"] == "ZUAudioPlayer" && line["arguments"].size() == 2 &&
+             (line["operation"] == "soundEnded" || line["operation"] == "soundStopped");
+    });
+    ASSERT_GE(play, 0);
+    ASSERT_GT(end, play);
+    EXPECT_EQ(lines[static_cast<std::size_t>(end)]["operation"],
+              c.stopped ? "soundStopped" : "soundEnded");
+    // The audio begins when the text is handed to the service, as the timeline does.
+    const double start = lines[static_cast<std::size_t>(play)]["us"].get<double>() / 1e6;
+    const double stop = lines[static_cast<std::size_t>(end)]["us"].get<double>() / 1e6;
+    const Sound wav = readSound(folder / "out.wav");
+    const Sound file = readSound(std::filesystem::path(MOKUTO_SOUNDS_DIR) / "bells" /
+                                 (std::string(c.sound) + ".wav"));
+    // 10 ms inside either end: the times of the timeline are those of the calls.
+    const double heard = rms(wav, start + 0.01, stop - 0.01);
+    const double expected = c.volume * rms(file, 0.01, stop - start - 0.01);
+    EXPECT_NEAR(heard, expected, expected * 0.15) << "from " << start << " s to " << stop << " s";
+    if (c.stopped) {
+      EXPECT_EQ(rms(wav, stop + 0.005, static_cast<double>(wav.samples.size()) / wav.rate), 0.0);
+      EXPECT_GT(rms(file, stop - start + 0.005, 1.0), 0.01) << "the file goes on after the stop";
+    } else {
+      // Speech, not silence, around it: a few tenths of a second of clearly non-zero samples.
+      const auto loud = std::count_if(wav.samples.begin(), wav.samples.end(),
+                                      [](float v) { return std::fabs(v) > 0.05F; });
+      EXPECT_GT(loud, wav.rate / 10);
+      for (const auto& action : actionsOf(lines)) {
+        SCOPED_TRACE(action.dump());
+        EXPECT_EQ(action["outcome"], "executed");
+        ASSERT_TRUE(action["bookmarkUs"].is_number());
+        EXPECT_GE(action["startUs"].get<std::int64_t>(), action["bookmarkUs"].get<std::int64_t>());
+      }
+      EXPECT_TRUE(lines.back()["result"]["syncMedianUs"].is_number());
+    }
   }
-  EXPECT_TRUE(lines.back()["result"]["syncMedianUs"].is_number());
 }
 
 TEST_F(MokutoCommand, DryRunShowsWhatTheLoaderResolvedWithoutSpeaking) {

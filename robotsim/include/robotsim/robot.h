@@ -15,6 +15,8 @@
 
 #include "robotsim/faults.h"
 #include "robotsim/timeline.h"
+#include "robotsim/zuaudioplayer.h"
+#include "robotsim/zumotion.h"
 #include "robotsim/zutexttospeech.h"
 #include "zu/zubroker.h"
 #include "zu/zumodule.h"
@@ -31,6 +33,9 @@ struct RobotOptions {
   // Faults that strike the services' calls, the speech engine's bookmarks and the
   // behaviour manager's stops (null: none). The robot lifts them when it shuts down.
   std::shared_ptr<FaultPlan> faults;
+  // How often the motion service records the angles of the joints that move on the
+  // timeline (ZUMotion::sampleAngles); 0 for never.
+  double angleSamplesPerSecond = 0;
 };
 
 class Robot {
@@ -48,6 +53,8 @@ class Robot {
   const std::shared_ptr<ZUTextToSpeech>& speech() const noexcept { return fSpeech; }
   // The plan of the options; null when there is none.
   const std::shared_ptr<FaultPlan>& faults() const noexcept { return fFaults; }
+  const std::shared_ptr<ZUMotion>& motion() const noexcept { return fMotion; }
+  const std::shared_ptr<ZUAudioPlayer>& audioPlayer() const noexcept { return fAudioPlayer; }
 
  private:
   void xShutdown() noexcept;
@@ -59,6 +66,8 @@ class Robot {
   std::shared_ptr<FaultPlan> fFaults;
   std::shared_ptr<Timeline> fTimeline;
   std::shared_ptr<ZUTextToSpeech> fSpeech;
+  std::shared_ptr<ZUMotion> fMotion;
+  std::shared_ptr<ZUAudioPlayer> fAudioPlayer;
   std::vector<std::shared_ptr<ZU::ZUModuleCore>> fServices;  // in start order
 };
 

@@ -7,7 +7,8 @@
 // a move left without joints ends as interrupted. Angles always stay within the joint
 // limits. Every function may be called from any thread. The end listener runs outside the
 // body's lock, in the motion thread for a move that ends by itself and in the calling
-// thread for a move that is stopped or taken over; it may call the body again.
+// thread for a move that is stopped or taken over; it may call the body again. The angle
+// sampler runs in the motion thread, outside the lock.
 
 #include <chrono>
 #include <condition_variable>
@@ -17,6 +18,7 @@
 #include <map>
 #include <mutex>
 #include <thread>
+#include <utility>
 #include <vector>
 
 #include "robotsim/bezier.h"
@@ -36,6 +38,12 @@ class SimulatedBody {
 
   // Set before moves start.
   void setMoveEndListener(MoveEndListener listener);
+
+  // (joint, angle) of the joints whose angle changed since the last sample.
+  using AngleSampler = std::function<void(const std::vector<std::pair<std::size_t, double>>&)>;
+  // While moves run, tells the joints that moved every `period`, and once more where the
+  // moves leave them; null stops sampling.
+  void setAngleSampler(std::chrono::microseconds period, AngleSampler sampler);
 
   // The current (commanded) angles of those joints.
   std::vector<double> angles(const std::vector<std::size_t>& joints) const;
@@ -76,6 +84,9 @@ class SimulatedBody {
   void xErase(int id);
   void xNotifyEnded(const std::vector<int>& ids, bool interrupted);
   void xRun();
+  // With fMutex held by `lock` (released while the sampler runs): tells the joints that
+  // moved, once a period has passed since the last sample or at once when `now` is set.
+  void xSample(std::unique_lock<std::mutex>& lock, bool now);
   // With fMutex held: advances every move to `now`; answers the moves that finished.
   std::vector<int> xTick(Clock::time_point now);
 
@@ -90,6 +101,10 @@ class SimulatedBody {
   std::map<int, Move> fMoves;
   int fNextId = 1;
   Clock::time_point fLastTick;
+  AngleSampler fSampler;
+  std::chrono::microseconds fSamplePeriod{0};
+  std::vector<double> fSampled;  // the angles told last
+  Clock::time_point fLastSample;
   bool fQuit = false;
   std::thread fThread;
 };

@@ -9,6 +9,7 @@
 
 #include <chrono>
 #include <cstdint>
+#include <deque>
 #include <functional>
 #include <mutex>
 #include <optional>
@@ -36,6 +37,8 @@ class Timeline {
               ko::AnyValue result = {});
   // Microseconds since the timeline began (or was last cleared).
   std::int64_t now() const;
+  // The same of a moment of the steady clock (negative before the timeline began).
+  std::int64_t usAt(std::chrono::steady_clock::time_point moment) const;
   // When it began, on ko::os::ustime()'s clock (the steady clock of the machine).
   std::int64_t originUs() const;
   // Records an entry that happened at `us` (on this timeline's clock), elsewhere: a mirror
@@ -48,6 +51,9 @@ class Timeline {
   std::vector<TimelineEntry> entries(const std::string& service,
                                      const std::string& operation) const;
   void clear();
+  // Keeps the last `entries` entries, the older ones dropped as new ones come (0, the
+  // default: every entry), for a robot that runs for hours. The listeners hear every entry.
+  void setCapacity(std::size_t entries);
 
   // One JSON object per line: {"us":…,"service":…,"operation":…,"arguments":…,"result":…},
   // for every entry or those that `keep` accepts.
@@ -64,7 +70,8 @@ class Timeline {
 
   mutable std::mutex mutex_;
   std::chrono::steady_clock::time_point start_;
-  std::vector<TimelineEntry> entries_;
+  std::deque<TimelineEntry> entries_;
+  std::size_t capacity_ = 0;
   std::vector<Listener> listeners_;
 };
 

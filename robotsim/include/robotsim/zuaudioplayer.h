@@ -4,16 +4,19 @@
 // output.
 //
 // Calls arrive on ko threads, several at once; posted plays run on the module's own event
-// loop and block one of its threads for their duration. The loaded sets and the plays in
-// progress are guarded by one mutex; a play waits on a condition variable that stop and
-// stopAll notify.
+// loop and block one of its threads for their duration. The loaded sets, the plays in
+// progress and the record of past plays are guarded by one mutex; a play waits on a
+// condition variable that stop and stopAll notify.
 
+#include <chrono>
 #include <condition_variable>
+#include <deque>
 #include <cstdint>
 #include <filesystem>
 #include <map>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -22,6 +25,21 @@
 #include "zu/zumodule.h"
 
 namespace robotsim {
+
+// One play of a sound file, for the whole audio of a performance.
+struct SoundPlayRecord {
+  std::string soundSet;
+  std::string sound;
+  std::filesystem::path file;
+  double position = 0;  // seconds into the file
+  double volume = 1;
+  double balance = 0;
+  bool loop = false;
+  std::chrono::steady_clock::time_point start;
+  // When it ended or was stopped; nothing while it plays.
+  std::optional<std::chrono::steady_clock::time_point> end;
+  bool stopped = false;
+};
 
 class ZUAudioPlayer : public ZU::ZUModule {
  public:
@@ -51,6 +69,10 @@ class ZUAudioPlayer : public ZU::ZUModule {
                         double volume, double balance, bool loop);
   void stopAll();
 
+  // ---- inspection ----
+  // The last 256 plays, in the order they began, those in progress included.
+  std::vector<SoundPlayRecord> playRecords() const;
+
  private:
   struct Play {
     int taskId = -1;  // -1 for a call that was not posted
@@ -63,11 +85,12 @@ class ZUAudioPlayer : public ZU::ZUModule {
   const std::shared_ptr<Timeline> fTimeline;
   const std::filesystem::path fRoot;
 
-  std::mutex fMutex;
+  mutable std::mutex fMutex;
   std::condition_variable fPlayStopped;
   std::map<std::string, SoundSet> fLoaded;
   std::map<std::uint64_t, Play> fPlays;
   std::uint64_t fNextPlay = 1;
+  std::deque<std::pair<std::uint64_t, SoundPlayRecord>> fHistory;  // by play serial
 };
 
 }  // namespace robotsim

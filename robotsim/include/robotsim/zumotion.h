@@ -16,6 +16,7 @@
 #include <mutex>
 #include <set>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "ko/anyvalue.hpp"
@@ -65,12 +66,20 @@ class ZUMotion : public ZU::ZUModule {
   bool _stopMove(int moveId);
   bool _isMoveRunning(int moveId);
 
+  // ---- for the readers of the timeline ----
+  // Records the angles of the joints that move, `perSecond` times a second while moves run
+  // and where they leave the joints, as "angles" entries {joint name: radians}; 0 stops.
+  void sampleAngles(double perSecond);
+  // Records every joint's angle now as one "angles" entry.
+  void recordPose();
+
  private:
   void xBindMethods();
   void xOnMoveEnded(int moveId, bool interrupted);
   // Logs one warning per joint whose keys go beyond its limits (they will be clamped).
   void xWarnBeyondLimits(const std::string& method, const std::vector<JointTrack>& tracks);
   void xRecord(const std::string& operation, ko::AnyValue arguments, ko::AnyValue result = {});
+  void xRecordAngles(const std::vector<std::pair<std::size_t, double>>& angles);
   // The breathing chains named by a chain name; raises ZUError for another name.
   std::vector<std::string> xBreathChains(const std::string& method, const std::string& chain);
 

@@ -5,8 +5,8 @@
 // them on a silent output with a real-time playback clock, raises
 // "ZUTextToSpeech/CurrentBookMark" and "ZUTextToSpeech/Status" through ZUMemory, holds the
 // speech at each "mrkpause" bookmark while the blocking bookmark handler's
-// "_mrkpauseCallback" runs, and keeps a recording of what it played and the audio times
-// of its words.
+// "_mrkpauseCallback" runs, records each word on the timeline as playback reaches it, and
+// keeps a recording of what it played and the audio times of its words.
 //
 // Threads: calls arrive on ko threads; posted says run one at a time, in the order they
 // were posted, on the module's own one-thread event loop and wait there until their text
@@ -38,6 +38,7 @@
 #include <map>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -76,6 +77,14 @@ struct ZUTextToSpeechOptions {
   std::shared_ptr<Timeline> timeline;
   // The bookmark faults of this plan strike the events and blocking calls (null: none).
   std::shared_ptr<FaultPlan> faults;
+};
+
+// Everything the engine played since it started, silences included.
+struct SpeechAudio {
+  int sampleRate = 0;
+  std::vector<std::int16_t> samples;  // mono
+  // When the first sample played; nothing before the first text.
+  std::optional<std::chrono::steady_clock::time_point> start;
 };
 
 class ZUTextToSpeech : public ZU::ZUModule {
@@ -121,6 +130,8 @@ class ZUTextToSpeech : public ZU::ZUModule {
   // caller's text.
   std::vector<SpeechWordRecord> wordRecords(int id) const;
   int sampleRate() const;
+  // The recording (empty when the audio is not kept).
+  SpeechAudio recordedAudio() const;
 
  private:
   class Listener;

@@ -6,6 +6,7 @@
 #include <chrono>
 #include <condition_variable>
 #include <cstddef>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <string>
@@ -24,6 +25,10 @@ class TimelineWaiter {
   // recorded since the waiter was made.
   bool waitFor(const std::string& service, const std::string& operation, std::size_t count = 1,
                std::chrono::milliseconds bound = std::chrono::seconds(10)) const;
+  // Waits at most `bound` until `done` answers true; it is asked at once and after each
+  // entry, outside the timeline's lock.
+  bool waitUntil(const std::function<bool()>& done,
+                 std::chrono::milliseconds bound = std::chrono::seconds(10)) const;
 
  private:
   struct State;

@@ -1,0 +1,165 @@
+// The whole audio of a performance: the speech and the sounds mixed at their times,
+// resampled, cut where they were stopped, looped, clipped; measured as the loudness (RMS)
+// of stretches of the mix.
+
+#include <sndfile.h>
+
+#include <algorithm>
+#include <cmath>
+#include <cstdint>
+#include <fstream>
+#include <iterator>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "robotsim/performanceaudio.h"
+#include "support/scratch_folder.h"
+
+namespace robotsim {
+namespace {
+
+namespace fs = std::filesystem;
+using simtest::ScratchFolder;
+
+constexpr double kPi = 3.14159265358979;
+constexpr int kSoundRate = 16000;  // as the sound library's files
+constexpr int kSpeechRate = 22050;
+
+// `silence` seconds of silence, then `seconds` of a 440 Hz tone of that amplitude.
+void writeTone(const fs::path& file, double silence, double seconds, double amplitude) {
+  SF_INFO info{};
+  info.samplerate = kSoundRate;
+  info.channels = 1;
+  info.format = SF_FORMAT_WAV | SF_FORMAT_PCM_16;
+  SNDFILE* sound = sf_open(file.c_str(), SFM_WRITE, &info);
+  ASSERT_NE(sound, nullptr) << sf_strerror(nullptr);
+  const auto quiet = static_cast<std::size_t>(silence * kSoundRate);
+  std::vector<float> samples(quiet + static_cast<std::size_t>(seconds * kSoundRate), 0.0F);
+  for (std::size_t i = quiet; i < samples.size(); ++i)
+    samples[i] = static_cast<float>(amplitude * std::sin(2 * kPi * 440.0 * static_cast<double>(i) / kSoundRate));
+  sf_write_float(sound, samples.data(), static_cast<sf_count_t>(samples.size()));
+  sf_close(sound);
+}
+
+double rms(const PerformanceAudio& audio, double from, double to) {
+  const auto begin = static_cast<std::size_t>(from * audio.sampleRate);
+  const auto end = std::min(audio.samples.size(), static_cast<std::size_t>(to * audio.sampleRate));
+  double sum = 0;
+  for (std::size_t i = begin; i < end; ++i)
+    sum += std::pow(audio.samples[i] / 32768.0, 2);
+  return end > begin ? std::sqrt(sum / static_cast<double>(end - begin)) : -1.0;
+}
+
+struct Sound {
+  const char* file;
+  double startS;
+  std::optional<double> endS;
+  double volume;
+  bool loop;
+  double position;
+};
+
+struct Loudness {
+  double from, to, rms;
+};
+
+struct MixCase {
+  const char* name;
+  std::vector<Sound> sounds;
+  std::optional<double> speechStartS;  // 0.1 s of speech at half of full scale
+  double toS;
+  double seconds;  // of the mix
+  std::vector<Loudness> loudness;
+  int peak;  // the largest magnitude, when checked (-1: not)
+};
+
+TEST(PerformanceAudio, MixesEverySoundAtItsTime) {
+  const ScratchFolder folder;
+  writeTone(folder.path() / "tone.wav", 0, 0.3, 0.5);
+  writeTone(folder.path() / "short.wav", 0, 0.1, 0.5);
+  writeTone(folder.path() / "loud.wav", 0, 0.2, 0.9);
+  writeTone(folder.path() / "late.wav", 0.2, 0.2, 0.5);
+  folder.write("broken.wav", "not a sound");
+  const double tone = 0.5 / std::sqrt(2.0);  // the RMS of the tone at full volume
+  const auto none = std::nullopt;
+  const std::vector<MixCase> cases = {
+      {"a sound at its time, at its volume", {{"tone.wav", 0.2, none, 0.5, false, 0}}, none, 0.6,
+       0.6, {{0.0, 0.19, 0}, {0.21, 0.49, tone / 2}, {0.51, 0.6, 0}}, -1},
+      {"a stopped sound cut at its stop", {{"tone.wav", 0.1, 0.25, 1, false, 0}}, none, 0.4, 0.4,
+       {{0.11, 0.24, tone}, {0.26, 0.4, 0}}, -1},
+      {"a sound past the end lengthens the mix", {{"tone.wav", 0.2, none, 1, false, 0}}, none, 0.1,
+       0.5, {{0.21, 0.49, tone}}, -1},
+      {"a loop until the end", {{"short.wav", 0, none, 1, true, 0}}, none, 0.5, 0.5,
+       {{0.01, 0.49, tone}}, -1},
+      {"played from a position", {{"late.wav", 0.0, none, 1, false, 0.2}}, none, 0.3, 0.3,
+       {{0.01, 0.19, tone}, {0.21, 0.3, 0}}, -1},
+      {"a sound begun before the start is heard from the start",
+       {{"tone.wav", -0.2, none, 1, false, 0}}, none, 0.2, 0.2, {{0.01, 0.09, tone}, {0.11, 0.2, 0}},
+       -1},
+      {"the speech at its time", {}, 0.05, 0.2, 0.2,
+       {{0, 0.049, 0}, {0.05, 0.15, 0.5}, {0.151, 0.2, 0}}, -1},
+      {"the speech and a sound add up", {{"tone.wav", 0.0, none, 1, false, 0}}, 0.0, 0.1, 0.3,
+       {{0.0, 0.1, std::sqrt(0.25 + tone * tone)}}, -1},
+      {"a sum beyond full scale is clipped",
+       {{"loud.wav", 0, none, 1, false, 0}, {"loud.wav", 0, none, 1, false, 0}}, none, 0.2, 0.2, {},
+       32767},
+      {"an unreadable file is left out", {{"broken.wav", 0, none, 1, false, 0}}, none, 0.1, 0.1,
+       {{0, 0.1, 0}}, -1},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.name);
+    PerformanceSpeech speech;
+    speech.sampleRate = kSpeechRate;
+    if (c.speechStartS) {
+      speech.samples.assign(kSpeechRate / 10, 16384);
+      speech.startUs = static_cast<std::int64_t>(*c.speechStartS * 1e6);
+    }
+    std::vector<PerformanceSound> sounds;
+    for (const auto& s : c.sounds) {
+      PerformanceSound sound;
+      sound.file = folder.path() / s.file;
+      sound.startUs = static_cast<std::int64_t>(s.startS * 1e6);
+      if (s.endS)
+        sound.endUs = static_cast<std::int64_t>(*s.endS * 1e6);
+      sound.volume = s.volume;
+      sound.loop = s.loop;
+      sound.position = s.position;
+      sounds.push_back(sound);
+    }
+    std::vector<std::string> skipped;
+    const PerformanceAudio audio = mixPerformanceAudio(
+        speech, sounds, 0, static_cast<std::int64_t>(c.toS * 1e6), &skipped);
+    EXPECT_EQ(audio.sampleRate, kSpeechRate);
+    EXPECT_NEAR(audio.seconds(), c.seconds, 0.002);
+    EXPECT_EQ(skipped.size(), std::string(c.name).find("unreadable") != std::string::npos ? 1u : 0u);
+    for (const auto& l : c.loudness) {
+      SCOPED_TRACE(std::to_string(l.from) + " s to " + std::to_string(l.to) + " s");
+      EXPECT_NEAR(rms(audio, l.from, l.to), l.rms, 0.02 + l.rms * 0.05);
+    }
+    if (c.peak >= 0) {
+      int peak = 0;
+      for (const auto s : audio.samples)
+        peak = std::max(peak, std::abs(static_cast<int>(s)));
+      EXPECT_EQ(peak, c.peak);
+    }
+  }
+}
+
+TEST(PerformanceAudio, WavBytesAreTheWavFile) {
+  const ScratchFolder folder;
+  PerformanceAudio audio;
+  audio.sampleRate = kSpeechRate;
+  audio.samples = {0, 1000, -1000, 32767, -32768};
+  writeWav(audio, folder.path() / "out.wav");
+  const std::string bytes = wavBytes(audio);
+  std::ifstream in(folder.path() / "out.wav", std::ios::binary);
+  const std::string file((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
+  EXPECT_EQ(bytes, file);
+  EXPECT_EQ(bytes.size(), 44u + 2 * audio.samples.size());
+}
+
+}  // namespace
+}  // namespace robotsim
