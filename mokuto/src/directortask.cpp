@@ -60,6 +60,12 @@ bool parseInt32(std::string_view text, std::int32_t& out) {
 
 }  // namespace
 
+std::cv_status DirectorClock::waitFor(std::condition_variable& condition,
+                                      std::unique_lock<std::mutex>& lock,
+                                      std::chrono::milliseconds duration) {
+  return condition.wait_for(lock, duration);
+}
+
 bool DirectorTask::AnimationOrder::operator()(const MKAnimationAction& a,
                                               const MKAnimationAction& b) const noexcept {
   return a.type != b.type ? a.type < b.type : a.id < b.id;
@@ -70,7 +76,8 @@ DirectorTask::DirectorTask(const std::shared_ptr<ZUBroker>& broker,
     : mkidRegister(textRegister),
       bodyTalk(bodyTalkController),
       fSession(broker ? broker->session() : nullptr),
-      currentText(std::make_shared<Text>(std::make_shared<MKTaskInstruction>(), nullptr)) {
+      currentText(std::make_shared<Text>(std::make_shared<MKTaskInstruction>(), nullptr)),
+      fClock(std::make_shared<DirectorClock>()) {
   tts = makeProxy<ZUTextToSpeechProxy>(broker);
   if (!tts)
     throw ZUError(kModuleName, "Constructor", "Module ZUTextToSpeech not found",
@@ -174,6 +181,11 @@ void DirectorTask::setObserver(std::shared_ptr<DirectorObserver> observer) {
   fObserver = std::move(observer);
 }
 
+void DirectorTask::setClock(std::shared_ptr<DirectorClock> clock) {
+  std::lock_guard lock(fObserverMutex);
+  fClock = clock ? std::move(clock) : std::make_shared<DirectorClock>();
+}
+
 void DirectorTask::xDropRemainingActions(Text& text) {
   MKTaskInstruction& job = *text.instruction;
   const std::int64_t now = text.observer ? ko::os::ustime() : 0;
@@ -226,9 +238,11 @@ void DirectorTask::process(const std::shared_ptr<MKTaskInstruction>& instruction
   if (!instruction)
     return;
   std::shared_ptr<DirectorObserver> observer;
+  std::shared_ptr<DirectorClock> clock;
   {
     std::lock_guard lock(fObserverMutex);
     observer = fObserver;
+    clock = fClock;
   }
   const auto text = std::make_shared<Text>(instruction, std::move(observer));
   MKTaskInstruction& job = *instruction;
@@ -323,10 +337,10 @@ void DirectorTask::process(const std::shared_ptr<MKTaskInstruction>& instruction
     }
     const bool running = xIsSpeechRunning();
     if (text->receivedBookmarks.empty() && running) {
-      text->bookmarkCondition.wait_for(lock, kBookmarkRound);
+      clock->waitFor(text->bookmarkCondition, lock, kBookmarkRound);
       continue;
     }
-    if (text->bookmarkCondition.wait_for(lock, kBookmarkGrace) == std::cv_status::no_timeout)
+    if (clock->waitFor(text->bookmarkCondition, lock, kBookmarkGrace) == std::cv_status::no_timeout)
       continue;
     if (job.currentAction < job.actions.size()) {
       const std::size_t late = job.currentAction;

@@ -20,6 +20,7 @@
 // "mrkpause" caller waits on its action's condition until the action has been executed, skipped or
 // dropped by a stop; nothing else ends its wait.
 
+#include <chrono>
 #include <condition_variable>
 #include <cstddef>
 #include <cstdint>
@@ -82,6 +83,19 @@ class DirectorObserver {
   virtual void onAction(const DirectorActionReport& report) = 0;
 };
 
+// The time in which the director waits for bookmarks: its rounds while the speech runs and
+// the give-up of a missing bookmark. The real clock; tests put in a clock that they drive.
+// Called in the director's thread with the job's mutex held by `lock`.
+class DirectorClock {
+ public:
+  virtual ~DirectorClock() = default;
+  // Waits on `condition` until it is notified or `duration` has passed on this clock
+  // (std::cv_status::timeout); a spurious wake-up may count as a notification.
+  virtual std::cv_status waitFor(std::condition_variable& condition,
+                                 std::unique_lock<std::mutex>& lock,
+                                 std::chrono::milliseconds duration);
+};
+
 class DirectorTask {
  public:
   // `bodyTalk` and `mkidRegister` belong to the module and outlive the director. Raises
@@ -120,6 +134,9 @@ class DirectorTask {
   const std::shared_ptr<MokutoTimeChecker>& getTimeChecker() const noexcept { return timeChecker; }
   // Replaces the sync observer (null: none); a text keeps the one it began with.
   void setObserver(std::shared_ptr<DirectorObserver> observer);
+  // Replaces the clock of the bookmark waits (null: the real one); a text keeps the one it
+  // began with.
+  void setClock(std::shared_ptr<DirectorClock> clock);
 
   // The path of every animation that this director started and that stopped; the module
   // connects the loader's onBehaviorStopped here.
@@ -198,6 +215,7 @@ class DirectorTask {
 
   std::mutex fObserverMutex;
   std::shared_ptr<DirectorObserver> fObserver;  // under fObserverMutex
+  std::shared_ptr<DirectorClock> fClock;        // under fObserverMutex, never null
 
   std::mutex animationsMutex;
   std::condition_variable animationsCondition;
