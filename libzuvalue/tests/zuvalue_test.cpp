@@ -359,6 +359,7 @@ TEST(ZUValueDumpTest, CompactFormOfEveryType) {
   EXPECT_EQ(ZUValue::makeObject({'{', 'x', '}'}).toString(1), "{x}");
   EXPECT_EQ(ZUValue("say \"hi\"").toString(1), "\"say \"hi\"\"");
   EXPECT_EQ(ZUValue(1e-7f).toString(1), "1e-07");
+  EXPECT_EQ(ZUValue(3.14159f).toString(1), "3.14159");
   for (const ZUValue& v : oneOfEach())
     EXPECT_EQ(v.toString(0), "");
 }

@@ -147,6 +147,14 @@ TEST(ArmsIteration, AFailedStartIsLoggedAndTheNextComesAfterARest) {
             std::chrono::milliseconds(static_cast<int>(1000 * kScale)));
 }
 
+TEST(ArmsIteration, TheListeningArmsStartAfterASecondTheSpeakingOnesAtOnce) {
+  FakeRobot robot;
+  Arms speaking(robot, 1.0);
+  Arms listening(robot, 1.0, ZURobotBodyTalkArms::kListening);
+  EXPECT_EQ(speaking.arms.getStartDelay(), 0);
+  EXPECT_EQ(listening.arms.getStartDelay(), 1);
+}
+
 // ---- the wait for the end of an animation ---------------------------------------------------
 
 TEST(ArmsIteration, ANotificationForAnotherBehaviourDoesNotWakeThem) {
