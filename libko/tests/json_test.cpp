@@ -8,7 +8,7 @@ using ko::AnyValue;
 
 TEST(Json, DecodesEveryKind) {
   const AnyValue v =
-      ko::fromJson(R"(["hello", 2, 2.5, true, null, {"b": 1, "a": [1]}, 5000000000, 2147483647])");
+      ko::fromJson(R"(["hello", 2, 2.5, true, null, {"b": 1, "a": [1]}, 5000000000, -2147483648])");
   const auto& l = v.asList();
   ASSERT_EQ(l.size(), 8u);
   EXPECT_EQ(l[0], AnyValue("hello"));

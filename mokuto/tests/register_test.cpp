@@ -73,14 +73,16 @@ TEST(TextRegister, ASharedIdentifierKeepsTheLaterTextAndItsSecondReleaseIsLogged
   auto waiter = std::async(std::launch::async, [&] {
     std::unique_lock lock(texts.textsMutex);
     waiting = true;
-    return texts.textsCondition.wait_for(lock, 10s, [&] { return texts.textsToStop.empty(); });
+    texts.textsCondition.wait(lock, [&] { return texts.textsToStop.empty(); });
   });
   ASSERT_TRUE(ko::test::eventually([&] {
     std::lock_guard lock(texts.textsMutex);
     return waiting;
   }));
   texts.freeMKID(1);
-  EXPECT_TRUE(waiter.get());
+  const bool woke = waiter.wait_for(10s) == std::future_status::ready;
+  texts.textsCondition.notify_all();  // ends a waiter that the release left waiting
+  EXPECT_TRUE(woke);
   EXPECT_FALSE(texts.isMKIDStopped(1));
   EXPECT_EQ(log->count(), 0u);
   texts.freeMKID(1);

@@ -140,8 +140,11 @@ TEST_F(AudioPlayerService, ARunSoundPlaysTheWholeFile) {
 
   // The name may carry its extension, in any case; the short form plays the whole file too.
   generic_->call<void>("playSoundSetFile", "tones", "beep.wav");
-  proxy_->playSoundSetFile("tones", "beep.WAV", 0, 1.0, 0, 0);
+  // A volume above 1 plays at 1.
+  proxy_->playSoundSetFile("tones", "beep.WAV", 0, 1.5, 0, 0);
   EXPECT_EQ(timeline_->entries("ZUAudioPlayer", "soundEnded").size(), 3u);
+  const auto loud = timeline_->entries("ZUAudioPlayer", "playSoundSetFile").back();
+  EXPECT_EQ(loud.arguments.asList().at(2).to<double>(), 1.0);
 }
 
 TEST_F(AudioPlayerService, PostedPlaysAreWaitedForAndStopped) {
