@@ -235,6 +235,7 @@ TEST_F(Director, AStopThatCameBeforeTheSpeechStartedTakesEffectAtStarted) {
   const std::string stop = "stop(" + std::to_string(say->id) + ")";
   bookmark(1);
   EXPECT_FALSE(rig_.speech->waitForCall(stop, 100ms));
+  EXPECT_TRUE(ko::test::eventually([&] { return rig_.host->director().isTextToSpeechRunning(); }));
   rig_.speech->raiseStatus(say->id, "started");
   EXPECT_TRUE(rig_.speech->waitForCall(stop));
   ASSERT_EQ(done.wait_for(kBound), std::future_status::ready);
