@@ -121,17 +121,22 @@ TEST(EventLoopStop, NoStopReturnsWhileAnotherJobRuns) {
       longJobEnded = true;
     });
     ASSERT_TRUE(longJobStarted.wait());
-    // One stop from a job of the loop, two from outside, all at once.
+    // One stop from a job of the loop, which goes on a while after it, two from outside,
+    // all at once.
+    std::atomic<bool> stopperStarted{false}, stopperEnded{false};
     auto fromJob = loop->async([&] {
+      stopperStarted = true;
       loop->stop();
       if (!longJobEnded)
         ++earlyReturns;
+      std::this_thread::sleep_for(std::chrono::milliseconds(1));
+      stopperEnded = true;
     });
     std::vector<std::thread> outside;
     for (int i = 0; i < 2; ++i) {
       outside.emplace_back([&] {
         loop->stop();
-        if (!longJobEnded)
+        if (!longJobEnded || (stopperStarted && !stopperEnded))
           ++earlyReturns;
       });
     }

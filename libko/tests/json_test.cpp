@@ -8,9 +8,9 @@ using ko::AnyValue;
 
 TEST(Json, DecodesEveryKind) {
   const AnyValue v =
-      ko::fromJson(R"(["hello", 2, 2.5, true, null, {"b": 1, "a": [1]}, 5000000000])");
+      ko::fromJson(R"(["hello", 2, 2.5, true, null, {"b": 1, "a": [1]}, 5000000000, -2147483648])");
   const auto& l = v.asList();
-  ASSERT_EQ(l.size(), 7u);
+  ASSERT_EQ(l.size(), 8u);
   EXPECT_EQ(l[0], AnyValue("hello"));
   EXPECT_EQ(l[1].asInt().size, 4);
   EXPECT_EQ(l[2].asFloat().value, 2.5);
@@ -19,6 +19,7 @@ TEST(Json, DecodesEveryKind) {
   // Object keys keep their document order.
   EXPECT_EQ(l[5].asMap()[0].first, AnyValue("b"));
   EXPECT_EQ(l[6].asInt().size, 8);
+  EXPECT_EQ(l[7].asInt().size, 4);
 }
 
 TEST(Json, MalformedTextIsAClearError) {

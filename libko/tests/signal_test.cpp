@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <chrono>
 #include <stdexcept>
 #include <thread>
 
@@ -67,10 +68,16 @@ TEST(Signal, DisconnectWaitsForARunningCallInAnotherThread) {
   std::thread emitter([&] { sig(1); });
   ASSERT_TRUE(entered.wait());
   bool finishedWhenDisconnected = false;
+  Gate disconnecting;
   std::thread disconnecter([&] {
+    disconnecting.open();
     sig.disconnect(link);
     finishedWhenDisconnected = finished.load();
   });
+  EXPECT_TRUE(disconnecting.wait());
+  // Long enough for the disconnect to begin waiting; a sleep rather than yields, which a
+  // loaded machine turns into a time slice each.
+  std::this_thread::sleep_for(std::chrono::milliseconds(1));
   release.open();
   disconnecter.join();
   emitter.join();

@@ -10,6 +10,7 @@
 #include "director_rig.h"
 #include "ko/log.hpp"
 #include "ko/session.hpp"
+#include "ko_test_helpers.hpp"
 #include "mokuto/mkidregister.h"
 #include "mokuto/mokutotimechecker.h"
 #include "zu/zubroker.h"
@@ -68,12 +69,20 @@ TEST(TextRegister, ASharedIdentifierKeepsTheLaterTextAndItsSecondReleaseIsLogged
   }
   EXPECT_TRUE(texts.isMKIDStopped(1));
   // A waiter of the releases (the blocking stop of every text) wakes at the first one.
+  bool waiting = false;  // under textsMutex, which the waiter leaves only in its wait
   auto waiter = std::async(std::launch::async, [&] {
     std::unique_lock lock(texts.textsMutex);
-    return texts.textsCondition.wait_for(lock, 10s, [&] { return texts.textsToStop.empty(); });
+    waiting = true;
+    texts.textsCondition.wait(lock, [&] { return texts.textsToStop.empty(); });
   });
+  ASSERT_TRUE(ko::test::eventually([&] {
+    std::lock_guard lock(texts.textsMutex);
+    return waiting;
+  }));
   texts.freeMKID(1);
-  EXPECT_TRUE(waiter.get());
+  const bool woke = waiter.wait_for(10s) == std::future_status::ready;
+  texts.textsCondition.notify_all();  // ends a waiter that the release left waiting
+  EXPECT_TRUE(woke);
   EXPECT_FALSE(texts.isMKIDStopped(1));
   EXPECT_EQ(log->count(), 0u);
   texts.freeMKID(1);

@@ -4,6 +4,7 @@
 
 #include <future>
 #include <memory>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -183,6 +184,35 @@ TEST(HeadPasses, EightIterationsOfTheWorkerShuffleTheSpeakingListTwice) {
     EXPECT_EQ(moves[i].args.at(1).toString(), table[2 * i].times.toString()) << i;
   EXPECT_EQ(h.head.getShuffleCount(), h.robot.motion->log.count("setAngles") * 2 / table.size());
   EXPECT_GE(h.head.getShuffleCount(), 2u);
+}
+
+// A pass is the whole list: shuffled after its eighth move, not before.
+TEST(HeadPasses, TheListIsShuffledOnceEveryMoveWasPlayed) {
+  FakeRobot robot;
+  ZU::ZURobotBodyTalkHeadSpeaking head(robot.broker, standing(robot), ZU::ZURobotBodyTalkTime(1.0));
+  for (int move = 1; move < 8; ++move)
+    head.afterIteration();
+  EXPECT_EQ(head.getShuffleCount(), 0u);
+  head.afterIteration();
+  EXPECT_EQ(head.getShuffleCount(), 1u);
+}
+
+// The head rests 1 to 5 s after each move, and the listening head as long before its
+// first; each rest is drawn anew.
+TEST(HeadRests, AreOneToFiveSecondsDrawnAnew) {
+  FakeRobot robot;
+  ZU::ZURobotBodyTalkHeadSpeaking speaking(robot.broker, standing(robot),
+                                           ZU::ZURobotBodyTalkTime(1.0));
+  ZU::ZURobotBodyTalkHeadListening listening(robot.broker, standing(robot),
+                                             ZU::ZURobotBodyTalkTime(1.0), 1);
+  std::set<int> rests, delays;
+  for (int draw = 0; draw < 500; ++draw) {
+    rests.insert(speaking.getPause());
+    delays.insert(listening.getStartDelay());
+  }
+  const std::set<int> oneToFive = {1, 2, 3, 4, 5};
+  EXPECT_EQ(rests, oneToFive);
+  EXPECT_EQ(delays, oneToFive);
 }
 
 }  // namespace

@@ -137,8 +137,11 @@ TEST_F(AudioPlayerService, ARunSoundPlaysTheWholeFile) {
   ASSERT_EQ(count("soundEnded"), 1u);
   // The name may carry its extension, in any case; the short form plays the whole file too.
   generic.call<void>("playSoundSetFile", "tones", "beep.wav");
-  proxy.playSoundSetFile("tones", "beep.WAV", 0, 1.0, 0, 0);
+  // A volume above 1 plays at 1.
+  proxy.playSoundSetFile("tones", "beep.WAV", 0, 1.5, 0, 0);
   EXPECT_EQ(count("soundEnded"), 3u);
+  const auto loud = robot.timeline()->entries("ZUAudioPlayer", "playSoundSetFile").back();
+  EXPECT_EQ(loud.arguments.asList().at(2).to<double>(), 1.0);
 }
 
 // A posted play ends at its end or at its stop, even a stop that comes before it begins.

@@ -14,6 +14,7 @@
 #include <vector>
 
 #include "ko/log.hpp"
+#include "ko_test_helpers.hpp"
 #include "ko/session.hpp"
 #include "robotsim/speechscript.h"
 #include "robotsim/zumemory.h"
@@ -433,6 +434,38 @@ TEST(TextToSpeechStops, AStopLandingWhileItsSayBeginsIsNeverLost) {
   EXPECT_FALSE(robot.ttsModule->wait(id, 10'000));
   ASSERT_TRUE(robot.waitForStatus(id, "stopped"));
   EXPECT_EQ(robot.statuses(id), (std::vector<std::string>{"started", "stopped"}));
+}
+
+// A log sink that holds the say's thread where it reads its Japanese text into kana, its
+// text registered but not queued yet, until the test has stopped it.
+class ReadingHolder : public ko::log::Sink {
+ public:
+  void consume(const ko::log::Record& record) override {
+    if (record.message.find("No reading for the kanji") == std::string::npos)
+      return;
+    reading.open();
+    stopped.wait();
+  }
+  ko::test::Gate reading, stopped;
+};
+
+// A stop that lands while its text is registered but not queued yet is never lost.
+TEST(TextToSpeechStops, AStopLandingBeforeItsTextIsQueuedIsNeverLost) {
+  ZUTextToSpeechOptions options = espeak();
+  options.language = "Japanese";
+  Robot robot(options);
+  auto holder = std::make_shared<ReadingHolder>();
+  ko::log::addSink(holder);
+  const int id = robot.tts.post_say("𠮷 \\mrk=1\\ はい");
+  const bool held = holder->reading.wait();
+  robot.tts.stop(id);
+  holder->stopped.open();
+  ko::log::removeSink(holder);
+  ASSERT_TRUE(held);
+  EXPECT_FALSE(robot.ttsModule->wait(id, 10'000));
+  ASSERT_TRUE(robot.waitForStatus(id, "stopped"));
+  EXPECT_EQ(robot.statuses(id), std::vector<std::string>{"stopped"});
+  EXPECT_EQ(robot.bookmarks(), std::vector<int>{});
 }
 
 // stopAll() and exit() end the says still queued behind the text being spoken: they never
