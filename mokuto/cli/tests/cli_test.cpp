@@ -498,7 +498,7 @@ TEST_F(MokutoCommand, DryRunShowsWhatTheLoaderResolvedWithoutSpeaking) {
 
 // A command started in a process group of its own (setsid), as `timeout` starts one, its
 // output in a file: a signal goes to it alone or to its whole group.
-void signal(ko::test::ChildProcess& command, int number, bool group) {
+void sendSignal(ko::test::ChildProcess& command, int number, bool group) {
   ::kill(group ? -command.pid() : command.pid(), number);
 }
 
@@ -535,11 +535,11 @@ TEST_F(MokutoCommand, SignalsStopTheTextAndTheSummaryStillComes) {
                                         (c.quiet ? "--quiet " : "") + quoted(kText) +
                                         " </dev/null >" + quoted((folder / "out.txt").string())});
     ASSERT_TRUE(command.waitForLine("Animated saying", 60s)) << command.output();
-    signal(command, c.signal, c.group);
+    sendSignal(command, c.signal, c.group);
     if (c.second) {
       ASSERT_TRUE(command.waitForLine("a second signal ends the command at once", 60s))
           << command.output();
-      signal(command, c.signal, c.group);
+      sendSignal(command, c.signal, c.group);
     }
     EXPECT_EQ(command.wait(60s), 130) << command.output();
     const std::string out = readFile(folder / "out.txt");
