@@ -2,6 +2,7 @@
 // manager and audio player: each action comes after the speech has reached its bookmark.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <chrono>
 #include <cstdint>
 #include <future>
@@ -9,35 +10,20 @@
 #include <vector>
 
 #include "director_rig.h"
+#include "ko/json.hpp"
 #include "robotsim/zutexttospeech.h"
 
 namespace {
 
 using mokutotest::DirectorRig;
 
-std::vector<ko::AnyValue> argumentsOf(const robotsim::TimelineEntry& entry) {
-  return entry.arguments.to<std::vector<ko::AnyValue>>();
-}
-
-// The time of the first entry of that operation whose arguments hold `first` then `second`
-// (-1 when none).
+// The time of the first entry of that operation whose arguments begin with `prefix` (-1
+// when none).
 std::int64_t timeOf(const robotsim::Timeline& timeline, const std::string& service,
-                    const std::string& operation, const ko::AnyValue& first,
-                    const ko::AnyValue& second = {}) {
+                    const std::string& operation, const nlohmann::ordered_json& prefix) {
   for (const auto& entry : timeline.entries(service, operation)) {
-    const auto args = argumentsOf(entry);
-    const auto matches = [&](std::size_t k, const ko::AnyValue& wanted) {
-      if (wanted.isVoid())
-        return true;
-      try {
-        if (wanted.kind() == ko::Kind::String)
-          return args.at(k).to<std::string>() == wanted.asString();
-        return args.at(k).to<int>() == wanted.to<int>();
-      } catch (const std::exception&) {
-        return false;
-      }
-    };
-    if (matches(0, first) && matches(1, second))
+    const auto args = ko::toJson(entry.arguments);
+    if (args.size() >= prefix.size() && std::equal(prefix.begin(), prefix.end(), args.begin()))
       return entry.us;
   }
   return -1;
@@ -56,7 +42,7 @@ TEST(DirectorOnEspeak, TheActionsComeAfterTheirBookmarksInTheAudio) {
   const robotsim::Timeline& timeline = *rig.timeline;
   const auto says = timeline.entries("ZUTextToSpeech", "say");
   ASSERT_EQ(says.size(), 1u);
-  const int sayId = argumentsOf(says[0]).at(0).to<int>();
+  const int sayId = ko::toJson(says[0].arguments).at(0).get<int>();
   const auto marks = rig.espeak()->markRecords(sayId);
   ASSERT_EQ(marks.size(), 4u);
   for (std::size_t k = 1; k < marks.size(); ++k)
@@ -66,21 +52,23 @@ TEST(DirectorOnEspeak, TheActionsComeAfterTheirBookmarksInTheAudio) {
   // A "mrk" is reached when its event is raised, a "mrkpause" when the speech holds there.
   const auto reached = [&](int mark) {
     return marks[static_cast<std::size_t>(mark - 1)].blocking
-               ? timeOf(timeline, "ZUTextToSpeech", "hold", sayId, mark)
-               : timeOf(timeline, "ZUMemory", "raiseEvent", "ZUTextToSpeech/CurrentBookMark", mark);
+               ? timeOf(timeline, "ZUTextToSpeech", "hold", {sayId, mark})
+               : timeOf(timeline, "ZUMemory", "raiseEvent",
+                        {"ZUTextToSpeech/CurrentBookMark", mark});
   };
   const std::int64_t shortStart =
-      timeOf(timeline, "ZUBehaviorManager", "startBehavior", shortGesture);
-  const std::int64_t midStart = timeOf(timeline, "ZUBehaviorManager", "startBehavior", midGesture);
+      timeOf(timeline, "ZUBehaviorManager", "startBehavior", {shortGesture});
+  const std::int64_t midStart =
+      timeOf(timeline, "ZUBehaviorManager", "startBehavior", {midGesture});
   const std::int64_t dingPlay =
-      timeOf(timeline, "ZUAudioPlayer", "playSoundSetFile", "bells", "ding");
+      timeOf(timeline, "ZUAudioPlayer", "playSoundSetFile", {"bells", "ding"});
   for (const std::int64_t t : {shortStart, midStart, dingPlay, reached(1), reached(3), reached(4)})
     ASSERT_GE(t, 0);
   EXPECT_GT(shortStart, reached(1));
   EXPECT_GT(midStart, reached(3));
   EXPECT_GT(dingPlay, reached(4));
   // "^wait" held the speech until the gesture of "^start" had ended.
-  EXPECT_GT(reached(3), timeOf(timeline, "ZUBehaviorManager", "behaviorStopped", shortGesture));
+  EXPECT_GT(reached(3), timeOf(timeline, "ZUBehaviorManager", "behaviorStopped", {shortGesture}));
 }
 
 }  // namespace

@@ -11,7 +11,6 @@
 #include <future>
 #include <mutex>
 #include <string>
-#include <utility>
 #include <vector>
 
 #include "director_rig.h"
@@ -55,31 +54,19 @@ enum Flags : unsigned {
 };
 
 struct Row {
-  Row(const char* rowName, std::string rowFaults, std::string rowText, int limitsMs = 0,
-      std::string logLine = "", StopAt stop = StopAt::Never, unsigned rowFlags = 0,
-      std::string rowConfig = "")
-      : name(rowName),
-        faults(std::move(rowFaults)),
-        text(std::move(rowText)),
-        allowedMs(limitsMs),
-        line(std::move(logLine)),
-        stopAt(stop),
-        flags(rowFlags),
-        config(std::move(rowConfig)) {}
-
   const char* name;
   std::string faults;
   std::string text;
   // The service's limits that may run out meanwhile, in the robot's time: 400 per bookmark
   // lost, 200 per animation given up, 5000 per behaviour never heard of, 3000 per
   // blocking _stopAll that gives up.
-  int allowedMs;
+  int allowedMs = 0;
   // A part of the line that the rule applied logs at error level, after its category
   // ("director: " for "mokuto.director").
-  std::string line;
-  StopAt stopAt;
-  unsigned flags;
-  std::string config;  // a configuration value form for the text (JSON)
+  std::string line = {};
+  StopAt stopAt = StopAt::Never;
+  unsigned flags = 0;
+  std::string config = {};  // a configuration value form for the text (JSON)
 };
 
 const char* kBlockingEnd =
@@ -115,7 +102,6 @@ std::vector<Row> matrix() {
       {"getLanguage fails", "ZUTextToSpeech.getLanguage:throw", hello, 0,
        "compiler: TTS.getLanguage() has thrown an error: "},
       {"getLanguage hangs", "ZUTextToSpeech.getLanguage:hang", hello, 0, "", hang, held},
-      {"getLanguage late", "ZUTextToSpeech.getLanguage:delay=300ms", hello},
       {"resolveBehaviorName fails", "ZUBehaviorManager.resolveBehaviorName:throw", start, 0,
        "loader: injected fault"},
       {"resolveBehaviorName hangs", "ZUBehaviorManager.resolveBehaviorName:hang", start, 0, "",
@@ -128,13 +114,11 @@ std::vector<Row> matrix() {
       {"loadSoundSet fails", "ZUAudioPlayer.loadSoundSet:throw", sound, 0,
        "loader: injected fault"},
       {"loadSoundSet hangs", "ZUAudioPlayer.loadSoundSet:hang", sound, 0, "", hang, held},
-      {"loadSoundSet late", "ZUAudioPlayer.loadSoundSet:delay=300ms", sound},
       // ---- the director: the speech engine ----
       {"say fails: no speech, no bookmark", "ZUTextToSpeech.say:throw", hello, 400,
        lost + "1 has not been received in time.", StopAt::Never, kRestSkipped},
       {"say hangs: stopped before the speech starts", "ZUTextToSpeech.say:hang", hello, 0, "", hang,
        kRestSkipped},
-      {"say late", "ZUTextToSpeech.say:delay=300ms", hello},
       {"isRunning fails", "ZUTextToSpeech.isRunning:throw", hello, 400,
        "director: ZUTextToSpeech.isRunning has thrown an exception: "},
       {"isRunning hangs", "ZUTextToSpeech.isRunning:hang", hello, 400, "", hang,
@@ -143,7 +127,10 @@ std::vector<Row> matrix() {
       {"wait fails", "ZUTextToSpeech.wait:throw", hello, 0,
        "director: ZUTextToSpeech.wait has thrown an exception: "},
       {"wait hangs", "ZUTextToSpeech.wait:hang", hello, 0, "", hang, kRelease},
-      {"wait late", "ZUTextToSpeech.wait:delay=300ms", hello},
+      {"getLanguage, say and wait late",
+       "ZUTextToSpeech.getLanguage:delay=300ms; ZUTextToSpeech.say:delay=300ms;"
+       "ZUTextToSpeech.wait:delay=300ms",
+       hello},
       {"stop fails: the speech goes on to its end", "ZUTextToSpeech.stop:throw", runLong, 200,
        "director: tts.stop() has thrown an exception: ", StopAt::Hold, kRestSkipped},
       {"stop hangs", "ZUTextToSpeech.stop:hang", runLong, 200, "", StopAt::Hold, held},
@@ -187,7 +174,10 @@ std::vector<Row> matrix() {
       {"a sound that never ends, stopped during ^waitSound",
        "ZUAudioPlayer.playSoundSetFile:hang; ZUAudioPlayer.wait:delay=0ms", waitSound, 0, "", hang,
        kRestSkipped},
-      {"playSoundSetFile late", "ZUAudioPlayer.playSoundSetFile:delay=300ms", waitSound},
+      {"loadSoundSet, playSoundSetFile and wait for a sound late",
+       "ZUAudioPlayer.loadSoundSet:delay=300ms; ZUAudioPlayer.playSoundSetFile:delay=300ms;"
+       "ZUAudioPlayer.wait:delay=300ms",
+       waitSound},
       {"stop of a sound fails", "ZUAudioPlayer.stop:throw", stopSound, 0,
        "director: ZUAudioPlayer has thrown an exception: "},
       {"stop of a sound hangs", "ZUAudioPlayer.stop:hang", stopSound, 0, "", hang, held},
@@ -195,7 +185,6 @@ std::vector<Row> matrix() {
       {"wait for a sound fails", "ZUAudioPlayer.wait:throw", waitSound, 0,
        "director: ZUAudioPlayer.wait has thrown an error: "},
       {"wait for a sound hangs", "ZUAudioPlayer.wait:hang", waitSound, 0, "", hang, held},
-      {"wait for a sound late", "ZUAudioPlayer.wait:delay=300ms", waitSound},
       {"getBreathEnabled fails", "ZUMotion.getBreathEnabled:throw", hello, 0,
        "director: ZUMotion.getBreathEnabled has thrown an exception: ", StopAt::Never, 0,
        kNoArmsBreathing},
@@ -215,7 +204,8 @@ std::vector<Row> matrix() {
        "ZUMotion.angleInterpolationBezier:hang", sound, 0, "", StopAt::Never, 0, kRandom},
       // ---- the calls of a text: waited for without a limit, as the robot's own ----
       {"a called method fails", move + ":throw", call, 0,
-       "director: An exception as been thrown during this call: " + move + "([]) with this error: "},
+       "director: An exception as been thrown during this call: " + move +
+           "([]) with this error: "},
       {"a called method hangs", move + ":hang", call, 0, "", hang, held},
       {"a called method late", move + ":delay=300ms", call},
       {"a posted call hangs: not waited for", move + ":hang", "^pCall(" + move + "()) go $a=1"},
