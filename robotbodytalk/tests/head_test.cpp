@@ -188,23 +188,21 @@ TEST(HeadPasses, EightIterationsOfTheWorkerShuffleTheSpeakingListTwice) {
 
 // A pass is the whole list: shuffled after its eighth move, not before.
 TEST(HeadPasses, TheListIsShuffledOnceEveryMoveWasPlayed) {
-  FakeRobot robot;
-  ZU::ZURobotBodyTalkHeadSpeaking head(robot.broker, standing(robot), ZU::ZURobotBodyTalkTime(1.0));
+  Head h(1.0);
   for (int move = 1; move < 8; ++move)
-    head.afterIteration();
-  EXPECT_EQ(head.getShuffleCount(), 0u);
-  head.afterIteration();
-  EXPECT_EQ(head.getShuffleCount(), 1u);
+    h.head.afterIteration();
+  EXPECT_EQ(h.head.getShuffleCount(), 0u);
+  h.head.afterIteration();
+  EXPECT_EQ(h.head.getShuffleCount(), 1u);
 }
 
 // The head rests 1 to 5 s after each move, and the listening head as long before its
 // first; each rest is drawn anew.
 TEST(HeadRests, AreOneToFiveSecondsDrawnAnew) {
-  FakeRobot robot;
-  ZU::ZURobotBodyTalkHeadSpeaking speaking(robot.broker, standing(robot),
-                                           ZU::ZURobotBodyTalkTime(1.0));
-  ZU::ZURobotBodyTalkHeadListening listening(robot.broker, standing(robot),
+  Head h(1.0);
+  ZU::ZURobotBodyTalkHeadListening listening(h.robot.broker, h.posture,
                                              ZU::ZURobotBodyTalkTime(1.0), 1);
+  ZU::ZURobotBodyTalkHeadSpeaking& speaking = h.head;
   std::set<int> rests, delays;
   for (int draw = 0; draw < 500; ++draw) {
     rests.insert(speaking.getPause());

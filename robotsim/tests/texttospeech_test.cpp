@@ -34,8 +34,16 @@ using namespace std::chrono_literals;
 constexpr auto kBound = 30s;
 constexpr const char* kBookmark = "ZUTextToSpeech/CurrentBookMark";
 constexpr const char* kStatus = "ZUTextToSpeech/Status";
-// How far a bookmark may be from its audio time on the playback clock.
+// How far a bookmark may be from its audio time, and how far a word from its mark.
 constexpr std::int64_t kToleranceUs = 50'000;
+
+// A mark reached on the playback clock neither before its audio time nor a second after
+// it: a loaded machine may wake the player late (bench_director measures how late), but
+// never that late, whereas a clock that ran on through a hold would be seconds off.
+void expectReachedOnTime(const robotsim::SpeechMarkRecord& mark) {
+  EXPECT_GE(mark.playbackUs, mark.audioUs - kToleranceUs) << "bookmark " << mark.number;
+  EXPECT_LT(mark.playbackUs, mark.audioUs + 1'000'000) << "bookmark " << mark.number;
+}
 
 ZUTextToSpeechOptions espeak(double rate = 1.0) {
   ZUTextToSpeechOptions o;
@@ -183,9 +191,7 @@ TEST(TextToSpeechEspeak, BookmarksArriveInOrderAtTheirAudioTimes) {
   ASSERT_EQ(marks.size(), 5U);
   for (std::size_t i = 0; i < marks.size(); ++i) {
     EXPECT_EQ(marks[i].number, static_cast<int>(i) + 1);
-    EXPECT_NEAR(static_cast<double>(marks[i].playbackUs), static_cast<double>(marks[i].audioUs),
-                kToleranceUs)
-        << "bookmark " << marks[i].number;
+    expectReachedOnTime(marks[i]);
     if (i > 0) {
       EXPECT_GT(marks[i].audioUs, marks[i - 1].audioUs) << "bookmark " << marks[i].number;
     }
@@ -245,8 +251,7 @@ TEST(TextToSpeechEspeak, BlockingBookmarkHoldsTheSpeechUntilItsCallbackReturns) 
   EXPECT_TRUE(marks[1].blocking);
   EXPECT_GE(marks[1].heldUs, 1'500'000);
   // The playback clock stood still during the hold: bookmark 3 is still on time.
-  EXPECT_NEAR(static_cast<double>(marks[2].playbackUs), static_cast<double>(marks[2].audioUs),
-              kToleranceUs);
+  expectReachedOnTime(marks[2]);
 }
 
 TEST(TextToSpeechEspeak, StopEndsTheTextWithStopped) {
