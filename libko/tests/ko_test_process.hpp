@@ -84,6 +84,7 @@ class ChildProcess {
       const pid_t done = ::waitpid(pid_, &status, WNOHANG);
       if (done == pid_) {
         status_ = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+        drain();
         break;
       }
       if (std::chrono::steady_clock::now() > end)
@@ -95,6 +96,17 @@ class ChildProcess {
   }
 
  private:
+  // What the child wrote before it ended, still in the pipe.
+  void drain() {
+    char buffer[4096];
+    for (pollfd p{fd_, POLLIN, 0}; ::poll(&p, 1, 0) > 0;) {
+      const ssize_t n = ::read(fd_, buffer, sizeof buffer);
+      if (n <= 0)
+        return;
+      pending_.append(buffer, static_cast<std::size_t>(n));
+      all_.append(buffer, static_cast<std::size_t>(n));
+    }
+  }
   bool readSome(int timeoutMs) {
     pollfd p{fd_, POLLIN, 0};
     if (::poll(&p, 1, timeoutMs) <= 0)

@@ -357,7 +357,7 @@ TEST_F(MokutoCommand, SaysAnAnnotatedTextOnTheTimingEngine) {
   ASSERT_GT(done, started);
 
   // The end event is the last thing the robot did for the text (the body talk may still
-  // be settling); the service's "end" closes the timeline with the summary's figures.
+  // be settling); the service's "end" gives the summary's figures.
   const long end = find(lines, entryWith("ZUMemory", "raiseEvent", 0, "ZUMokuto/EndOfMokuto"));
   ASSERT_GT(end, done);
   EXPECT_EQ(lines[static_cast<std::size_t>(end)]["arguments"][1], 1);
@@ -369,8 +369,10 @@ TEST_F(MokutoCommand, SaysAnAnnotatedTextOnTheTimingEngine) {
         (line["arguments"].is_array() && !line["arguments"].empty() && line["arguments"][0] == hey))
         << line.dump();
   }
-  const Json& last = lines.back();
-  EXPECT_TRUE(entry("ZUMokuto", "end")(last)) << last.dump();
+  // Joint samples of the settling body may still follow it.
+  const auto closing = std::find_if(lines.rbegin(), lines.rend(), entry("ZUMokuto", "end"));
+  ASSERT_NE(closing, lines.rend());
+  const Json& last = *closing;
   EXPECT_EQ(last["result"]["outcome"], "done");
   EXPECT_EQ(last["result"]["executed"], 4);
   // --fast: no sync figures.
@@ -460,7 +462,9 @@ TEST_F(MokutoCommand, TheWavHoldsTheSpeechAndEverySoundAtItsTime) {
       const auto loud = std::count_if(wav.samples.begin(), wav.samples.end(),
                                       [](float v) { return std::fabs(v) > 0.05F; });
       EXPECT_GT(loud, wav.rate / 10);
-      EXPECT_TRUE(lines.back()["result"]["syncMedianUs"].is_number());
+      const auto last = std::find_if(lines.rbegin(), lines.rend(), entry("ZUMokuto", "end"));
+      ASSERT_NE(last, lines.rend());
+      EXPECT_TRUE((*last)["result"]["syncMedianUs"].is_number());
     }
   }
 }
