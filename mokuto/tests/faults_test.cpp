@@ -51,6 +51,7 @@ enum Flags : unsigned {
   kThrows = 4,           // a stage fails: say passes the error on, without end event
   kStopAllBlocking = 8,  // stopped with _stopAll(true) rather than stop(id)
   kAsksTheSpeech = 16,   // the diagnosis asks the speech engine whether it speaks: it waits
+  kHeldBookmark = 32,    // the first fault holds back a bookmark that the stopped text never gets
 };
 
 struct Row {
@@ -120,12 +121,11 @@ std::vector<Row> matrix() {
       {"say hangs: stopped before the speech starts", "ZUTextToSpeech.say:hang", hello, 0, "", hang,
        kRestSkipped},
       // The director asks whether the speech runs only while it waits for a bookmark: a
-      // bookmark held back makes it ask, whatever the machine's load (a stopped text never
-      // gets its held bookmark, hence none for the hang).
+      // bookmark held back makes it ask, whatever the machine's load.
       {"isRunning fails", "ZUTextToSpeech.bookmarks:delay=200ms;ZUTextToSpeech.isRunning:throw",
        hello, 400, "director: ZUTextToSpeech.isRunning has thrown an exception: "},
-      {"isRunning hangs", "ZUTextToSpeech.isRunning:hang", hello, 400, "", hang,
-       held | kAsksTheSpeech},
+      {"isRunning hangs", "ZUTextToSpeech.bookmarks:delay=2s;ZUTextToSpeech.isRunning:hang", hello,
+       400, "", hang, held | kAsksTheSpeech | kHeldBookmark},
       {"isRunning late",
        "ZUTextToSpeech.bookmarks:delay=200ms;ZUTextToSpeech.isRunning:delay=300ms", hello, 400},
       {"wait fails", "ZUTextToSpeech.wait:throw", hello, 0,
@@ -330,7 +330,8 @@ TEST(FaultMatrix, EveryTextEndsOnceWithinItsLimitsAndTheNextIsSpokenNormally) {
     const bool ended = ready(said);
     // Every fault struck (a stop asks the speech engine from the event loop: that call may
     // come after the end of the text).
-    for (std::size_t k = 0; k < faults.size(); ++k) {
+    const std::size_t firstStruck = (row.flags & kHeldBookmark) ? 1 : 0;
+    for (std::size_t k = firstStruck; k < faults.size(); ++k) {
       EXPECT_TRUE(rig.faults->waitForStrikes(faults[k].service, faults[k].operation,
                                              strikesBefore[k] + 1, kBound))
           << faults[k].service << "." << faults[k].operation << " never struck";
@@ -349,9 +350,9 @@ TEST(FaultMatrix, EveryTextEndsOnceWithinItsLimitsAndTheNextIsSpokenNormally) {
     EXPECT_EQ(rig.endEvents(id), throws ? 0u : 1u);
     EXPECT_LE((rig.clock->now() - clockBefore).count(), row.allowedMs);
     EXPECT_EQ(rig.events("a"), executed + ((row.flags & kRestSkipped) ? 0 : 1));
-    for (const auto& fault : faults) {
+    for (std::size_t k = firstStruck; k < faults.size(); ++k) {
       EXPECT_TRUE(log->containsPart("robotsim.faults", ko::log::Warning,
-                                    fault.service + "." + fault.operation + ": "));
+                                    faults[k].service + "." + faults[k].operation + ": "));
     }
     if (const auto colon = row.line.find(": "); colon != std::string::npos) {
       EXPECT_TRUE(ko::test::eventually([&] {
