@@ -339,9 +339,8 @@ void printHops(std::ostream& os) {
     os << "\n" << name << " per hop, ms (median / p99 / max):\n";
     for (std::size_t h = 0; h < kHopCount; ++h) {
       os << "  " << std::left << std::setw(8) << kHops[h] << std::right << std::fixed
-         << std::setprecision(3) << std::setw(8) << percentile(hops[h], 0.5) << " /"
-         << std::setw(8) << percentile(hops[h], 0.99) << " /" << std::setw(8)
-         << percentile(hops[h], 1.0) << "\n";
+         << std::setprecision(3) << std::setw(8) << percentile(hops[h], 0.5) << " /" << std::setw(8)
+         << percentile(hops[h], 0.99) << " /" << std::setw(8) << percentile(hops[h], 1.0) << "\n";
     }
   }
 }

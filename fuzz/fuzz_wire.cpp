@@ -1,9 +1,9 @@
 // Fuzzes the decoder of incoming messages: every frame a peer can send (the header, the
 // body of the kinds that carry one, the member table of a registration), then checks that
 // what decodes encodes back to the same value.
+#include <algorithm>
 #include <cstddef>
 #include <cstdint>
-#include <algorithm>
 #include <cstdlib>
 #include <string>
 #include <string_view>

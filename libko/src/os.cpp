@@ -68,8 +68,7 @@ int priorityFromEnvironment() {
   const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), value);
   if (error != std::errc() || end != text.data() + text.size() || value < 0 ||
       value > sched_get_priority_max(SCHED_FIFO)) {
-    KO_LOG_WARNING(kCategory) << kVariable << "='" << text
-                              << "' is not a priority from 0 to "
+    KO_LOG_WARNING(kCategory) << kVariable << "='" << text << "' is not a priority from 0 to "
                               << sched_get_priority_max(SCHED_FIFO) << "; using "
                               << kDefaultPriority;
     return kDefaultPriority;

@@ -4,8 +4,8 @@
 #include <zmq.h>
 
 #include <algorithm>
-#include <chrono>
 #include <cctype>
+#include <chrono>
 #include <fstream>
 #include <set>
 #include <sstream>
@@ -102,8 +102,8 @@ void writeKeyFile(const std::string& path, const std::string& key, bool secret) 
   ::umask(previous);
   if (!out)
     throw Error("Cannot write the key file " + path);
-  out << (secret ? "# CURVE secret key: keep it to this machine\n" : "# CURVE public key\n")
-      << key << '\n';
+  out << (secret ? "# CURVE secret key: keep it to this machine\n" : "# CURVE public key\n") << key
+      << '\n';
   if (!out.flush())
     throw Error("Cannot write the key file " + path);
   if (secret)

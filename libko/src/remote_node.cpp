@@ -8,8 +8,8 @@
 #include <cstdlib>
 #include <fstream>
 #include <limits>
-#include <set>
 #include <random>
+#include <set>
 #include <zmq.hpp>
 #include <zmq_addon.hpp>
 
@@ -141,8 +141,8 @@ void RemoteNode::xOpen(const std::string& endpoint) {
       // The ZeroMQ authentication handler: the public keys allowed to connect.
       for (const auto& key : curve.clientKeys) {
         std::string binary(32, '\0');
-        if (key.size() != 40 || !zmq_z85_decode(reinterpret_cast<std::uint8_t*>(binary.data()),
-                                                key.c_str()))
+        if (key.size() != 40 ||
+            !zmq_z85_decode(reinterpret_cast<std::uint8_t*>(binary.data()), key.c_str()))
           throw Error("Not a CURVE public key: '" + key + "'");
         sockets_->clientKeys.insert(binary);
       }
@@ -203,11 +203,11 @@ void RemoteNode::stop() {
   {
     std::lock_guard lock(mutex_);
     if (role_ == Role::Connecting && linked_)
-      byes.push_back(Outgoing{0, {}, wire::encodeHeader({MessageKind::Bye, 0, 0, self_, {}}),
-                              std::nullopt, 0});
+      byes.push_back(Outgoing{
+          0, {}, wire::encodeHeader({MessageKind::Bye, 0, 0, self_, {}}), std::nullopt, 0});
     for (const auto& [id, p] : peers_)
-      byes.push_back(Outgoing{id, {}, wire::encodeHeader({MessageKind::Bye, 0, id, 0, {}}),
-                              std::nullopt, 0});
+      byes.push_back(
+          Outgoing{id, {}, wire::encodeHeader({MessageKind::Bye, 0, id, 0, {}}), std::nullopt, 0});
   }
   {
     std::lock_guard lock(outMutex_);
@@ -244,8 +244,7 @@ bool RemoteNode::isLinked() const {
 
 bool RemoteNode::waitForLink(std::chrono::milliseconds bound) const {
   std::unique_lock lock(mutex_);
-  return linkChanged_.wait_for(lock, bound,
-                               [this] { return role_ == Role::Listening || linked_; });
+  return linkChanged_.wait_for(lock, bound, [this] { return role_ == Role::Listening || linked_; });
 }
 
 void RemoteNode::setLinkListener(std::function<void(bool)> listener) {
@@ -334,13 +333,13 @@ void RemoteNode::xHandleZap() {
                               << (parts.size() > 3 ? parts[3].to_string() : std::string("?"))
                               << ": its CURVE key is not among the allowed client keys";
   }
-  std::vector<zmq::const_buffer> reply{
-      zmq::buffer(std::string_view("1.0")),
-      zmq::buffer(parts.size() > 1 ? parts[1].data() : nullptr, parts.size() > 1 ? parts[1].size() : 0),
-      zmq::buffer(std::string_view(known ? "200" : "400")),
-      zmq::buffer(std::string_view(known ? "OK" : "Unknown key")),
-      zmq::buffer(std::string_view("")),
-      zmq::buffer(std::string_view(""))};
+  std::vector<zmq::const_buffer> reply{zmq::buffer(std::string_view("1.0")),
+                                       zmq::buffer(parts.size() > 1 ? parts[1].data() : nullptr,
+                                                   parts.size() > 1 ? parts[1].size() : 0),
+                                       zmq::buffer(std::string_view(known ? "200" : "400")),
+                                       zmq::buffer(std::string_view(known ? "OK" : "Unknown key")),
+                                       zmq::buffer(std::string_view("")),
+                                       zmq::buffer(std::string_view(""))};
   zmq::send_multipart(*sockets_->zap, reply);
 }
 
@@ -434,7 +433,10 @@ void RemoteNode::xHandle(std::vector<std::string> frames) {
     }
     if (!peer) {
       Outgoing out{0, routing,
-                   wire::encodeHeader({MessageKind::Reset, 0, 0, 0,
+                   wire::encodeHeader({MessageKind::Reset,
+                                       0,
+                                       0,
+                                       0,
                                        {AnyValue("this process does not know yours: say hello")}}),
                    std::nullopt, 0};
       xSendNow(out);
@@ -691,9 +693,8 @@ void RemoteNode::xSendNow(const Outgoing& out) {
       if (out.epoch != 0 && out.epoch != epoch_)
         return;  // for a link that is gone
     }
-    s.send(zmq::buffer(out.header),
-           out.body ? zmq::send_flags::sndmore | zmq::send_flags::dontwait
-                    : zmq::send_flags::dontwait);
+    s.send(zmq::buffer(out.header), out.body ? zmq::send_flags::sndmore | zmq::send_flags::dontwait
+                                             : zmq::send_flags::dontwait);
     if (out.body)
       s.send(zmq::buffer(*out.body), zmq::send_flags::dontwait);
   } catch (const zmq::error_t& e) {
@@ -721,8 +722,8 @@ void RemoteNode::xTick() {
     if (now >= nextPing_) {
       nextPing_ = now + options_.heartbeatInterval;
       for (const auto id : all)
-        xSendNow(Outgoing{id, {}, wire::encodeHeader({MessageKind::Ping, 0, id, 0, {}}),
-                          std::nullopt, 0});
+        xSendNow(Outgoing{
+            id, {}, wire::encodeHeader({MessageKind::Ping, 0, id, 0, {}}), std::nullopt, 0});
     }
   } else if (isLinked()) {
     const auto quiet = std::chrono::duration_cast<std::chrono::milliseconds>(now - hubSeen_);
@@ -730,19 +731,24 @@ void RemoteNode::xTick() {
       xLinkLost("no sign of life for " + milliseconds(quiet));
     } else if (now >= nextPing_) {
       nextPing_ = now + options_.heartbeatInterval;
-      xSendNow(Outgoing{0, {}, wire::encodeHeader({MessageKind::Ping, 0, 0, self_, {}}),
-                        std::nullopt, 0});
+      xSendNow(Outgoing{
+          0, {}, wire::encodeHeader({MessageKind::Ping, 0, 0, self_, {}}), std::nullopt, 0});
     }
   } else if (now >= nextHello_) {
     nextHello_ = now + std::max(options_.heartbeatInterval, std::chrono::milliseconds(250));
-    xSendNow(Outgoing{0, {},
-                      wire::encodeHeader({MessageKind::Hello, 0, 0, 0,
-                                          {AnyValue(wire::kProtocolVersion),
-                                           AnyValue(options_.processName),
-                                           AnyValue(static_cast<std::int64_t>(::getpid())),
-                                           AnyValue(static_cast<std::int64_t>(
-                                               options_.heartbeatInterval.count()))}}),
-                      std::nullopt, 0});
+    xSendNow(
+        Outgoing{0,
+                 {},
+                 wire::encodeHeader(
+                     {MessageKind::Hello,
+                      0,
+                      0,
+                      0,
+                      {AnyValue(wire::kProtocolVersion), AnyValue(options_.processName),
+                       AnyValue(static_cast<std::int64_t>(::getpid())),
+                       AnyValue(static_cast<std::int64_t>(options_.heartbeatInterval.count()))}}),
+                 std::nullopt,
+                 0});
     if (now - lastNoAnswerLog_ > std::chrono::seconds(10)) {
       lastNoAnswerLog_ = now;
       KO_LOG_INFO(kCategory) << "Waiting for the listening process at " << endpoint_;
@@ -878,9 +884,8 @@ void RemoteNode::xRequestWith(MessageKind kind, std::uint32_t to, std::vector<An
   xSend(std::move(out));
 }
 
-Future<AnyValue> RemoteNode::call(std::uint32_t peer, const std::string& service,
-                                  unsigned methodId, const std::string& method,
-                                  const std::vector<AnyValue>& args) {
+Future<AnyValue> RemoteNode::call(std::uint32_t peer, const std::string& service, unsigned methodId,
+                                  const std::string& method, const std::vector<AnyValue>& args) {
   const AnyValue body = AnyValue::list(args);
   return xRequest(MessageKind::Call, peer,
                   {AnyValue(service), AnyValue(methodId),
@@ -998,41 +1003,39 @@ Future<AnyObject> RemoteNode::lookup(const std::string& name) {
   }
   Promise<AnyObject> promise;
   Future<AnyObject> result = promise.future();
-  xRequestWith(
-      MessageKind::Lookup, 0, {AnyValue(name)}, nullptr, "lookup of " + name,
-      options_.requestTimeout,
-      [this, promise, name, notFound](Outcome o) mutable {
-        std::optional<AnyObject> object;
-        std::string error = o.error;
-        if (o.ok) {
-          try {
-            AnyValue peer, process, members;
-            for (const auto& [k, v] : o.value.asMap()) {
-              const std::string key = k.kind() == Kind::String ? k.asString() : "";
-              if (key == "peer")
-                peer = v;
-              else if (key == "process")
-                process = v;
-              else if (key == "members")
-                members = v;
-            }
-            object = GenericObject::makeWeak(
-                xMakeRemoteObject(name, peer.to<std::uint32_t>(), process.to<std::string>(),
-                                  members),
-                name);
-          } catch (const std::exception& e) {
-            error = notFound + ": the directory's answer does not read (" + e.what() + ")";
-          }
-        }
-        if (!xOnIoThread()) {
-          object ? promise.trySetValue(*object) : promise.trySetError(error);
-        } else if (object) {
-          if (!promise.trySetValueWithoutContinuations(object))
-            pool_->post([promise, object]() mutable { promise.trySetValue(*object); });
-        } else if (!promise.trySetErrorWithoutContinuations(error)) {
-          pool_->post([promise, error]() mutable { promise.trySetError(error); });
-        }
-      });
+  xRequestWith(MessageKind::Lookup, 0, {AnyValue(name)}, nullptr, "lookup of " + name,
+               options_.requestTimeout, [this, promise, name, notFound](Outcome o) mutable {
+                 std::optional<AnyObject> object;
+                 std::string error = o.error;
+                 if (o.ok) {
+                   try {
+                     AnyValue peer, process, members;
+                     for (const auto& [k, v] : o.value.asMap()) {
+                       const std::string key = k.kind() == Kind::String ? k.asString() : "";
+                       if (key == "peer")
+                         peer = v;
+                       else if (key == "process")
+                         process = v;
+                       else if (key == "members")
+                         members = v;
+                     }
+                     object = GenericObject::makeWeak(
+                         xMakeRemoteObject(name, peer.to<std::uint32_t>(),
+                                           process.to<std::string>(), members),
+                         name);
+                   } catch (const std::exception& e) {
+                     error = notFound + ": the directory's answer does not read (" + e.what() + ")";
+                   }
+                 }
+                 if (!xOnIoThread()) {
+                   object ? promise.trySetValue(*object) : promise.trySetError(error);
+                 } else if (object) {
+                   if (!promise.trySetValueWithoutContinuations(object))
+                     pool_->post([promise, object]() mutable { promise.trySetValue(*object); });
+                 } else if (!promise.trySetErrorWithoutContinuations(error)) {
+                   pool_->post([promise, error]() mutable { promise.trySetError(error); });
+                 }
+               });
   return result;
 }
 
@@ -1073,8 +1076,8 @@ void RemoteNode::publish(const std::string& name, const AnyObject& object) {
     // A link lost meanwhile publishes it again once made; a name taken is refused.
     if (std::string(e.what()).find("already registered") != std::string::npos)
       throw Error(e.what());
-    KO_LOG_WARNING(kCategory) << "Service '" << name << "' is not in the directory yet: "
-                              << e.what();
+    KO_LOG_WARNING(kCategory) << "Service '" << name
+                              << "' is not in the directory yet: " << e.what();
   }
 }
 
@@ -1129,7 +1132,8 @@ void RemoteNode::xPeerGone(std::uint32_t id, const std::string& reason, bool sai
   std::string list;
   for (const auto& s : services)
     list += (list.empty() ? "" : ", ") + s;
-  const std::string news = "Process '" + name + "' (#" + std::to_string(id) + ") is gone: " + reason +
+  const std::string news = "Process '" + name + "' (#" + std::to_string(id) +
+                           ") is gone: " + reason +
                            (services.empty() ? "" : "; its services leave the directory: " + list);
   if (saidGoodbye)
     KO_LOG_INFO(kCategory) << news;
@@ -1298,8 +1302,9 @@ void RemoteNode::xServeCall(wire::Message m) {
     }
   }
   const Future<AnyValue> result = target->metaCall(id, args, MetaCallType::Direct);
-  auto reply = [self = weak_from_this(), h, what = name + "." + target->metaObject().method(id)->name](
-                   const Future<AnyValue>& done) {
+  auto reply = [self = weak_from_this(), h,
+                what = name + "." +
+                       target->metaObject().method(id)->name](const Future<AnyValue>& done) {
     const auto node = self.lock();
     if (!node)
       return;
@@ -1337,8 +1342,8 @@ void RemoteNode::xServePost(wire::Message m) {
   const wire::Header& h = m.header;
   const AnyObject object = xLocalService(h.text(0));
   if (!object) {
-    KO_LOG_WARNING(kCategory) << "A post to " << h.text(0) << "." << h.text(1)
-                              << " from process #" << h.from << " finds no such service";
+    KO_LOG_WARNING(kCategory) << "A post to " << h.text(0) << "." << h.text(1) << " from process #"
+                              << h.from << " finds no such service";
     return;
   }
   try {
@@ -1366,20 +1371,19 @@ void RemoteNode::xServeSubscribe(wire::Message m) {
     return xReplyError(h, "Cannot find service '" + h.text(0) + "' in " + options_.processName);
   SignalLink link = kInvalidSignalLink;
   try {
-    link = object->connectAny(
-        h.text(1), [self = weak_from_this(), to = h.from, service = h.text(0),
-                    signal = h.text(1)](const std::vector<AnyValue>& args) {
-          const auto node = self.lock();
-          if (!node)
-            return;
-          const AnyValue body = AnyValue::list(args);
-          try {
-            node->xSend(MessageKind::Signal, to, 0, {AnyValue(service), AnyValue(signal)}, &body);
-          } catch (const Error& e) {
-            KO_LOG_WARNING(kCategory) << "Signal " << service << "." << signal
-                                      << " cannot be sent to process #" << to << ": " << e.what();
-          }
-        });
+    link = object->connectAny(h.text(1), [self = weak_from_this(), to = h.from, service = h.text(0),
+                                          signal = h.text(1)](const std::vector<AnyValue>& args) {
+      const auto node = self.lock();
+      if (!node)
+        return;
+      const AnyValue body = AnyValue::list(args);
+      try {
+        node->xSend(MessageKind::Signal, to, 0, {AnyValue(service), AnyValue(signal)}, &body);
+      } catch (const Error& e) {
+        KO_LOG_WARNING(kCategory) << "Signal " << service << "." << signal
+                                  << " cannot be sent to process #" << to << ": " << e.what();
+      }
+    });
   } catch (const std::exception& e) {
     return xReplyError(h, e.what());
   }
@@ -1410,8 +1414,8 @@ void RemoteNode::xServeProperty(wire::Message m) {
 
 // ---- RemoteObject -----------------------------------------------------------------------
 
-RemoteObject::RemoteObject(std::weak_ptr<RemoteNode> node, std::string service,
-                           std::uint32_t peer, std::string process, MetaObject meta)
+RemoteObject::RemoteObject(std::weak_ptr<RemoteNode> node, std::string service, std::uint32_t peer,
+                           std::string process, MetaObject meta)
     : node_(std::move(node)),
       service_(std::move(service)),
       peer_(peer),

@@ -86,8 +86,8 @@ class RemoteNode : public std::enable_shared_from_this<RemoteNode> {
 
   // Binds or connects and starts the I/O thread; raises ko::Error for an endpoint that
   // cannot be used (bad address, address in use, missing keys).
-  static std::shared_ptr<RemoteNode> start(Session& session, Role role,
-                                           const std::string& endpoint, RemoteOptions options);
+  static std::shared_ptr<RemoteNode> start(Session& session, Role role, const std::string& endpoint,
+                                           RemoteOptions options);
   RemoteNode(Key, Session& session, Role role, RemoteOptions options);
   ~RemoteNode();
   RemoteNode(const RemoteNode&) = delete;
@@ -170,7 +170,8 @@ class RemoteNode : public std::enable_shared_from_this<RemoteNode> {
     AnyObject object;
     SignalLink link = kInvalidSignalLink;
   };
-  using ForwarderKey = std::tuple<std::uint32_t, std::string, std::string>;  // subscriber, service, signal
+  using ForwarderKey =
+      std::tuple<std::uint32_t, std::string, std::string>;  // subscriber, service, signal
 
   void xOpen(const std::string& endpoint);
   void xOpenDealer();
@@ -250,7 +251,7 @@ class RemoteNode : public std::enable_shared_from_this<RemoteNode> {
   std::size_t deadlines_ = 0;  // pending requests with a deadline
   std::uint64_t nextId_ = 1;
   bool stoppedForRequests_ = false;
-  std::uint64_t epoch_ = 1;  // counts the links made
+  std::uint64_t epoch_ = 1;                                       // counts the links made
   std::map<std::string, std::shared_ptr<RemoteObject>> objects_;  // by service name
   std::map<ForwarderKey, Forwarder> forwarders_;
   std::function<void(bool)> linkListener_;
@@ -259,7 +260,7 @@ class RemoteNode : public std::enable_shared_from_this<RemoteNode> {
   std::map<std::string, std::uint32_t> peersByRouting_;
   std::uint32_t nextPeer_ = 1;
   std::map<std::string, DirectoryEntry> directory_;  // the other processes' services
-  std::mutex directoryMutex_;                       // before mutex_ and the session's
+  std::mutex directoryMutex_;                        // before mutex_ and the session's
   // Connected.
   std::uint32_t self_ = 0;  // the id the listening process gave; 0 until welcomed
   bool linked_ = false;

@@ -170,8 +170,8 @@ std::string Session::listen(const std::string& endpoint, RemoteOptions options) 
     if (remote_)
       throw Error("The session is already linked with " + remote_->endpoint());
   }
-  auto node =
-      detail::RemoteNode::start(*this, detail::RemoteNode::Role::Listening, endpoint, std::move(options));
+  auto node = detail::RemoteNode::start(*this, detail::RemoteNode::Role::Listening, endpoint,
+                                        std::move(options));
   std::unique_lock lock(mutex_);
   remote_ = node;
   return node->endpoint();

@@ -245,8 +245,7 @@ AnyValue decodeExtension(std::int8_t type, std::string_view payload, int depthLe
       if (!names.empty() && names.size() != items[2].asList().size())
         throw DecodeError("A tuple has " + std::to_string(names.size()) + " member names for " +
                           std::to_string(items[2].asList().size()) + " members");
-      return AnyValue::tuple(std::move(items[2].asList()), std::move(names),
-                             items[0].asString());
+      return AnyValue::tuple(std::move(items[2].asList()), std::move(names), items[0].asString());
     }
     case kExtDynamic:
       return AnyValue::dynamic(decodeNested(payload, depthLeft));
@@ -306,8 +305,8 @@ class Builder {
   }
   bool visit_bin(const char* v, std::uint32_t size) {
     const auto* b = reinterpret_cast<const std::uint8_t*>(v);
-    return emit(AnyValue::raw(size ? std::vector<std::uint8_t>(b, b + size)
-                                   : std::vector<std::uint8_t>()));
+    return emit(
+        AnyValue::raw(size ? std::vector<std::uint8_t>(b, b + size) : std::vector<std::uint8_t>()));
   }
   bool visit_ext(const char* v, std::uint32_t size) {
     if (!v || size == 0)
@@ -498,8 +497,8 @@ Header decodeHeader(std::string_view bytes) {
   if (items[0].kind() != Kind::String)
     throw DecodeError("The header's kind is not a string");
   const std::string& name = items[0].asString();
-  const auto found = std::find_if(kKinds.begin(), kKinds.end(),
-                                  [&](const KindInfo& k) { return name == k.name; });
+  const auto found =
+      std::find_if(kKinds.begin(), kKinds.end(), [&](const KindInfo& k) { return name == k.name; });
   if (found == kKinds.end())
     throw DecodeError("Unknown message kind '" + name + "'");
   Header h;
@@ -602,12 +601,13 @@ AnyValue metaObjectToValue(const MetaObject& meta) {
     for (const auto& p : m.parameters)
       params.push_back(pairValue(p.name, p.description));
     members.emplace_back(
-        m.id, AnyValue::list({"m", AnyValue(m.id), m.name, m.parametersSignature,
-                              m.returnSignature, m.description, AnyValue::list(std::move(params)),
+        m.id, AnyValue::list({"m", AnyValue(m.id), m.name, m.parametersSignature, m.returnSignature,
+                              m.description, AnyValue::list(std::move(params)),
                               pairValue(m.returnValue.name, m.returnValue.description)}));
   }
   for (const auto& s : meta.signals())
-    members.emplace_back(s.id, AnyValue::list({"s", AnyValue(s.id), s.name, s.parametersSignature}));
+    members.emplace_back(s.id,
+                         AnyValue::list({"s", AnyValue(s.id), s.name, s.parametersSignature}));
   for (const auto& p : meta.properties())
     members.emplace_back(p.id, AnyValue::list({"p", AnyValue(p.id), p.name, p.signature}));
   std::sort(members.begin(), members.end(),

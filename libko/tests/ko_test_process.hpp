@@ -51,8 +51,8 @@ class ChildProcess {
 
   // The first line read from now on that contains `text`, or nothing when the bound passes
   // or the child closes its output first.
-  std::optional<std::string> waitForLine(const std::string& text,
-                                         std::chrono::milliseconds bound = std::chrono::seconds(30)) {
+  std::optional<std::string> waitForLine(
+      const std::string& text, std::chrono::milliseconds bound = std::chrono::seconds(30)) {
     const auto end = std::chrono::steady_clock::now() + bound;
     for (;;) {
       const auto newline = pending_.find('\n');
@@ -63,8 +63,8 @@ class ChildProcess {
           return line;
         continue;
       }
-      const auto left =
-          std::chrono::duration_cast<std::chrono::milliseconds>(end - std::chrono::steady_clock::now());
+      const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
+          end - std::chrono::steady_clock::now());
       if (left.count() <= 0 || !readSome(static_cast<int>(left.count())))
         return std::nullopt;
     }

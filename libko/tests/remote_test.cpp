@@ -60,8 +60,9 @@ struct Calculator {
 class RemoteTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    endpoint = hub->listen(ipcEndpoint(::testing::UnitTest::GetInstance()->current_test_info()->name()),
-                           fastOptions("hub"));
+    endpoint =
+        hub->listen(ipcEndpoint(::testing::UnitTest::GetInstance()->current_test_info()->name()),
+                    fastOptions("hub"));
     hub->registerService("Calc", local.builder.object());
     peer->connect(endpoint, fastOptions("peer"));
     ASSERT_TRUE(peer->waitForLink(10s));
@@ -243,20 +244,33 @@ TEST_F(RemoteTest, MessagesThatMakeNoSenseGetAnErrorReply) {
   } cases[] = {
       {"no MessagePack", {"\xc1garbage"}, 0, "Malformed message"},
       {"an unknown kind", {header({"shout", 5, 0, 0})}, 0, "Unknown message kind 'shout'"},
-      {"a call without arguments", {header({"call", 6, 0, 0, "Calc", "add", 0})}, 6,
+      {"a call without arguments",
+       {header({"call", 6, 0, 0, "Calc", "add", 0})},
+       6,
        "has 2 frame(s), not 1"},
       {"arguments that are no list",
-       {header({"call", 7, 0, 0, "Calc", "add", 0}), wire::encodeValue(AnyValue(1))}, 7,
+       {header({"call", 7, 0, 0, "Calc", "add", 0}), wire::encodeValue(AnyValue(1))},
+       7,
        "are not a list"},
-      {"too large", {header({"call", 8, 0, 0, "Calc", "echo", 0}), args({std::string(4096, 'x')})}, 8,
+      {"too large",
+       {header({"call", 8, 0, 0, "Calc", "echo", 0}), args({std::string(4096, 'x')})},
+       8,
        "exceeds the limit of 2048 bytes"},
-      {"an unknown service", {header({"call", 9, 0, 0, "Nobody", "add", 0}), args({1, 2})}, 9,
+      {"an unknown service",
+       {header({"call", 9, 0, 0, "Nobody", "add", 0}), args({1, 2})},
+       9,
        "Cannot find service 'Nobody'"},
-      {"an unknown method", {header({"call", 10, 0, 0, "Calc", "mul", 0}), args({1, 2})}, 10,
+      {"an unknown method",
+       {header({"call", 10, 0, 0, "Calc", "mul", 0}), args({1, 2})},
+       10,
        "Cannot find method 'mul'"},
-      {"an unknown method id", {header({"call", 11, 0, 0, "Calc", 7, 0}), args({})}, 11,
+      {"an unknown method id",
+       {header({"call", 11, 0, 0, "Calc", 7, 0}), args({})},
+       11,
        "has no method with id 7"},
-      {"a process that is gone", {header({"lookup", 12, 99, 0, "Calc"})}, 12,
+      {"a process that is gone",
+       {header({"lookup", 12, 99, 0, "Calc"})},
+       12,
        "Process #99 is gone"},
   };
   for (const auto& c : cases) {
@@ -306,11 +320,16 @@ TEST(RemoteSecurity, OnlyLoopbackAndIpcEndpointsGoWithoutKeys) {
     const char* endpoint;
     bool local;
   } cases[] = {
-      {"ipc:///tmp/robot", true},          {"tcp://127.0.0.1:5555", true},
-      {"tcp://127.1.2.3:*", true},         {"tcp://localhost:5555", true},
-      {"tcp://[::1]:5555", true},          {"tcp://0.0.0.0:5555", false},
-      {"tcp://*:5555", false},             {"tcp://192.168.1.20:5555", false},
-      {"tcp://127.0.0.1.example:1", false}, {"tcp://robot.local:5555", false},
+      {"ipc:///tmp/robot", true},
+      {"tcp://127.0.0.1:5555", true},
+      {"tcp://127.1.2.3:*", true},
+      {"tcp://localhost:5555", true},
+      {"tcp://[::1]:5555", true},
+      {"tcp://0.0.0.0:5555", false},
+      {"tcp://*:5555", false},
+      {"tcp://192.168.1.20:5555", false},
+      {"tcp://127.0.0.1.example:1", false},
+      {"tcp://robot.local:5555", false},
   };
   for (const auto& c : cases)
     EXPECT_EQ(remote::isLocalEndpoint(c.endpoint), c.local) << c.endpoint;

@@ -67,10 +67,8 @@ TEST(Wire, EveryKindComesBackExactly) {
 
 TEST(Wire, AnIntegerIsTypedByItsValueNotByItsFormat) {
   // A positive value in the int64 format; a small one in the uint64 format.
-  EXPECT_EQ(decodeValue(std::string("\xd3\x00\xe0\x60\x00\x00\x00\x00\x97", 9)).signature(),
-            "l");
-  EXPECT_EQ(decodeValue(std::string("\xcf\x00\x00\x00\x00\x00\x00\x00\x05", 9)).signature(),
-            "i");
+  EXPECT_EQ(decodeValue(std::string("\xd3\x00\xe0\x60\x00\x00\x00\x00\x97", 9)).signature(), "l");
+  EXPECT_EQ(decodeValue(std::string("\xcf\x00\x00\x00\x00\x00\x00\x00\x05", 9)).signature(), "i");
 }
 
 TEST(Wire, ObjectsDoNotTravel) {
@@ -85,14 +83,20 @@ TEST(Wire, MalformedValuesAreRefused) {
     std::string bytes;
   } cases[] = {
       {"empty", ""},
-      {"truncated string", "\xa5" "ab"},
+      {"truncated string",
+       "\xa5"
+       "ab"},
       {"array longer than its bytes", "\xdd\xff\xff\xff\xff\x01"},
       {"trailing bytes", std::string("\x01\x02")},
       {"reserved byte", "\xc1"},
       {"too deep", deep},
       {"unknown extension", "\xd4\x09\x00"},
-      {"short integer extension", "\xd5\x01" "l\x01"},
-      {"bad integer letter", "\xd5\x01" "zz"},
+      {"short integer extension",
+       "\xd5\x01"
+       "l\x01"},
+      {"bad integer letter",
+       "\xd5\x01"
+       "zz"},
       {"tuple that is no triple", "\xd4\x03\xc0"},
       {"opaque of a kind with content", "\xd4\x06\x01"},
   };

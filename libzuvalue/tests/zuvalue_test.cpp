@@ -76,7 +76,7 @@ TEST(ZUValueTypeTest, EachTypeHasItsNameAndArraySize) {
       ZUValue::makeArray({ZUValue::makeArray({}), ZUValue(), binary({255}), 1e-7f}).toString(),
       "[[], , \\255, 1e-07]");
   EXPECT_EQ(ZUValue("say \"hi\"").toString(1), "\"say \"hi\"\"");  // no escaping
-  EXPECT_EQ(ZUValue(3.14159f).toString(1), "3.14159");  // six significant digits
+  EXPECT_EQ(ZUValue(3.14159f).toString(1), "3.14159");             // six significant digits
 }
 
 TEST(ZUValueCopyTest, CopiesAreDeepAndSelfAssignmentIsSafe) {

@@ -385,19 +385,19 @@ SaySummary SayTimeline::end(bool stopped, ZU::MKID* id) {
   const auto sync = [withSync](std::int64_t us) {
     return withSync ? ko::AnyValue(us) : ko::AnyValue::none();
   };
-  fTimeline->record(kService, "end", ko::AnyValue::List{textId},
-                    ko::AnyValue::map({{"outcome", stopped ? "stopped" : "done"},
-                                       {"executed", summary.executed},
-                                       {"failed", summary.failed},
-                                       {"noAnimation", summary.noAnimation},
-                                       {"skipped", summary.skipped},
-                                       {"stopped", summary.stopped},
-                                       {"instructionErrors", summary.instructionErrors},
-                                       {"syncMedianUs", sync(summary.syncMedianUs)},
-                                       {"syncP99Us", summary.syncCount >= kSyncP99Count
-                                                         ? sync(summary.syncP99Us)
-                                                         : ko::AnyValue::none()},
-                                       {"syncMaxUs", sync(summary.syncMaxUs)}}));
+  fTimeline->record(
+      kService, "end", ko::AnyValue::List{textId},
+      ko::AnyValue::map({{"outcome", stopped ? "stopped" : "done"},
+                         {"executed", summary.executed},
+                         {"failed", summary.failed},
+                         {"noAnimation", summary.noAnimation},
+                         {"skipped", summary.skipped},
+                         {"stopped", summary.stopped},
+                         {"instructionErrors", summary.instructionErrors},
+                         {"syncMedianUs", sync(summary.syncMedianUs)},
+                         {"syncP99Us", summary.syncCount >= kSyncP99Count ? sync(summary.syncP99Us)
+                                                                          : ko::AnyValue::none()},
+                         {"syncMaxUs", sync(summary.syncMaxUs)}}));
   return summary;
 }
 

@@ -661,7 +661,8 @@ TEST_F(ServiceIndex, TagPageListsTheVisibleTags) {
   // Names are escaped: the text for HTML, the link's argument for its script.
   const std::string rows =
       "<tr><td>&lt;sit&gt;</td><td>" + link +
-      "animations/Sit/O\\x27Neil\\x26\\x2527\\x3cb\\x3e');\">animations/Sit/O&#39;Neil&amp;%27&lt;b&gt;</a>" +
+      "animations/Sit/O\\x27Neil\\x26\\x2527\\x3cb\\x3e');\">animations/Sit/"
+      "O&#39;Neil&amp;%27&lt;b&gt;</a>" +
       "<tr><td>hello</td><td>" + link + "animations/Stand/A');\">animations/Stand/A</a><br/>" +
       link + "animations/Stand/B');\">animations/Stand/B</a>" + "<tr><td>sit</td><td>" + link +
       "animations/Sit/C');\">animations/Sit/C</a>";

@@ -157,8 +157,8 @@ ZUTextToSpeech::ZUTextToSpeech(const std::shared_ptr<ZU::ZUBroker>& broker, cons
 
   // One thread: posted texts are spoken in the order they were posted.
   setEventLoop(std::make_shared<ko::EventLoop>(name, 1));
-  fHoldLoop = std::make_shared<ko::EventLoop>(name + ".mrkpause", 2,
-                                               ko::EventLoop::Scheduling::Realtime);
+  fHoldLoop =
+      std::make_shared<ko::EventLoop>(name + ".mrkpause", 2, ko::EventLoop::Scheduling::Realtime);
   fRecording = std::make_shared<SpeechRecording>(fSynthesizer->sampleRate());
   fListener = std::make_unique<Listener>(*this);
   fPlayer = std::make_unique<SpeechPlayer>(*fListener, fOptions.playbackRate, fRecording);

@@ -14,8 +14,8 @@
 #include <vector>
 
 #include "ko/log.hpp"
-#include "ko_test_helpers.hpp"
 #include "ko/session.hpp"
+#include "ko_test_helpers.hpp"
 #include "robotsim/speechscript.h"
 #include "robotsim/zumemory.h"
 #include "robotsim/zutexttospeech.h"

@@ -86,8 +86,8 @@ std::vector<std::string> Host::loadModuleLibrary(const std::string& path) {
 }
 
 void Host::xCreate(Library& library) {
-  const auto create = reinterpret_cast<ZU::ZUCreateModuleFunction>(
-      dlsym(library.handle, ZU::kCreateModuleSymbol));
+  const auto create =
+      reinterpret_cast<ZU::ZUCreateModuleFunction>(dlsym(library.handle, ZU::kCreateModuleSymbol));
   const std::vector<std::string> before = fSession->services();
   int status = 0;
   try {

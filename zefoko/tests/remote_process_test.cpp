@@ -28,7 +28,8 @@ using ko::test::ChildProcess;
 // tag; in random mode a text keeps its own actions alone.
 const std::string kText =
     "Hello ^start(animations/Stand/Gestures/Hey_1) my friend "
-    "^wait(animations/Stand/Gestures/Hey_1) bye ^runSound(bells/ding, 50) ^call(ZUMemory.nosuch(1)) "
+    "^wait(animations/Stand/Gestures/Hey_1) bye ^runSound(bells/ding, 50) "
+    "^call(ZUMemory.nosuch(1)) "
     "$done=1 ^startTag(hello) see you";
 
 class RemoteProcesses : public ::testing::Test {
@@ -43,8 +44,8 @@ class RemoteProcesses : public ::testing::Test {
   void TearDown() override { std::filesystem::remove_all(folder); }
 
   std::unique_ptr<ChildProcess> startRobot(bool fast) {
-    std::vector<std::string> argv{ZEFOKO_EXECUTABLE, "serve", "--listen", endpoint, "--speech",
-                                  "timing", "--heartbeat", "200"};
+    std::vector<std::string> argv{ZEFOKO_EXECUTABLE, "serve",  "--listen",    endpoint,
+                                  "--speech",        "timing", "--heartbeat", "200"};
     if (fast)
       argv.emplace_back("--fast");
     auto robot = std::make_unique<ChildProcess>(argv);
@@ -95,7 +96,8 @@ TEST_F(RemoteProcesses, ATextGivesTheSameActionsAndEndAcrossThreeProcessesAsInOn
   EXPECT_EQ(apart[3][3], "\"Cannot find method 'nosuch' on ZUMemory\"");
 
   // A robot programmer's script.
-  ChildProcess script({PYTHON_EXECUTABLE, SAY_EXAMPLE, endpoint, "Hi ^start(animations/Stand/Gestures/Hey_1) there"});
+  ChildProcess script({PYTHON_EXECUTABLE, SAY_EXAMPLE, endpoint,
+                       "Hi ^start(animations/Stand/Gestures/Hey_1) there"});
   EXPECT_TRUE(script.waitForLine("ZUMokuto/EndOfMokuto")) << script.output();
   EXPECT_EQ(script.wait(30s), 0) << script.output();
 }
@@ -127,15 +129,18 @@ TEST_F(RemoteProcesses, ARobotKilledMidTextEndsTheTextAndTheNextIsSpokenOnceItIs
 
   // The text ends by the director's own limits, and the log says why.
   EXPECT_NE(said.wait(30000), ko::FutureState::Timeout);
-  EXPECT_TRUE(capture->containsPart("ko.remote", ko::log::Warning, "Lost the link with " + endpoint));
-  EXPECT_TRUE(capture->containsPart("mokuto.director", ko::log::Error, "has not been received in time"));
+  EXPECT_TRUE(
+      capture->containsPart("ko.remote", ko::log::Warning, "Lost the link with " + endpoint));
+  EXPECT_TRUE(
+      capture->containsPart("mokuto.director", ko::log::Error, "has not been received in time"));
   EXPECT_FALSE(mokuto()->call<bool>("_isRunning"));
 
   // A new robot process: the module is made again for it, and speaks.
   robot = startRobot(true);
   ASSERT_TRUE(ko::test::eventually([&] { return host.session()->isLinked(); }));
   ASSERT_TRUE(host.reloadModules());
-  EXPECT_NO_THROW(mokuto()->call<void>("say", std::string("Again ^start(animations/Stand/Gestures/Hey_1) here")));
+  EXPECT_NO_THROW(mokuto()->call<void>(
+      "say", std::string("Again ^start(animations/Stand/Gestures/Hey_1) here")));
   host.shutdown();
 }
 
@@ -155,9 +160,10 @@ TEST_F(RemoteProcesses, AClientStopsItsOwnTextOnSigintAndOneKilledMidSayLetsTheT
   session->connect(endpoint);
   ASSERT_TRUE(session->waitForLink(10s));
   ko::test::Gate ended;
-  session->service("ZUTimeline").value(10000)->connect(
-      "entryRecorded", [&](std::int64_t, std::string service, std::string operation,
-                           ko::AnyValue arguments, ko::AnyValue) {
+  session->service("ZUTimeline")
+      .value(10000)
+      ->connect("entryRecorded", [&](std::int64_t, std::string service, std::string operation,
+                                     ko::AnyValue arguments, ko::AnyValue) {
         if (service == "ZUMemory" && operation == "raiseEvent" &&
             arguments.asList().at(0).asString() == "ZUMokuto/EndOfMokuto")
           ended.open();

@@ -345,11 +345,13 @@ class Promise {
   // argument, for the caller to settle it in another thread.
   bool trySetValueWithoutContinuations(std::optional<Stored>& value) {
     std::string none;
-    return state_ && state_->finishWithoutContinuations(FutureState::FinishedWithValue, value, none);
+    return state_ &&
+           state_->finishWithoutContinuations(FutureState::FinishedWithValue, value, none);
   }
   bool trySetErrorWithoutContinuations(std::string& error) {
     std::optional<Stored> none;
-    return state_ && state_->finishWithoutContinuations(FutureState::FinishedWithError, none, error);
+    return state_ &&
+           state_->finishWithoutContinuations(FutureState::FinishedWithError, none, error);
   }
 
   // Like the above, but answer false instead of throwing.

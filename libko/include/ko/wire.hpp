@@ -35,12 +35,12 @@ inline constexpr int kMaxDepth = 64;
 
 // The MessagePack extension types of the format.
 enum ExtensionType : std::int8_t {
-  kExtInteger = 1,   // a ko signature letter (cCwWiIlL), then the value big-endian
-  kExtNone = 2,      // empty: the value with no type at all
-  kExtTuple = 3,     // MessagePack [name, [member names], [members]]
-  kExtDynamic = 4,   // the MessagePack of the value inside
-  kExtVarArgs = 5,   // the MessagePack array of the arguments
-  kExtOpaque = 6,    // one byte: the ko::Kind of a kind without content
+  kExtInteger = 1,  // a ko signature letter (cCwWiIlL), then the value big-endian
+  kExtNone = 2,     // empty: the value with no type at all
+  kExtTuple = 3,    // MessagePack [name, [member names], [members]]
+  kExtDynamic = 4,  // the MessagePack of the value inside
+  kExtVarArgs = 5,  // the MessagePack array of the arguments
+  kExtOpaque = 6,   // one byte: the ko::Kind of a kind without content
 };
 
 // Appends the MessagePack of `value`; raises ko::Error for an object or a pointer.
