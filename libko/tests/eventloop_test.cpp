@@ -215,15 +215,6 @@ TEST(Reaper, ObjectsDroppedInAJobDieOnTheReaper) {
   EXPECT_EQ(where.load(), 2);
 }
 
-TEST(EventLoop, DestructionCancelsDelayedJobs) {
-  ko::Future<int> delayed;
-  {
-    ko::EventLoop loop("short-lived", 1);
-    delayed = loop.asyncDelay([] { return 1; }, std::chrono::hours(1));
-  }
-  EXPECT_EQ(delayed.error(0), "Promise broken");
-}
-
 TEST(EventLoop, DefaultLoopIsSharedAndSizedFromTheEnvironment) {
   // Each child process runs the test from the start: nothing may create the default loop
   // before the death tests.

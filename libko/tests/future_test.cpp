@@ -8,7 +8,6 @@
 #include <thread>
 #include <vector>
 
-#include "ko/eventloop.hpp"
 #include "ko_test_helpers.hpp"
 
 namespace {
@@ -156,15 +155,6 @@ TEST(FutureThen, ErrorsFlowThrough) {
   auto next = done.future().andThen([] { return std::string("after"); });
   done.setValue();
   EXPECT_EQ(next.value(), "after");
-}
-
-TEST(Future, AsyncJobThatThrowsCarriesTheExceptionText) {
-  ko::EventLoop loop("future-test", 1);
-  auto f = loop.async([]() -> int { throw std::invalid_argument("bad posture family"); });
-  EXPECT_EQ(f.wait(10000), FutureState::FinishedWithError);
-  EXPECT_EQ(f.error(), "bad posture family");
-  auto g = loop.async([] { throw 5; });
-  EXPECT_EQ(g.error(10000), "Unknown exception");
 }
 
 }  // namespace

@@ -3,7 +3,6 @@
 
 #include <atomic>
 #include <mutex>
-#include <set>
 #include <stdexcept>
 #include <thread>
 
@@ -110,35 +109,6 @@ TEST_F(ObjectTest, NoSingleMatchListsTheCandidates) {
   } catch (const ko::Error& e) {
     EXPECT_STREQ(e.what(), "Cannot find method 'missing' on calculator");
   }
-}
-
-TEST_F(ObjectTest, MetaObjectDescribesEveryMember) {
-  const ko::MetaObject meta = obj_->metaObject();
-  EXPECT_EQ(meta.description(), "calculator");
-  const auto adds = obj_->findMethod("add");
-  ASSERT_EQ(adds.size(), 3u);
-  EXPECT_EQ(adds[0].parametersSignature, "(ii)");
-  EXPECT_EQ(adds[0].returnSignature, "i");
-  EXPECT_EQ(adds[0].description, "Adds integers.");
-  EXPECT_EQ(adds[1].returnSignature, "s");
-  EXPECT_EQ(obj_->findMethod("setVolume").at(0).returnSignature, "v");
-  const auto sum = obj_->findMethod("sum").at(0);
-  EXPECT_EQ(sum.arity, 1u);
-  ASSERT_EQ(sum.parameters.size(), 1u);
-  EXPECT_EQ(sum.parameters[0].name, "values");
-  EXPECT_EQ(sum.returnValue.description, "Their sum.");
-
-  std::set<unsigned> ids;
-  for (const auto& m : meta.methods())
-    ids.insert(m.id);
-  for (const auto& s : meta.signals())
-    ids.insert(s.id);
-  EXPECT_EQ(ids.size(), meta.methods().size() + meta.signals().size());
-  const auto* ticked = meta.findSignal("ticked");
-  ASSERT_NE(ticked, nullptr);
-  EXPECT_EQ(ticked->parametersSignature, "(is)");
-  EXPECT_EQ(meta.method(ticked->id), nullptr);
-  EXPECT_TRUE(obj_->findMethod("nothing").empty());
 }
 
 TEST_F(ObjectTest, FailuresCarryTheirText) {

@@ -7,7 +7,6 @@
 #include <filesystem>
 #include <fstream>
 #include <set>
-#include <thread>
 
 #include "ko/os.hpp"
 #include "path_roots.hpp"
@@ -104,18 +103,6 @@ TEST_F(FindDataTest, PathsLeavingTheDataDirectoryAreRefused) {
   }
   EXPECT_EQ(ko::path::findData("zefoko", "db/./ok.bdb"), (first_ / "zefoko/db/ok.bdb").string());
   EXPECT_EQ(ko::path::findData("..", "secret.txt"), "");
-}
-
-TEST(Os, ClockEnvironmentAndThreadIds) {
-  const auto t0 = ko::os::ustime();
-  EXPECT_LE(t0, ko::os::ustime());
-  EXPECT_EQ(ko::os::getenv("KO_TEST_SURELY_UNSET_VARIABLE"), "");
-  setenv("KO_TEST_SET_VARIABLE", "0x1F4", 1);
-  EXPECT_EQ(ko::os::getenv("KO_TEST_SET_VARIABLE"), "0x1F4");
-  int other = 0;
-  std::thread([&] { other = ko::os::gettid(); }).join();
-  EXPECT_GT(ko::os::gettid(), 0);
-  EXPECT_NE(other, ko::os::gettid());
 }
 
 }  // namespace

@@ -8,7 +8,6 @@
 #include <stdexcept>
 
 #include "ko/log.hpp"
-#include "ko/os.hpp"
 #include "ko_test_helpers.hpp"
 
 namespace {
@@ -21,55 +20,6 @@ class PeriodicTaskTest : public ::testing::Test {
  protected:
   std::shared_ptr<ko::EventLoop> loop_ = std::make_shared<ko::EventLoop>("periodic", 4);
 };
-
-TEST_F(PeriodicTaskTest, DelayedStartWaitsOnePeriodImmediateStartDoesNot) {
-  constexpr std::int64_t period = 50000;
-  for (const bool immediate : {false, true}) {
-    SCOPED_TRACE(immediate ? "immediate" : "delayed");
-    ko::PeriodicTask task(loop_);
-    Counter calls;
-    std::atomic<std::int64_t> firstCall{0};
-    task.setCallback([&] {
-      std::int64_t unset = 0;
-      firstCall.compare_exchange_strong(unset, ko::os::ustime());
-      calls.increment();
-    });
-    task.setUsPeriod(period);
-    const std::int64_t started = ko::os::ustime();
-    task.start(immediate);
-    EXPECT_TRUE(task.isRunning());
-    ASSERT_TRUE(calls.waitFor(2));
-    task.stop();
-    EXPECT_FALSE(task.isRunning());
-    if (!immediate) {
-      EXPECT_GE(firstCall.load() - started, period);
-    }
-  }
-}
-
-TEST_F(PeriodicTaskTest, PeriodSetFromTheCallbackDelaysTheNextRun) {
-  ko::PeriodicTask task(loop_);
-  task.setName("period change");
-  constexpr std::int64_t longPeriod = 80000;
-  Counter calls;
-  std::atomic<std::int64_t> firstEnd{0}, secondStart{0};
-  task.setCallback([&] {
-    const int n = calls.value() + 1;
-    if (n == 1) {
-      task.setUsPeriod(longPeriod);
-      firstEnd = ko::os::ustime();
-    } else if (n == 2) {
-      secondStart = ko::os::ustime();
-    }
-    calls.increment();
-  });
-  task.setUsPeriod(0);
-  task.start(true);
-  ASSERT_TRUE(calls.waitFor(2));
-  task.stop();
-  EXPECT_EQ(task.usPeriod(), longPeriod);
-  EXPECT_GE(secondStart.load() - firstEnd.load(), longPeriod);
-}
 
 TEST_F(PeriodicTaskTest, StopWaitsForTheRunningCallback) {
   ko::PeriodicTask task(loop_);

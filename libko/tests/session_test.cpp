@@ -3,7 +3,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <atomic>
 #include <mutex>
 #include <thread>
 #include <utility>
@@ -56,24 +55,6 @@ TEST_F(SessionTest, RegisteredServiceIsFoundInBothScopesAndItsNameIsTaken) {
   EXPECT_THROW(session_.registerService("empty", nullptr), ko::Error);
   EXPECT_THROW(session_.unregisterService(42u), ko::Error);
   EXPECT_THROW(session_.unregisterService("nobody"), ko::Error);
-}
-
-TEST_F(SessionTest, UnregisterByIdOrNameAndSignals) {
-  std::vector<std::string> events;
-  session_.serviceRegistered.connect([&](unsigned id, const std::string& name) {
-    events.push_back("+" + name + std::to_string(id));
-  });
-  session_.serviceUnregistered.connect([&](unsigned id, const std::string& name) {
-    events.push_back("-" + name + std::to_string(id));
-  });
-  const unsigned a = session_.registerService("A", makeService("a"));
-  const unsigned b = session_.registerService("B", makeService("b"));
-  session_.unregisterService(a);
-  session_.unregisterService("B");
-  EXPECT_TRUE(session_.services().empty());
-  EXPECT_TRUE(session_.service("A").hasError());
-  EXPECT_THAT(events, ElementsAre("+A" + std::to_string(a), "+B" + std::to_string(b),
-                                  "-A" + std::to_string(a), "-B" + std::to_string(b)));
 }
 
 // The announcements follow the order of the changes, even when a registration and the
@@ -155,28 +136,6 @@ TEST_F(SessionTest, LookupHookCanHangFailOrPassThrough) {
   EXPECT_THAT(asked, ElementsAre("hang@local", "fail@", "throw@", "ZURobotPosture@local"));
   session_.setLookupHook(nullptr);
   EXPECT_EQ(session_.service("hang").error(0), "Cannot find service 'hang'");
-}
-
-TEST_F(SessionTest, ConcurrentRegistrationAndLookup) {
-  std::atomic<int> failures{0};
-  std::vector<std::thread> threads;
-  for (int t = 0; t < 4; ++t) {
-    threads.emplace_back([&, t] {
-      for (int i = 0; i < 200; ++i) {
-        const std::string name = "svc" + std::to_string(t) + "_" + std::to_string(i);
-        const unsigned id = session_.registerService(name, makeService(name));
-        auto found = session_.service(name, "local");
-        if (!found.hasValue(0) || found.value()->call<std::string>("whoami") != name)
-          ++failures;
-        session_.services();
-        session_.unregisterService(id);
-      }
-    });
-  }
-  for (auto& th : threads)
-    th.join();
-  EXPECT_EQ(failures.load(), 0);
-  EXPECT_TRUE(session_.services().empty());
 }
 
 }  // namespace

@@ -107,18 +107,6 @@ TEST(BrokerTest, TheSessionsSubscribersMayUseTheBroker) {
   EXPECT_TRUE(process.session->services().empty());
 }
 
-TEST(BrokerTest, AMissingServiceIsAnEmptyObjectAfterBothLookups) {
-  zutest::Process process;
-  ko::log::ScopedCapture cap;
-  EXPECT_EQ(process.broker->service("Nobody"), nullptr);
-  EXPECT_TRUE(cap->contains("ZUBroker", ko::log::Error,
-                            "Future exception while checking local service: Cannot find service "
-                            "'Nobody'"));
-  EXPECT_TRUE(cap->contains("ZUBroker", ko::log::Error,
-                            "Future exception while checking remote service: Cannot find "
-                            "service 'Nobody'"));
-}
-
 TEST(DeadlockTimeoutTest, ReadsTheBaseFromThePrefix) {
   const std::pair<const char*, int> cases[] = {
       {"0x1F4", 500}, {"0X1f4", 500}, {"500", 500},    {"0764", 500},

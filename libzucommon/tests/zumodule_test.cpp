@@ -3,13 +3,11 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <functional>
 #include <memory>
 #include <string>
 #include <vector>
 
 #include "ko/genericobject.hpp"
-#include "ko/log.hpp"
 #include "zu/zuproxy.h"
 #include "zutest_modules.h"
 
@@ -110,51 +108,6 @@ class BareModule : public ZU::ZUModuleCore {
  public:
   using ZUModuleCore::ZUModuleCore;
 };
-
-TEST(ModuleCoreTest, DefaultOperationsLogFromTheirOwnFunction) {
-  zutest::Process process;
-  const auto bare = std::make_shared<BareModule>(nullptr, "Bare");
-  const auto plain = std::make_shared<ZU::ZUModule>(process.broker, "Plain");
-  const struct {
-    std::function<std::string()> run;
-    std::string result;
-    const char* function;  // of the category "zucommon.zumodulecore"
-  } cases[] = {
-      {[&] {
-         bare->execute();
-         return std::string();
-       },
-       "", "execute"},
-      {[&] { return bare->httpGet(); }, "ZUModuleCore::httpGet not implemented", "httpGet"},
-      {[&] { return bare->getUsage("say"); }, "ZUModuleCore::getUsage not implemented", "getUsage"},
-      {[&] { return ZU::ZUValue::TypeToString(bare->moduleHelp().getType()); }, "Invalid",
-       "moduleHelp"},
-      {[&] { return bare->getBrokerName(); }, "ZUModuleCore::getBrokerName not implemented",
-       "getBrokerName"},
-  };
-  for (const auto& c : cases) {
-    ko::log::ScopedCapture cap;
-    EXPECT_EQ(c.run(), c.result);
-    const auto records = cap->records();
-    ASSERT_EQ(records.size(), 1u);
-    EXPECT_EQ(records[0].level, ko::log::Error);
-    EXPECT_EQ(records[0].category, "zucommon.zumodulecore");
-    EXPECT_EQ(records[0].function, std::string("ZU::ZUModuleCore::") + c.function);
-    EXPECT_EQ(records[0].message, std::string("ZUModuleCore::") + c.function + " not implemented");
-  }
-  ko::log::ScopedCapture cap;
-  EXPECT_EQ(plain->httpGet(), "ZUModule::httpGet not implemented");
-  EXPECT_TRUE(cap->contains("ZUModule", ko::log::Error, "ZUModule::httpGet not implemented"));
-  EXPECT_EQ(cap->records().at(0).function, "ZU::ZUModule::httpGet");
-  // The quiet defaults.
-  EXPECT_EQ(bare->version(), "2.1.4");
-  bare->init();
-  bare->exit();  // no broker: nothing to unregister
-  EXPECT_TRUE(ZU::ZUFunctorBase().call({}).isVoid());
-  EXPECT_TRUE(
-      cap->contains("zucommon.ZUFunctor", ko::log::Error, "ZUFunctor::call not implemented"));
-  EXPECT_EQ(cap->count(), 2u);
-}
 
 TEST(ModuleCoreTest, BindingMistakesRaise) {
   auto module = std::make_shared<Greeter>(nullptr, "Greeter");

@@ -3,9 +3,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <cinttypes>
 #include <climits>
-#include <cstdio>
 #include <functional>
 #include <limits>
 #include <string>
@@ -16,7 +14,6 @@
 
 namespace {
 
-using ::testing::EndsWith;
 using ::testing::StartsWith;
 using ZU::ZUError;
 using ZU::ZUValue;
@@ -29,22 +26,6 @@ std::string errorOf(const std::function<void()>& f) {
     return e.what();
   }
   return "<none>";
-}
-
-std::uintptr_t word(const void* p) {
-  return reinterpret_cast<std::uintptr_t>(p);
-}
-
-std::string hexWord(std::uintptr_t w) {
-  char buf[32];
-  std::snprintf(buf, sizeof buf, "%0*" PRIXPTR, static_cast<int>(2 * sizeof(void*)), w);
-  return buf;
-}
-
-// The verbosity-2 header of v.
-std::string header(const ZUValue& v, const char* type, std::uintptr_t storage) {
-  return "ZuValue at 0x" + hexWord(word(&v)) + ", Type: " + type + ", Value: 0x" +
-         hexWord(storage) + ", ";
 }
 
 ZUValue binary(std::vector<unsigned char> bytes) {
@@ -239,36 +220,6 @@ TEST(ZUValueMutableTest, AccessorsTurnInvalidIntoTheirTypeAndIntIntoBoolOrFloat)
   EXPECT_EQ(&p[0], first);
   p.arraySetSize(2);
   EXPECT_EQ(p.toString(), "[false, 1]");
-}
-
-// Verbosity 2 heads every value with its address, type and storage word; verbosity 3 tags it.
-TEST(ZUValueDumpTest, VerbosityTwoAndThree) {
-  ZUValue a = ZUValue::makeArray({42, -1, ZUValue::makeBool(true), 0.5f, "ab", binary({7})});
-  EXPECT_THAT(a.toString(2),
-              StartsWith("ZuValue at 0x" + hexWord(word(&a)) + ", Type: Array, Value: 0x"));
-  EXPECT_THAT(
-      a.toString(2),
-      EndsWith(", [Vector of 6 elem(s):" + header(a[0], "Int", 42) + "Int: 0x0000002A (42), " +
-               header(a[1], "Int", 0xFFFFFFFFu) + "Int: 0xFFFFFFFF (-1), " +
-               header(a[2], "Bool", 1) + "Bool:true, " + header(a[3], "Float", 0x3F000000u) +
-               "Float: 0.5, " + header(a[4], "String", word(&a[4].asString())) +
-               "String of size 2: \"ab\", " + header(a[5], "Binary", word(&a[5].asBinary())) +
-               "\\7]"));
-
-  const ZUValue invalid;
-  EXPECT_EQ(invalid.toString(), "");
-  EXPECT_EQ(invalid.toString(3), "\n<ZuValue>" + header(invalid, "Invalid", 0) + "\n</ZuValue>\n");
-  a = ZUValue::makeArray({7, binary({1, 200}), "x"});
-  const auto elem = [](const std::string& inner) {
-    return "\n<elem>\n\n<ZuValue>" + inner + "\n</ZuValue>\n\n</elem>";
-  };
-  EXPECT_THAT(a.toString(3), EndsWith(", \n<Vector>Vector of 3 elem(s):" +
-                                      elem(header(a[0], "Int", 7) + "Int: 0x00000007 (7)\n") +
-                                      elem(header(a[1], "Binary", word(&a[1].asBinary())) +
-                                           "\n<Binary>Binary: 2 bytes(s):\n\\1\\200</Binary>\n") +
-                                      elem(header(a[2], "String", word(&a[2].asString())) +
-                                           "String of size 1: \"x\"\n") +
-                                      "\n</Vector>\n</ZuValue>\n"));
 }
 
 }  // namespace

@@ -46,12 +46,5 @@ TEST(ViewerPage, HoldsTheAudioAndTheTimelineAndEscapesTheTexts) {
   }
 }
 
-TEST(ViewerPage, TheLivePageReadsItsEvents) {
-  const std::string page = viewer::livePage("live <robot>");
-  EXPECT_NE(page.find("<title>live &lt;robot&gt;</title>"), std::string::npos);
-  EXPECT_NE(page.find("new EventSource(\"events\")"), std::string::npos);
-  EXPECT_EQ(page.find("{{"), std::string::npos);
-}
-
 }  // namespace
 }  // namespace zefoko
