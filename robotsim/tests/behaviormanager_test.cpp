@@ -286,13 +286,6 @@ TEST_F(BehaviorManagerService, RefusedStartsAreErrors) {
   EXPECT_THAT(recorder->all(), ElementsAre(kLongHead));
 }
 
-TEST_F(BehaviorManagerService, StartWithoutTheMotionServiceIsAnError) {
-  robot.broker()->unregisterModule("ZUMotion");
-  EXPECT_THAT(errorOf([&] { proxy.startBehavior(kHeyStand); }),
-              HasSubstr("ZUMotion is not available"));
-  EXPECT_FALSE(proxy.isBehaviorRunning(kHeyStand));
-}
-
 TEST_F(BehaviorManagerService, PreloadReadsChangedDescriptors) {
   EXPECT_TRUE(proxy.preloadBehavior(kHeyStand));
   EXPECT_THROW(proxy.preloadBehavior("Hey_1"), ZU::ZUError);
@@ -362,15 +355,10 @@ TEST(BehaviorLibraryScan, MalformedDescriptorsAreSkipped) {
       {"bad/NegativeDuration", {"{\"duration\": -1, " + joints + "}", "must be positive"}},
       {"bad/TagNumber", {"{\"tags\": [3], \"duration\": 1, " + joints + "}", "list of non-empty"}},
       {"bad/NoJoints", {"{\"duration\": 1, \"joints\": {}}", "at least one joint"}},
-      {"bad/UnknownJoint", {descriptor({}, 0.5, "Tail"), "Unknown joint or chain name 'Tail'"}},
       {"bad/KeyAfterEnd", {"{\"duration\": 0.2, " + joints + "}", "after the end"}},
       {"bad/NoKeys",
        {"{\"duration\": 1, \"joints\": {\"HeadYaw\": {\"times\": [0.5]}}}",
         "needs \"times\" and \"keys\""}},
-      {"bad/HandleType",
-       {"{\"duration\": 1, \"joints\": {\"HeadYaw\": {\"times\": [0.5], \"keys\": [[0.1, [2, "
-        "-0.1, 0], [3, 0, 0]]]}}}",
-        "only 3 (Bezier)"}},
       {"bad/Deep", {std::string(300, '[') + std::string(300, ']'), "not JSON"}},
       {".", {descriptor({}, 0.5), "must lie in a behaviour folder"}},  // at the root
   };

@@ -3,13 +3,8 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <iterator>
-#include <numeric>
-#include <random>
 #include <stdexcept>
 #include <string>
-#include <string_view>
-#include <utility>
 #include <vector>
 
 #include "ko/log.hpp"
@@ -75,98 +70,6 @@ TEST(JapaneseReadings, ReadingProblemsAreNamed) {
     ADD_FAILURE() << "no error";
   } catch (const std::runtime_error& e) {
     EXPECT_NE(std::string(e.what()).find("mecab-ipadic-utf8"), std::string::npos) << e.what();
-  }
-}
-
-// ---- tags among the words ----------------------------------------------------------------
-
-const std::vector<std::string> kSentences = {"今日はいい天気ですね。", "博物館に3人で行きました。",
-                                             "私はHelloと言いながら2024年に東京タワーを見た。",
-                                             "ロボットが、ゆっくり歩いています！"};
-
-std::size_t characters(std::string_view s) {
-  return static_cast<std::size_t>(
-      std::count_if(s.begin(), s.end(), [](char c) { return (c & 0xC0) != 0x80; }));
-}
-
-// Marks at random places, one of them at each character edge in turn: none is lost or
-// reordered, the reading does not change, and a mark written inside a word goes to the
-// word's nearer edge (the start on a tie), any other stays between the same words.
-TEST(JapaneseTags, MarksAnywhereKeepTheirOrderAndTheirWords) {
-  std::mt19937 random(23);
-  for (const std::string& sentence : kSentences) {
-    const auto spoken = [](const SpeechScript& script) {
-      std::string out;
-      for (const auto& part : script.parts)
-        out += part.kind == SpeechScriptPart::Kind::Text ? part.text : "";
-      return out;
-    };
-    const std::string reading = spoken(JapaneseReadings::shared().read(parseSpeechText(sentence)));
-    std::vector<std::size_t> edges;
-    for (std::size_t at = 0; at <= sentence.size(); ++at) {
-      if (at == sentence.size() || (sentence[at] & 0xC0) != 0x80)
-        edges.push_back(at);
-    }
-    std::uniform_int_distribution<std::size_t> anyEdge(0, edges.size() - 1);
-    for (const std::size_t edge : edges) {
-      std::vector<std::size_t> places{edge};
-      for (std::size_t n = std::uniform_int_distribution<std::size_t>(0, 3)(random); n > 0; --n)
-        places.push_back(edges[anyEdge(random)]);
-      std::sort(places.begin(), places.end());
-      // The text with its marks, and where each tag stands in it.
-      std::string text;
-      std::vector<std::pair<std::size_t, std::size_t>> tags;
-      for (std::size_t n = 0, from = 0; n <= places.size(); ++n) {
-        const std::size_t to = n < places.size() ? places[n] : sentence.size();
-        text += sentence.substr(from, to - from);
-        from = to;
-        if (n == places.size())
-          break;
-        const std::string tag = (n % 2 ? "\\mrkpause=" : "\\mrk=") + std::to_string(n) + "\\";
-        tags.emplace_back(text.size(), tag.size());
-        text += tag;
-      }
-      SCOPED_TRACE(text);
-      const auto untagged = [&](std::size_t offset) {
-        std::size_t out = offset;
-        for (const auto& [at, length] : tags)
-          out -= at < offset ? length : 0;
-        return out;
-      };
-      const auto read = JapaneseReadings::shared().read(parseSpeechText(text));
-      EXPECT_EQ(spoken(read), reading);
-      std::vector<std::size_t> numbers;
-      for (auto mark = read.parts.begin(); mark != read.parts.end(); ++mark) {
-        if (mark->kind != SpeechScriptPart::Kind::Mark)
-          continue;
-        const auto n = static_cast<std::size_t>(read.marks[mark->mark].number);
-        numbers.push_back(n);
-        // The words either side of the mark, in the sentence.
-        const auto word = [](auto from, auto to) {
-          const auto found =
-              std::find_if(from, to, [](const auto& part) { return part.sourceLength > 0; });
-          return found == to ? nullptr : &*found;
-        };
-        const SpeechScriptPart* previous =
-            word(std::make_reverse_iterator(mark), read.parts.rend());
-        const SpeechScriptPart* next = word(mark + 1, read.parts.end());
-        const std::size_t before =
-            previous ? untagged(previous->source + previous->sourceLength) : 0;
-        const std::size_t after = next ? untagged(next->source) : sentence.size();
-        const std::size_t at = places[n];
-        const std::string_view s = sentence;
-        if (at < before) {  // moved on to the end of the word it was in
-          const std::size_t begin = untagged(previous->source);
-          EXPECT_GT(characters(s.substr(begin, at - begin)), characters(s.substr(at, before - at)));
-        } else if (at > after) {  // moved back to the start of the word it was in
-          const std::size_t end = untagged(next->source + next->sourceLength);
-          EXPECT_LE(characters(s.substr(after, at - after)), characters(s.substr(at, end - at)));
-        }
-      }
-      std::vector<std::size_t> written(places.size());
-      std::iota(written.begin(), written.end(), 0);
-      EXPECT_EQ(numbers, written);
-    }
   }
 }
 

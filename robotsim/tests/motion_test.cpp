@@ -58,13 +58,6 @@ TEST(BezierSegment, ThirdHandlesGiveTheSmoothStep) {
   }
 }
 
-TEST(BezierSegment, AngleHandlesShapeTheCurve) {
-  // Inner points (1/3, 0.5) and (2/3, 1): y(1/2) = 3/8 * 0.5 + 3/8 + 1/8.
-  EXPECT_NEAR(bezierSegmentValue(0, 0, 1.0 / 3, 0.5, 2.0 / 3, 1, 1, 1, 0.5), 0.6875, kTolerance);
-  // Scaled in time and angle: from (2, -1) to (4, 1).
-  EXPECT_NEAR(bezierSegmentValue(2, -1, 2 + 2.0 / 3, -1, 4 - 2.0 / 3, 1, 4, 1, 3), 0.0, kTolerance);
-}
-
 TEST(BezierSegment, HandlesBeyondTheSegmentStayAFunctionOfTime) {
   // Handles reaching past the other key are shortened to it: the value still rises
   // monotonically from one key to the other.
