@@ -286,24 +286,6 @@ TEST_F(BehaviorManagerService, RefusedStartsAreErrors) {
   EXPECT_THAT(recorder->all(), ElementsAre(kLongHead));
 }
 
-TEST_F(BehaviorManagerService, PreloadReadsChangedDescriptors) {
-  EXPECT_TRUE(proxy.preloadBehavior(kHeyStand));
-  EXPECT_THROW(proxy.preloadBehavior("Hey_1"), ZU::ZUError);
-
-  const std::string relative = std::string(kHeyStand) + "/" + kBehaviorFileName;
-  const fs::path file = folder.path() / relative;
-  const auto written = fs::last_write_time(file);
-  folder.write(relative, descriptor({"wave"}, 0.2));
-  fs::last_write_time(file, written + std::chrono::seconds(1));
-  EXPECT_TRUE(proxy.preloadBehavior(kHeyStand));
-  EXPECT_THAT(proxy.getBehaviorTags(kHeyStand), ElementsAre("wave"));
-
-  folder.write(relative, "{\"tags\": [], \"duration\": 1}");
-  fs::last_write_time(file, written + std::chrono::seconds(2));
-  EXPECT_THAT(errorOf([&] { proxy.preloadBehavior(kHeyStand); }),
-              HasSubstr("\"joints\" must be an object"));
-}
-
 // Installs, removals and rescans change the library on disk and raise their events.
 TEST_F(BehaviorManagerService, LibraryChangesAreAnnounced) {
   const std::string wave = "animations/Stand/Gestures/Wave_9";

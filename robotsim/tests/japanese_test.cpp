@@ -141,22 +141,5 @@ TEST(JapaneseSpeaking, EachBookmarkComesWithTheWordAfterIt) {
   }
 }
 
-// The timing engine's Japanese lasts about as long as espeak-ng's, its bookmarks near
-// espeak-ng's; the blanks that the service puts around bookmarks are not read.
-TEST(JapaneseSpeaking, TheTimingEngineReadsJapaneseAtItsOwnRate) {
-  const std::string text =
-      "こんにちは。 \\mrk=1\\ 私はロボットです。 \\mrk=2\\ みなさんと一緒にお話しできて "
-      "\\mrk=3\\ うれしいです。 \\mrk=4\\ 昨日は友達と公園で \\mrk=5\\ 遊びました。";
-  const Spoken spoken = speak(text);
-  const Spoken estimated = speak(text, ZUTextToSpeechOptions::Backend::Timing);
-  EXPECT_NEAR(estimated.durationUs / spoken.durationUs, 1.0, 0.15);
-  ASSERT_EQ(spoken.marks.size(), estimated.marks.size());
-  for (std::size_t i = 0; i < spoken.marks.size(); ++i) {
-    EXPECT_NEAR(static_cast<double>(estimated.marks[i].audioUs),
-                static_cast<double>(spoken.marks[i].audioUs), 0.15 * spoken.durationUs)
-        << "bookmark " << spoken.marks[i].number;
-  }
-}
-
 }  // namespace
 }  // namespace robotsim

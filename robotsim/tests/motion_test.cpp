@@ -37,27 +37,6 @@ BezierKey flatKey(double previousTime, double time, double nextTime, double angl
 
 // ---- Bezier curves ------------------------------------------------------------------------
 
-struct SegmentCase {
-  const char* name;
-  double t;
-  double expected;
-};
-
-// From (0, 0) to (1, 1) with inner points a third of the way: the time is linear in the
-// curve parameter u, so the angle is 3u^2 - 2u^3.
-TEST(BezierSegment, ThirdHandlesGiveTheSmoothStep) {
-  const SegmentCase cases[] = {
-      {"start", 0.0, 0.0},  {"quarter", 0.25, 0.15625},
-      {"middle", 0.5, 0.5}, {"three quarters", 0.75, 0.84375},
-      {"end", 1.0, 1.0},    {"before", -1.0, 0.0},
-      {"after", 2.0, 1.0},
-  };
-  for (const auto& c : cases) {
-    EXPECT_NEAR(bezierSegmentValue(0, 0, 1.0 / 3, 0, 2.0 / 3, 1, 1, 1, c.t), c.expected, kTolerance)
-        << c.name;
-  }
-}
-
 TEST(BezierSegment, HandlesBeyondTheSegmentStayAFunctionOfTime) {
   // Handles reaching past the other key are shortened to it: the value still rises
   // monotonically from one key to the other.

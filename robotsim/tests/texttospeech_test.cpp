@@ -237,22 +237,6 @@ TEST(TextToSpeechEspeak, BlockingBookmarkHoldsTheSpeechUntilItsCallbackReturns) 
   expectReachedOnTime(marks[2]);
 }
 
-TEST(TextToSpeechEspeak, StopEndsTheTextWithStopped) {
-  Robot robot(espeak());
-  std::string text = "This text \\mrk=1\\ goes on";
-  for (int i = 0; i < 20; ++i)
-    text += " and on";
-  text += " \\mrk=2\\ to the end.";
-  const int id = robot.tts.post_say(text);
-  ASSERT_TRUE(robot.waitForBookmark(1));
-  robot.tts.stop(id);
-  EXPECT_FALSE(robot.tts.wait(id, 10'000));
-  ASSERT_TRUE(robot.waitForStatus(id, "stopped"));
-  EXPECT_EQ(robot.statuses(id), (std::vector<std::string>{"started", "stopped"}));
-  EXPECT_EQ(robot.bookmarks(), std::vector<int>{1});
-  EXPECT_FALSE(robot.tts.isRunning(id));
-}
-
 TEST(TextToSpeechEspeak, StopDuringAHeldBlockingBookmarkDoesNotWaitForTheCallback) {
   Robot robot(espeak());
   robot.mokuto->holdBlockingBookmarks();
