@@ -48,20 +48,6 @@ TEST(AnyValue, KindsAndSignaturesOfValuesAndTypes) {
   EXPECT_EQ(ko::signatureOf<void>(), "v");
 }
 
-TEST(AnyValue, TypedConversionsRoundTrip) {
-  EXPECT_EQ(AnyValue::from(std::vector<int>{1, 2, 3}).to<std::vector<int>>(),
-            (std::vector<int>{1, 2, 3}));
-  std::map<std::string, std::vector<std::string>> m{{"hello", {"hi", "hey"}}};
-  EXPECT_EQ((AnyValue::from(m).to<std::map<std::string, std::vector<std::string>>>()), m);
-  EXPECT_EQ((AnyValue::from(std::pair<int, std::string>{1, "a"}).to<std::pair<int, std::string>>()),
-            (std::pair<int, std::string>{1, "a"}));
-  EXPECT_EQ(AnyValue(7).to<double>(), 7.0);
-  EXPECT_EQ(AnyValue(2.9).to<int>(), 2);
-  EXPECT_TRUE(AnyValue(true).to<bool>());
-  EXPECT_EQ(AnyValue::dynamic("x").to<std::string>(), "x");
-  EXPECT_EQ(AnyValue(5).to<AnyValue>(), AnyValue(5));
-}
-
 TEST(AnyValue, FailedConversionsNameBothSignatures) {
   try {
     (void)AnyValue("abc").to<int>();

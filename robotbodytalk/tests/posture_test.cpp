@@ -68,24 +68,6 @@ TEST(PostureWatcher, FailuresAreLoggedAndTheFamiliesKeptOrReadStill) {
                                 "Cannot unsubscribe to event PostureFamilyChanged: \t"));
 }
 
-TEST(PostureWatcher, InAnUnknownPostureNeitherHeadNorArmsMove) {
-  FakeRobot robot;
-  robot.posture->setFamily("Kneeling");
-  ko::log::ScopedCapture log;
-  bodytalktest::BodyTalkHandle bodyTalk(robot.broker, 0.001);
-  bodyTalk->getPosture()->init();
-  EXPECT_EQ(bodyTalk->getPostureFamily(), ZU::Unknown);
-  bodyTalk->setSpeakingAnimations(ZU::Unknown, {"a"});
-  bodyTalk->start(ZU::ZURobotBodyTalk::kSpeaking, {}, true);
-  for (const char* line :
-       {"Cannot move the head in that posture", "Cannot move the arms in that posture"}) {
-    EXPECT_TRUE(bodytalktest::waitForLines(log, "robotbodytalk", ko::log::Warning, line));
-  }
-  bodyTalk->stop();
-  EXPECT_EQ(robot.motion->log.count("angleInterpolationBezier"), 0u);
-  EXPECT_EQ(robot.behaviors->log.count("startBehavior"), 0u);
-}
-
 TEST(PostureWatcher, AnEventReachesThePartsOnlyAtTheNextStartOrResume) {
   bodytalktest::BodyTalkOnFakeRobot t(0.001);
   const auto& posture = t.bodyTalk->getPosture();

@@ -82,11 +82,6 @@ class Robot {
         },
         kBound);
   }
-  bool waitForBookmark(int number) const {
-    return mokuto->waitForEvents(
-        [&](const std::vector<ReceivedEvent>& events) { return hasBookmark(events, number); },
-        kBound);
-  }
   static bool hasBookmark(const std::vector<ReceivedEvent>& events, int number) {
     for (const auto& e : events) {
       if (e.key == kBookmark && e.value.asInt() == number)
@@ -475,12 +470,7 @@ TEST(TextToSpeechLanguages, EspeakSpeaksTheServicesLanguages) {
   EXPECT_EQ(robot.tts.getLanguage(), "French");
   robot.speak("Bonjour \\mrk=1\\ tout le monde.");
   EXPECT_EQ(robot.bookmarks(), std::vector<int>{1});
-  try {
-    robot.tts.call<void>("setLanguage", std::string("Klingon"));
-    ADD_FAILURE() << "Klingon accepted";
-  } catch (const ZU::ZUError& e) {
-    EXPECT_NE(std::string(e.what()).find("Unknown language: Klingon"), std::string::npos);
-  }
+  EXPECT_THROW(robot.tts.call<void>("setLanguage", std::string("Klingon")), ZU::ZUError);
   EXPECT_EQ(robot.tts.getLanguage(), "French");
 }
 
