@@ -428,13 +428,18 @@ TEST_F(Director, ATagIsNotLaunchedOnceThePostureChanged) {
   EXPECT_TRUE(end(run));
 }
 
-TEST_F(Director, TheBlockingBehaviourAtTheEndRunsBeforeTheTextEnds) {
-  ZU::MokutoConfig config;
-  config.behaviorAtEndOfMokuto = mokutotest::kEnd;
-  Run run = begin(rig_.job("Bye", config));
-  ASSERT_TRUE(end(run));
-  EXPECT_FALSE(ZU::ZUBehaviorManagerProxy(rig_.broker).isBehaviorRunning(mokutotest::kEnd));
-  EXPECT_TRUE(rig_.waitFor("ZUBehaviorManager", "behaviorStopped", mokutotest::kEnd));
+TEST_F(Director, TheBehaviourAtTheEndHoldsTheTextOnlyWhenBlocking) {
+  // A blocking one has ended when the text ends; a 30 s one not blocking lets it end at once.
+  for (const auto& [behaviour, blocking] : {std::pair{kMid, true}, std::pair{kLongA, false}}) {
+    SCOPED_TRACE(behaviour);
+    ZU::MokutoConfig config;
+    config.behaviorAtEndOfMokuto = behaviour;
+    config.ifBehaviorAtEndOfMokutoIsBlocking = blocking;
+    Run run = begin(rig_.job("Bye", config));
+    ASSERT_TRUE(end(run));
+    EXPECT_EQ(rig_.count("ZUBehaviorManager", "behaviorStopped", behaviour), blocking ? 1u : 0u);
+    EXPECT_TRUE(rig_.waitFor("ZUBehaviorManager", "startBehavior", behaviour));
+  }
 }
 
 TEST_F(Director, AnAutomaticYeahAsksForAStepForwardAboutHalfOfTheTime) {
