@@ -4,13 +4,10 @@
 #include <gtest/gtest.h>
 
 #include <dlfcn.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <atomic>
 #include <chrono>
-#include <filesystem>
-#include <fstream>
 #include <future>
 #include <map>
 #include <memory>
@@ -21,19 +18,14 @@
 #include <utility>
 #include <vector>
 
+#include "director_rig.h"
 #include "ko/log.hpp"
-#include "ko/path.hpp"
 #include "ko/reaper.hpp"
 #include "ko/session.hpp"
 #include "ko_test_helpers.hpp"
 #include "mokuto/zumokuto.h"
 #include "robotsim/timeline.h"
-#include "robotsim/zuaudioplayer.h"
-#include "robotsim/zubehaviormanager.h"
 #include "robotsim/zumemory.h"
-#include "robotsim/zumotion.h"
-#include "robotsim/zurobotstate.h"
-#include "robotsim/zutexttospeech.h"
 #include "scripted_speech.h"
 #include "service_rig.h"
 #include "zefoko/host.h"
@@ -42,7 +34,6 @@
 
 namespace {
 
-namespace fs = std::filesystem;
 using namespace std::chrono_literals;
 using mokutotest::kBound;
 using mokutotest::ScriptedSpeech;
@@ -66,28 +57,6 @@ class ZUSlow : public ZU::ZUModule {
   }
   std::shared_ptr<ko::test::Gate> gate = std::make_shared<ko::test::Gate>();
   std::shared_ptr<ko::test::Counter> entered = std::make_shared<ko::test::Counter>();
-};
-
-// A memory service that accepts everything but micro-event subscriptions.
-class RefusingMemory : public ZU::ZUModule {
- public:
-  RefusingMemory(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
-      : ZU::ZUModule(broker, name) {
-    bindMethods("RefusingMemory",
-                {{"declareEvent", &RefusingMemory::declareEvent},
-                 {"raiseEvent", &RefusingMemory::raiseEvent},
-                 {"subscribeToEvent", &RefusingMemory::subscribeToEvent},
-                 {"subscribeToMicroEvent", &RefusingMemory::subscribeToMicroEvent},
-                 {"unsubscribeToEvent", &RefusingMemory::unsubscribeToEvent}});
-  }
-  void declareEvent(const std::string&, const std::string&) {}
-  void raiseEvent(const std::string&, const ZU::ZUValue&) {}
-  void subscribeToEvent(const std::string&, const std::string&, const std::string&) {}
-  void subscribeToMicroEvent(const std::string&, const std::string&, const std::string&,
-                             const std::string&) {
-    ZU_THROW_ERROR(getName(), "subscribeToMicroEvent", "micro-events are not served here");
-  }
-  void unsubscribeToEvent(const std::string&, const std::string&) {}
 };
 
 // A behaviour manager with a library that the test sets, counting the list requests (one
@@ -152,67 +121,24 @@ struct StageLog {
   }
 };
 
-fs::path makeLibrary() {
-  static std::atomic<int> serial{0};
-  const fs::path root =
-      fs::temp_directory_path() /
-      ("mokuto-service-" + std::to_string(::getpid()) + "-" + std::to_string(serial.fetch_add(1)));
-  const fs::path folder = root / "animations/Stand/Gestures/Hey_1";
-  fs::create_directories(folder);
-  std::ofstream(folder / "behavior.json")
-      << "{\"tags\": [\"hello\"], \"duration\": 0.3, \"joints\": {\"LWristYaw\": {\"times\": "
-         "[0.3], \"keys\": [[0.2, [3, -0.1, 0.0], [3, 0.0, 0.0]]]}}}";
-  return root;
-}
-
 // ---- the service on the simulated robot, with a scripted speech engine ---------------------
 
 class ServicePipeline : public testing::Test {
  protected:
-  ServicePipeline() : fLibrary(makeLibrary()) {
-    using ZU::ZUModule;
-    broker_ = ZU::ZUBroker::create(std::make_shared<ko::Session>());
-    robotsim::ZUMemoryOptions memoryOptions;
-    memoryOptions.timeline = timeline_;
-    fServices.push_back(
-        ZUModule::createModule<robotsim::ZUMemory>(broker_, "ZUMemory", memoryOptions));
-    fServices.push_back(ZUModule::createModule<robotsim::ZUMotion>(broker_, "ZUMotion", timeline_));
-    fServices.push_back(ZUModule::createModule<robotsim::ZUBehaviorManager>(
-        broker_, "ZUBehaviorManager", timeline_, fLibrary.string()));
-    fServices.push_back(
-        ZUModule::createModule<robotsim::ZUAudioPlayer>(broker_, "ZUAudioPlayer", timeline_));
-    fServices.push_back(
-        ZUModule::createModule<robotsim::ZURobotPosture>(broker_, "ZURobotPosture", timeline_));
-    fServices.push_back(ZUModule::createModule<robotsim::ZURobotModel>(broker_, "ZURobotModel"));
-    fServices.push_back(ZUModule::createModule<robotsim::ZUAutonomousMoves>(
-        broker_, "ZUAutonomousMoves", timeline_));
-    slow_ = ZUModule::createModule<ZUSlow>(broker_, "ZUSlow");
-    fServices.push_back(slow_);
-    speech_ = ZUModule::createModule<ScriptedSpeech>(broker_, "ZUTextToSpeech");
-    fServices.push_back(speech_);
-
+  ServicePipeline() {
+    slow_ = ZU::ZUModule::createModule<ZUSlow>(rig_.broker, "ZUSlow");
     ZU::ZUMokutoOptions options;
     options.bodyTalk.timeScale = 0.01;
     options.stopAllWait = 100ms;  // the robot waits 3 s
     options.onStage = [stages = stages_](Stage stage, ZU::MKID id) { stages->enter(stage, id); };
-    mokuto_ = ZUModule::createModule<ZU::ZUMokuto>(broker_, "ZUMokuto", options);
+    mokuto_ = ZU::ZUModule::createModule<ZU::ZUMokuto>(rig_.broker, "ZUMokuto", options);
     mokuto_->setBodyLanguageModeFromStr("disabled");
     EXPECT_TRUE(mokuto_->waitForIndex(kBound));
   }
 
   ~ServicePipeline() override {
     mokuto_->exit();
-    mokuto_.reset();
-    while (!fServices.empty()) {
-      fServices.back()->exit();
-      fServices.pop_back();
-    }
-    slow_.reset();
-    speech_.reset();
-    broker_.reset();
-    ko::waitForReaper();
-    std::error_code ec;
-    fs::remove_all(fLibrary, ec);
+    slow_->exit();
   }
 
   std::future<void> sayAsync(const std::string& text) {
@@ -238,16 +164,12 @@ class ServicePipeline : public testing::Test {
   }
 
   ko::log::ScopedCapture log_{ko::log::Info};
-  std::shared_ptr<robotsim::Timeline> timeline_ = std::make_shared<robotsim::Timeline>();
+  mokutotest::DirectorRig rig_{mokutotest::DirectorRig::Speech::Scripted, false};
+  const std::shared_ptr<robotsim::Timeline>& timeline_ = rig_.timeline;
+  const std::shared_ptr<ScriptedSpeech>& speech_ = rig_.speech;
   std::shared_ptr<StageLog> stages_ = std::make_shared<StageLog>();
-  std::shared_ptr<ZU::ZUBroker> broker_;
   std::shared_ptr<ZUSlow> slow_;
-  std::shared_ptr<ScriptedSpeech> speech_;
   std::shared_ptr<ZU::ZUMokuto> mokuto_;
-
- private:
-  fs::path fLibrary;
-  std::vector<std::shared_ptr<ZU::ZUModuleCore>> fServices;
 };
 
 TEST_F(ServicePipeline, TwoTextsOverlapInThePipelineButAreNeverSpokenAtOnce) {
@@ -361,7 +283,7 @@ TEST_F(ServicePipeline, ExitWhileATextIsSpokenEndsTheTextFirst) {
   ASSERT_TRUE(ready(text));
   EXPECT_EQ(endEvents(), std::vector<int>{1});
   EXPECT_FALSE(mokuto_->_isRunning());
-  const auto names = broker_->session()->services();
+  const auto names = rig_.broker->session()->services();
   EXPECT_EQ(std::count(names.begin(), names.end(), "ZUMokuto"), 0);
 }
 
@@ -406,7 +328,7 @@ TEST_F(ServicePipeline, PrepareCompilesAndLoadsInTheLastReportedPostureWithoutSp
     mokuto_->_postureFamilyChangedCallback("PostureFamilyChanged", report.value, "");
     EXPECT_EQ(mokuto_->prepare("Hi")->postureFamily, report.family);
   }
-  const std::string gesture = "animations/Stand/Gestures/Hey_1";
+  const std::string gesture = mokutotest::kShort;
   const auto job = mokuto_->prepare("Hi ^start(" + gesture + ") there",
                                     ZU::ZUValue::makeArray({ZU::ZUValue::makeArray(
                                         {ZU::ZUValue("msPauseBeforeSpeech"), ZU::ZUValue(0)})}));
@@ -425,7 +347,7 @@ TEST_F(ServicePipeline, ACallWhoseServiceDoesNotAnswerIsGivenUpAfterTheLookupTim
   // The lookups of "ZUNowhere" never answer.
   auto pending = std::make_shared<std::vector<ko::Promise<ko::AnyObject>>>();
   auto asked = std::make_shared<ko::test::Counter>();
-  const auto session = broker_->session();
+  const auto session = rig_.broker->session();
   session->setLookupHook(
       [pending, asked](const std::string& name,
                        const std::string&) -> std::optional<ko::Future<ko::AnyObject>> {
@@ -464,68 +386,6 @@ TEST_F(ServicePipeline, ACallWhoseServiceDoesNotAnswerIsGivenUpAfterTheLookupTim
 }
 
 // ---- the method table and the configuration methods ---------------------------------------
-
-struct MethodRow {
-  const char* name;
-  std::vector<std::string> parameters;
-  const char* result;  // "" for none
-};
-
-TEST_F(ServicePipeline, PublishesItsMethodsInOrderAfterTheBuiltIns) {
-  const std::vector<MethodRow> table = {
-      {"say", {"text"}, ""},
-      {"say", {"text", "configuration"}, ""},
-      {"_reset", {}, ""},
-      {"_stopAll", {"blocking"}, ""},
-      {"_isRunning", {}, "running"},
-      {"setBodyTalkEnabled", {"enable"}, ""},
-      {"setBodyLanguageEnabled", {"enable"}, ""},
-      {"setBodyLanguageModeFromStr", {"stringBodyLanguageMode"}, ""},
-      {"setBodyLanguageMode", {"bodyLanguageMode"}, ""},
-      {"getBodyLanguageModeToStr", {}, "stringBodyLanguageMode"},
-      {"getBodyLanguageMode", {}, "bodyLanguageMode"},
-      {"declareAnimationsPackage", {"animationsPackage"}, ""},
-      {"_setMSPauseBeforeSpeech", {"pause"}, ""},
-      {"_getMSPauseBeforeSpeech", {}, "pause"},
-      {"_isCheckExecutionTimesEnabled", {}, "enable"},
-      {"_setCheckExecutionTimes", {"pause"}, ""},
-      {"addTagsToWords", {"tagsToWords"}, ""},
-      {"declareTagForAnimations", {"tagsToAnimations"}, ""},
-      {"_diagnosis", {}, ""},
-      {"isBodyTalkEnabled", {}, "enable"},
-      {"isBodyLanguageEnabled", {}, "enable"},
-      {"_getTagList", {}, "tags"},
-      {"_getAnimationsByTag", {"tag"}, "animations"},
-      {"_speechBookMarkCallback", {"memoryKey", "value", "message"}, ""},
-      {"_mrkpauseCallback", {"pBookmark"}, ""},
-      {"_speechStatusCallback", {"memoryKey", "value", "message"}, ""},
-      {"_postureFamilyChangedCallback", {"memoryKey", "value", "message"}, ""},
-      {"_updateRepresentations", {"memoryKey", "value", "message"}, ""},
-      {"_dialogMatchedInputCallback", {"memoryKey", "value", "message"}, ""},
-  };
-  const auto infos = mokuto_->getMethodInfos();
-  ASSERT_GT(infos.size(), table.size());
-  const std::size_t builtIns = infos.size() - table.size();
-  for (std::size_t i = 0; i < table.size(); ++i) {
-    const auto& info = infos[builtIns + i];
-    SCOPED_TRACE(info.name);
-    EXPECT_EQ(info.name, table[i].name);
-    EXPECT_EQ(info.moduleClass, "ZUMokuto");
-    std::vector<std::string> parameters;
-    for (const auto& parameter : info.parameters)
-      parameters.push_back(parameter.name);
-    EXPECT_EQ(parameters, table[i].parameters);
-    EXPECT_EQ(info.returnValue ? info.returnValue->name : "", table[i].result);
-  }
-  EXPECT_EQ(mokuto_->getModuleDescription(),
-            "The Mokuto module makes ZEFO interpret a text annotated with behaviors.");
-  EXPECT_EQ(infos[builtIns + 24].description,
-            "Method called by the tts when \"mrkpause\" bookmark is reached.This method is "
-            "blocking until the action is finish.");
-  EXPECT_EQ(infos[builtIns + 7].description,
-            "Set the current body language mode.\n3 modes exist: \"disabled\", \"random\" and "
-            "\"contextual\"\n(see BodyLanguageMode enum for more details)");
-}
 
 TEST_F(ServicePipeline, ConfigurationMethodsRefuseBadValuesAndKeepTheConfiguration) {
   struct Bad {
@@ -579,7 +439,7 @@ class ServiceIndex : public testing::Test {
   ServiceIndex() {
     using ZU::ZUModule;
     broker_ = ZU::ZUBroker::create(std::make_shared<ko::Session>());
-    fServices.push_back(ZUModule::createModule<RefusingMemory>(broker_, "ZUMemory"));
+    fServices.push_back(ZUModule::createModule<robotsim::ZUMemory>(broker_, "ZUMemory"));
     behaviors_ = ZUModule::createModule<StubBehaviorManager>(broker_, "ZUBehaviorManager");
     fServices.push_back(behaviors_);
     fServices.push_back(ZUModule::createModule<ScriptedSpeech>(broker_, "ZUTextToSpeech"));
@@ -612,17 +472,6 @@ class ServiceIndex : public testing::Test {
  private:
   std::vector<std::shared_ptr<ZU::ZUModuleCore>> fServices;
 };
-
-TEST_F(ServiceIndex, StartsWhenTheMicroEventSubscriptionIsRefused) {
-  EXPECT_TRUE(log_->containsPart(kMain, ko::log::Error,
-                                 "Cannot subscribe to microEvent "
-                                 "WordRecognized: "));
-  EXPECT_TRUE(log_->containsPart(kMain, ko::log::Error, "micro-events are not served here"));
-  const auto names = mokuto_->getMethodList();
-  EXPECT_EQ(names.back(), "_dialogMatchedInputCallback");
-  EXPECT_EQ(ZU::ZUProxy("ZUMokuto", broker_).call<std::string>("getBodyLanguageModeToStr"),
-            "contextual");
-}
 
 TEST_F(ServiceIndex, PackagesAreRefreshedOnceForTheBehavioursThatChanged) {
   EXPECT_EQ(behaviors_->lists.load(), 1);           // the index of "animations/" at start
@@ -675,27 +524,6 @@ TEST_F(ServiceIndex, TagPageListsTheVisibleTags) {
 
 // ---- on the whole simulated robot --------------------------------------------------------
 
-TEST(ServiceOnTheRobot, RecognisedWordsRaiseTheirEmotionFromAConfidenceOfOneHalf) {
-  if (ko::path::findData("zefoko", "mokuto/syntacticanalysis/englishemotionsdatabase.bdb").empty())
-    GTEST_SKIP() << "the build made no linguistic databases";
-  mokutotest::ServiceRig rig;
-  std::size_t raised = 0;
-  for (const double confidence : {0.49, 0.5, 0.9}) {
-    SCOPED_TRACE(confidence);
-    rig.mokuto->_dialogMatchedInputCallback(
-        "WordRecognized",
-        ZU::ZUValue::makeArray({ZU::ZUValue("I am happy"), ZU::ZUValue(confidence)}), "");
-    raised += confidence >= 0.5 ? 1U : 0U;
-    EXPECT_EQ(rig.events("AsrEmotion"), raised);
-  }
-  for (const auto& entry : rig.robot->timeline()->entries("ZUMemory", "raiseEvent")) {
-    const auto arguments = entry.arguments.to<std::vector<ko::AnyValue>>();
-    if (arguments.at(0).to<std::string>() == "AsrEmotion") {
-      EXPECT_GT(arguments.at(1).to<int>(), 0);
-    }
-  }
-}
-
 TEST(ServiceOnTheRobot, TheTimingCheckerFramesTheEndEventAndComesBackWhenSwitchedOnAgain) {
   mokutotest::ServiceRig rig;
   ko::log::ScopedCapture log(ko::log::Info);
@@ -720,28 +548,6 @@ TEST(ServiceOnTheRobot, TheTimingCheckerFramesTheEndEventAndComesBackWhenSwitche
 }
 
 // ---- the module library -------------------------------------------------------------------
-
-TEST(ServiceLibrary, WithoutASpeechEngineTheModuleIsNotCreated) {
-  const auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
-  const auto memory = ZU::ZUModule::createModule<robotsim::ZUMemory>(broker, "ZUMemory");
-  void* library = ::dlopen(ZUMOKUTO_PLUGIN, RTLD_NOW);
-  ASSERT_NE(library, nullptr) << ::dlerror();
-  const auto create =
-      reinterpret_cast<ZU::ZUCreateModuleFunction>(::dlsym(library, ZU::kCreateModuleSymbol));
-  ASSERT_NE(create, nullptr);
-  try {
-    create(broker);
-    ADD_FAILURE() << "created";
-  } catch (const ZU::ZUError& e) {
-    EXPECT_EQ(e.moduleName(), "ZUMokuto");
-    EXPECT_EQ(e.methodName(), "Constructor");
-    EXPECT_EQ(e.description(), "Module ZUTextToSpeech not found");
-  }
-  const auto names = broker->session()->services();
-  EXPECT_EQ(std::count(names.begin(), names.end(), "ZUMokuto"), 0);
-  memory->exit();
-  ::dlclose(library);
-}
 
 TEST(ServiceLibrary, TheHostLoadsItAndItsEntryPointsAnswerZero) {
   zefoko::HostOptions options;
