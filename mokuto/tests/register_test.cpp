@@ -4,54 +4,15 @@
 #include <chrono>
 #include <future>
 #include <memory>
-#include <set>
 #include <string>
 
 #include "ko/log.hpp"
-#include "ko/session.hpp"
 #include "ko_test_helpers.hpp"
 #include "mokuto/mkidregister.h"
-#include "zu/zubroker.h"
-#include "zu/zumodule.h"
 
 namespace {
 
 using namespace std::chrono_literals;
-
-// A module that registers a text from a posted call, as the service's say does.
-class Registrar : public ZU::ZUModule {
- public:
-  Registrar(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
-      : ZU::ZUModule(broker, name) {
-    bindMethods("Registrar", {{"registerText", &Registrar::registerText, "Registers a text."}});
-  }
-  void registerText() {
-    registered = texts.newMKID(std::make_shared<ZU::MKTaskInstruction>(), *this);
-  }
-
-  ZU::MKIDRegister texts;
-  ZU::MKID registered = 0;
-};
-
-TEST(TextRegister, LocalIdentifiersCountFromOneAndTasksBringTheirOwn) {
-  auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
-  auto registrar = ZU::ZUModule::createModule<Registrar>(broker, "Registrar");
-  ZU::MKIDRegister& texts = registrar->texts;
-
-  auto first = std::make_shared<ZU::MKTaskInstruction>();
-  auto second = std::make_shared<ZU::MKTaskInstruction>();
-  auto a = std::async(std::launch::async, [&] { return texts.newMKID(first, *registrar); });
-  auto b = std::async(std::launch::async, [&] { return texts.newMKID(second, *registrar); });
-  EXPECT_EQ((std::set{a.get(), b.get()}), (std::set{1, 2}));
-  EXPECT_EQ(std::set({first->id, second->id}), (std::set{1, 2}));
-
-  const int task = registrar->pCall(ko::AnyValue::list({"registerText"}));
-  EXPECT_FALSE(registrar->wait(task, 10000));
-  EXPECT_EQ(registrar->registered, task);
-  EXPECT_EQ(texts.nextTextId, 3);
-  EXPECT_FALSE(texts.isMKIDStopped(42));
-  registrar->exit();
-}
 
 TEST(TextRegister, ASharedIdentifierKeepsTheLaterTextAndItsSecondReleaseIsLogged) {
   ko::log::ScopedCapture log(ko::log::Info);
