@@ -382,7 +382,7 @@ TEST_F(Director, TheBehaviourAtTheEndHoldsTheTextOnlyWhenBlocking) {
     config.ifBehaviorAtEndOfMokutoIsBlocking = blocking;
     Run run = begin(rig_.job("Bye", config));
     ASSERT_TRUE(end(run));
-    EXPECT_EQ(rig_.count("ZUBehaviorManager", "behaviorStopped", behaviour), blocking ? 1u : 0u);
+    EXPECT_EQ(ZU::ZUBehaviorManagerProxy(rig_.broker).isBehaviorRunning(behaviour), !blocking);
     EXPECT_TRUE(rig_.waitFor("ZUBehaviorManager", "startBehavior", behaviour));
   }
 }

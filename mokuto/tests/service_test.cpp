@@ -118,6 +118,16 @@ class ServicePipeline : public testing::Test {
     mokuto_ = ZU::ZUModule::createModule<ZU::ZUMokuto>(rig_.broker, "ZUMokuto", options);
     mokuto_->setBodyLanguageModeFromStr("disabled");
     EXPECT_TRUE(mokuto_->waitForIndex(kBound));
+    // Whether some text was still registered as running when an end event was raised (with
+    // one text at a time: whether the ended one was).
+    rig_.timeline->addListener([weak = std::weak_ptr(mokuto_),
+                                flag = endedWhileRunning_](const robotsim::TimelineEntry& entry) {
+      if (entry.operation != "raiseEvent" ||
+          entry.arguments.to<std::vector<ko::AnyValue>>().at(0).to<std::string>() != kEnd)
+        return;
+      if (const auto module = weak.lock(); module && module->_isRunning())
+        flag->store(true);
+    });
   }
 
   ~ServicePipeline() override { mokuto_->exit(); }
@@ -149,6 +159,7 @@ class ServicePipeline : public testing::Test {
   const std::shared_ptr<robotsim::Timeline>& timeline_ = rig_.timeline;
   const std::shared_ptr<ScriptedSpeech>& speech_ = rig_.speech;
   std::shared_ptr<StageLog> stages_ = std::make_shared<StageLog>();
+  std::shared_ptr<std::atomic<bool>> endedWhileRunning_ = std::make_shared<std::atomic<bool>>();
   std::shared_ptr<ZU::ZUMokuto> mokuto_;
 };
 
@@ -195,6 +206,7 @@ TEST_F(ServicePipeline, APostedSayIsKnownByItsTaskIdAndStoppedByIt) {
   EXPECT_FALSE(mokuto_->wait(task, 10000));  // the call has ended
   EXPECT_EQ(endEvents(), std::vector<int>{task});
   EXPECT_FALSE(mokuto_->_isRunning());
+  EXPECT_FALSE(endedWhileRunning_->load());
 }
 
 TEST_F(ServicePipeline, StopAllWithoutWaitingStopsATextWaitingForTheDirector) {
