@@ -1,4 +1,4 @@
-// The service module ZUMokuto: its method table and library, the say pipeline and its
+// The service module ZUMokuto: its library, the say pipeline and its
 // stops on the simulated robot with a scripted speech engine, the index callbacks, the
 // diagnosis and the tag page.
 #include <gtest/gtest.h>
@@ -410,7 +410,7 @@ TEST_F(ServicePipeline, ConfigurationMethodsRefuseBadValuesAndKeepTheConfigurati
   EXPECT_EQ(mokuto_->getBodyLanguageModeToStr(), "contextual");
 }
 
-// ---- the index callbacks, the tag page and the start, on stand-in services ----------------
+// ---- the index callbacks and the tag page, on stand-in services --------------------------
 
 class ServiceIndex : public testing::Test {
  protected:
