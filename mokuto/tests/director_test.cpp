@@ -138,36 +138,6 @@ TEST_F(Director, EarlyBookmarksWaitForTheActionsBeforeThem) {
   EXPECT_TRUE(end(run));
 }
 
-TEST_F(Director, AMissingBookmarkIsSkipped400msAfterALaterOneOrTheEndOfSpeech) {
-  for (const bool speechEnds : {false, true}) {
-    SCOPED_TRACE(speechEnds);
-    recorder_ = std::make_shared<mokutotest::SyncRecorder>();
-    rig_.host->director().setObserver(recorder_);
-    Run run = begin(rig_.job("$a=1 $b=1 $c=1"));
-    bookmark(1);
-    ASSERT_TRUE(recorder_->waitFor(1));
-    if (speechEnds)
-      rig_.speech->finish(run.say.id);
-    else
-      bookmark(3);
-    ASSERT_TRUE(recorder_->waitFor(3));
-    const auto reports = recorder_->reports();
-    EXPECT_TRUE(log_->contains(kDirector, ko::log::Error,
-                               "The instruction with id 2 has not been received in time."));
-    if (speechEnds) {
-      EXPECT_EQ(outcomes(), (std::vector{Outcome::Executed, Outcome::Skipped, Outcome::Skipped}));
-      EXPECT_GE(reports[2].endUs - reports[1].endUs, 400'000);
-      EXPECT_TRUE(log_->contains(kDirector, ko::log::Error,
-                                 "The instruction with id 3 has not been received in time."));
-    } else {
-      EXPECT_EQ(outcomes(), (std::vector{Outcome::Executed, Outcome::Skipped, Outcome::Executed}));
-      EXPECT_GE(reports[1].endUs - reports[2].bookmarkUs, 400'000);
-    }
-    EXPECT_TRUE(end(run));
-  }
-  EXPECT_EQ(rig_.count("ZUMemory", "raiseEvent", "b"), 0u);
-}
-
 TEST_F(Director, AMrkpauseHoldsTheSpeechUntilItsRunEnds) {
   Run run = begin(rig_.job("^run(" + std::string(kMid) + ") and after"));
   ASSERT_TRUE(paused(1));
@@ -232,7 +202,11 @@ TEST_F(Director, AStopOfATextWaitingForTheStageStopsOnlyTheCurrentAnimations) {
   EXPECT_FALSE(rig_.speech->waitForSay(1, 0ms));
 }
 
-TEST_F(Director, BookmarkValuesThatAreNoActionsNumberAreIgnored) {
+TEST_F(Director, BookmarksWhileNoTextIsSpokenAndValuesThatAreNoActionsNumberAreIgnored) {
+  ZU::DirectorTask& director = rig_.host->director();
+  director.xOnBookmark(ZU::ZUValue(1));
+  auto held = std::async(std::launch::async, [&director] { director.xBookmarkReached(1, true); });
+  ASSERT_EQ(held.wait_for(kBound), std::future_status::ready);  // the speech is not held
   Run run = begin(rig_.job("$a=1 Hello"));
   for (const ZU::ZUValue& value : {ZU::ZUValue(0), ZU::ZUValue("1"), ZU::ZUValue(1.5F),
                                    ZU::ZUValue(), ZU::ZUValue::makeArray({1}), ZU::ZUValue(7)})
@@ -384,35 +358,6 @@ TEST_F(Director, TagsAndNamesAreRunWaitedForAndStoppedByTheirActions) {
   EXPECT_FALSE(log_->containsPart(kDirector, ko::log::Error, "did not stop before"));
 }
 
-TEST_F(Director, ABookmarkWhileNoTextIsSpokenIsIgnored) {
-  ZU::DirectorTask& director = rig_.host->director();
-  director.xOnBookmark(ZU::ZUValue(1));
-  auto held = std::async(std::launch::async, [&director] { director.xBookmarkReached(1, true); });
-  ASSERT_EQ(held.wait_for(kBound), std::future_status::ready);  // the speech is not held
-  Run run = begin(rig_.job("$x=1 Hello"));
-  rig_.speech->finish(run.say.id);
-  ASSERT_TRUE(recorder_->waitFor(1));
-  EXPECT_EQ(outcomes(), std::vector{Outcome::Skipped});
-  EXPECT_TRUE(end(run));
-}
-
-TEST_F(Director, ABehaviourThatStopsUnheardIsLetGoByTheFiveSecondCheck) {
-  // The director no longer hears the behaviour manager; the speech events still come.
-  ZU::DirectorTask& director = rig_.host->director();
-  director.unsubscribeToEvents();
-  ZU::ZUMemoryProxy memory(rig_.broker);
-  memory.subscribeToEvent("ZUTextToSpeech/CurrentBookMark", "ZUMokuto", "_speechBookMarkCallback");
-  memory.subscribeToEvent("ZUTextToSpeech/Status", "ZUMokuto", "_speechStatusCallback");
-  Run run = begin(rig_.job("^run(" + std::string(kShort) + ") Hello"));
-  ASSERT_TRUE(paused(1));
-  EXPECT_TRUE(
-      log_->contains(kDirector, ko::log::Error,
-                     "MK hasn't been notified that the behavior: \"" + std::string(kShort) +
-                         "\" has stopped.\nMake sure that the animation name follow the pattern: "
-                         "\"package/animationPath\""));
-  EXPECT_TRUE(end(run));
-}
-
 TEST_F(Director, ATagIsNotLaunchedOnceThePostureChanged) {
   const auto& posture = rig_.host->bodyTalk()->getPosture();
   posture->setPostureFamily(ZU::Standing);
@@ -428,13 +373,20 @@ TEST_F(Director, ATagIsNotLaunchedOnceThePostureChanged) {
   EXPECT_TRUE(end(run));
 }
 
-TEST_F(Director, TheBlockingBehaviourAtTheEndRunsBeforeTheTextEnds) {
-  ZU::MokutoConfig config;
-  config.behaviorAtEndOfMokuto = mokutotest::kEnd;
-  Run run = begin(rig_.job("Bye", config));
-  ASSERT_TRUE(end(run));
-  EXPECT_FALSE(ZU::ZUBehaviorManagerProxy(rig_.broker).isBehaviorRunning(mokutotest::kEnd));
-  EXPECT_TRUE(rig_.waitFor("ZUBehaviorManager", "behaviorStopped", mokutotest::kEnd));
+TEST_F(Director, TheBehaviourAtTheEndHoldsTheTextOnlyWhenBlocking) {
+  // A blocking one has ended when the text ends; a 30 s one not blocking lets it end at once.
+  for (const auto& [behaviour, blocking] : {std::pair{kMid, true}, std::pair{kLongA, false}}) {
+    SCOPED_TRACE(behaviour);
+    ZU::MokutoConfig config;
+    config.behaviorAtEndOfMokuto = behaviour;
+    config.ifBehaviorAtEndOfMokutoIsBlocking = blocking;
+    Run run = begin(rig_.job("Bye", config));
+    ASSERT_TRUE(end(run));
+    if (blocking) {
+      EXPECT_FALSE(ZU::ZUBehaviorManagerProxy(rig_.broker).isBehaviorRunning(behaviour));
+    }
+    EXPECT_TRUE(rig_.waitFor("ZUBehaviorManager", "startBehavior", behaviour));
+  }
 }
 
 TEST_F(Director, AnAutomaticYeahAsksForAStepForwardAboutHalfOfTheTime) {

@@ -41,6 +41,9 @@ enum class StopAt {
   Director,
   Strike,  // once the row's last fault has struck
   Hold,    // once the speech holds at a blocking bookmark
+  // Once the director waits for a bookmark held back, in a round that only the stop ends
+  // (the clock holds the rounds for the row).
+  Round,
 };
 
 enum Flags : unsigned {
@@ -230,6 +233,8 @@ std::vector<Row> matrix() {
       {"a blocking bookmark lost", "ZUTextToSpeech.bookmarks:drop=1", run, 400,
        lost + "1 has not been received in time."},
       {"a blocking bookmark late", "ZUTextToSpeech.bookmarks:delay=300ms@1", run, 200},
+      {"stopped while the director waits for a bookmark held back",
+       "ZUTextToSpeech.bookmarks:delay=2s@1", run, 0, "", StopAt::Round, kRestSkipped},
       // ---- stops from another thread at each stage ----
       {"stopped entering the compiler", "", start, 0, "", StopAt::Compiler, kRestSkipped},
       {"stopped entering the loader", "", start, 0, "", StopAt::Loader, kRestSkipped},
@@ -292,11 +297,13 @@ TEST(FaultMatrix, EveryTextEndsOnceWithinItsLimitsAndTheNextIsSpokenNormally) {
     rig.faults->set(faults);
     const auto clockBefore = rig.clock->now();
 
+    rig.clock->holdRounds(row.stopAt == StopAt::Round);
     auto said = rig.sayAsync(row.text, configuration(row.config));
-    if (row.stopAt == StopAt::Strike || row.stopAt == StopAt::Hold) {
+    if (row.stopAt == StopAt::Strike || row.stopAt == StopAt::Hold || row.stopAt == StopAt::Round) {
       const bool reached =
-          row.stopAt == StopAt::Hold
-              ? rig.waitForTimeline("ZUTextToSpeech", "hold", holds + 1)
+          row.stopAt == StopAt::Hold ? rig.waitForTimeline("ZUTextToSpeech", "hold", holds + 1)
+          : row.stopAt == StopAt::Round
+              ? ko::test::eventually([&] { return rig.clock->heldRounds() > 0; })
               : rig.faults->waitForStrikes(faults.back().service, faults.back().operation,
                                            strikesBefore.back() + 1, kBound);
       EXPECT_TRUE(reached) << "the moment to stop never came";
@@ -328,6 +335,8 @@ TEST(FaultMatrix, EveryTextEndsOnceWithinItsLimitsAndTheNextIsSpokenNormally) {
       rig.faults->lift();
     }
     const bool ended = ready(said);
+    rig.clock->holdRounds(false);
+    EXPECT_TRUE(ended || row.stopAt != StopAt::Round) << "the stop did not wake the director";
     // Every fault struck (a stop asks the speech engine from the event loop: that call may
     // come after the end of the text).
     const std::size_t firstStruck = (row.flags & kHeldBookmark) ? 1 : 0;

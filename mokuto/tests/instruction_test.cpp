@@ -23,38 +23,6 @@ std::vector<std::uint32_t> addActions(MKTaskInstruction& job, int count) {
   return ids;
 }
 
-struct NumberingCase {
-  const char* name;
-  std::vector<std::int32_t> callerBookmarks;
-  std::vector<std::uint32_t> expectedIds;
-};
-
-class BookmarkNumbering : public testing::TestWithParam<NumberingCase> {};
-
-TEST_P(BookmarkNumbering, SkipsTheCallersNumbers) {
-  const NumberingCase& c = GetParam();
-  MKTaskInstruction job;
-  job.usedBookmarks = c.callerBookmarks;
-  EXPECT_EQ(addActions(job, static_cast<int>(c.expectedIds.size())), c.expectedIds);
-
-  std::vector<std::int32_t> expectedUsed = c.callerBookmarks;
-  for (const std::uint32_t id : c.expectedIds) {
-    expectedUsed.push_back(static_cast<std::int32_t>(id));
-  }
-  EXPECT_EQ(job.usedBookmarks, expectedUsed);
-}
-
-INSTANTIATE_TEST_SUITE_P(
-    Cases, BookmarkNumbering,
-    testing::Values(NumberingCase{"none", {}, {1, 2, 3}},
-                    NumberingCase{"oneAndTwo", {1, 2}, {3, 4}},
-                    NumberingCase{"five", {5}, {1, 2, 3, 4, 6, 7}},
-                    NumberingCase{"unsortedWithGaps", {4, 2, 3, 9}, {1, 5, 6, 7, 8, 10}},
-                    NumberingCase{"duplicates", {2, 2, 1}, {3, 4}},
-                    NumberingCase{"negativeAndZero", {-1, 0, -3}, {1, 2}},
-                    NumberingCase{"farAhead", {1000}, {1, 2, 3}}),
-    [](const testing::TestParamInfo<NumberingCase>& p) { return p.param.name; });
-
 // Automatic tags come after the parsed actions; a number recorded in between (as another
 // stage might) is skipped as well. Each action added makes the first one current again.
 TEST(BookmarkNumberingLater, ContinuesFromTheLastActionAndResetsTheCurrentAction) {

@@ -485,18 +485,6 @@ TEST_F(LoaderOnStandIns, AbortUpdateEndsTheUpdateInProgressAndWaitsForIt) {
   EXPECT_EQ(loader->getInstalledTags(ZU::Standing), (TagMap{{"a", {"animations/Stand/A"}}}));
 }
 
-TEST_F(LoaderOnStandIns, APreloadThatFailsIsLoggedAndLeavesTheActionValid) {
-  manager.setLibrary({{"animations/Stand/A", {}}});
-  manager.failOn("preloadBehavior", "animations/Stand/A");
-  ko::log::ScopedCapture log;
-  const auto made = job("^start(animations/Stand/A)", ZU::Standing);
-  loader->process(*made);
-  EXPECT_EQ(made->actions[0]->type, ZU::START);
-  EXPECT_EQ(loader->getPreloadCounts(), (Counts{{"animations/Stand/A", 0}}));
-  EXPECT_TRUE(log->containsPart(kCategory, ko::log::Error,
-                                "Could not preload behavior animations/Stand/A: "));
-}
-
 TEST(LoaderWithoutServices, EachFailingCallMarksOnlyItsActionAndTheStageGoesOn) {
   const auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
   LoaderTask loader(broker, nullptr);

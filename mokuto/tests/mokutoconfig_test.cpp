@@ -206,18 +206,6 @@ TEST(MokutoConfigFromZUValueTest, MalformedValuesAndElementsAreSkippedSilently) 
             ["msPauseBeforeSpeech", 0, 1], [1, 0], [["msPauseBeforeSpeech"], 0]])"}) {
     c.fromZUValue(json(text));
   }
-  // A key held as a Binary is not a string, and is not turned into one.
-  ZUValue binaryKey;
-  binaryKey.arraySetSize(1);
-  binaryKey[0].arraySetSize(2);
-  const std::string key = "msPauseBeforeSpeech";
-  binaryKey[0][0].binaryRef().assign(key.begin(), key.end());
-  binaryKey[0][1] = 0;
-  ::testing::internal::CaptureStdout();
-  c.fromZUValue(binaryKey);
-  EXPECT_EQ(::testing::internal::GetCapturedStdout(), "");
-  EXPECT_TRUE(binaryKey[0][0].isBinary());
-
   expectDefaults(c);
   EXPECT_EQ(cap->count(), 0u);
   // A JSON object arrives as pairs.

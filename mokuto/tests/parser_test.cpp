@@ -6,6 +6,7 @@
 #include <set>
 #include <sstream>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "ko/log.hpp"
@@ -413,34 +414,20 @@ TEST(ParserLogSilence, FailuresThatLeaveWordsLogNothing) {
 // Texts built from the bytes that matter to the parser, to compare the three ways of
 // finding closing parentheses; the long ones exhaust the adaptive walk's budget.
 std::string randomText(std::mt19937& random, std::size_t pieces, bool withClosing) {
-  static const std::vector<std::string> kPieces = {"(",
-                                                   "\"",
-                                                   "\\",
-                                                   " ",
-                                                   "a",
-                                                   "$",
-                                                   "=",
-                                                   "/",
-                                                   ",",
-                                                   ".",
-                                                   "1",
-                                                   "^",
-                                                   "^start(",
-                                                   "^run(",
-                                                   "^call(",
-                                                   "^runSound(",
-                                                   "^mode(",
-                                                   "^pCall(",
-                                                   "^foo (",
-                                                   "\\mrk=2\\",
-                                                   "\\pau=",
-                                                   "A.b(",
-                                                   "^inputMode2(",
-                                                   "é",
-                                                   "$x=1 ",
-                                                   "^stopTag(",
-                                                   ")",
-                                                   ")"};
+  // The pieces, "|" between them; the last two are closing parentheses.
+  static const std::vector<std::string> kPieces = [] {
+    std::vector<std::string> all;
+    std::string piece;
+    for (const char c : std::string(
+             "(|\"|\\| |a|$|=|/|,|.|1|^|^start(|^run(|^call(|^runSound(|^mode(|^pCall(|^foo (|"
+             "\\mrk=2\\|\\pau=|A.b(|^inputMode2(|é|$x=1 |^stopTag(|)|)|")) {
+      if (c == '|')
+        all.push_back(std::exchange(piece, ""));
+      else
+        piece += c;
+    }
+    return all;
+  }();
   const std::size_t last = kPieces.size() - (withClosing ? 1 : 3);
   std::uniform_int_distribution<std::size_t> pick(0, last);
   std::string text;

@@ -1,59 +1,18 @@
-// The text register (identifiers, release, stop marks) and the timing checker.
+// The text register: identifiers, release, stop marks.
 #include <gtest/gtest.h>
 
 #include <chrono>
 #include <future>
 #include <memory>
-#include <set>
 #include <string>
 
-#include "director_rig.h"
 #include "ko/log.hpp"
-#include "ko/session.hpp"
 #include "ko_test_helpers.hpp"
 #include "mokuto/mkidregister.h"
-#include "mokuto/mokutotimechecker.h"
-#include "zu/zubroker.h"
-#include "zu/zumodule.h"
 
 namespace {
 
 using namespace std::chrono_literals;
-
-// A module that registers a text from a posted call, as the service's say does.
-class Registrar : public ZU::ZUModule {
- public:
-  Registrar(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
-      : ZU::ZUModule(broker, name) {
-    bindMethods("Registrar", {{"registerText", &Registrar::registerText, "Registers a text."}});
-  }
-  void registerText() {
-    registered = texts.newMKID(std::make_shared<ZU::MKTaskInstruction>(), *this);
-  }
-
-  ZU::MKIDRegister texts;
-  ZU::MKID registered = 0;
-};
-
-TEST(TextRegister, LocalIdentifiersCountFromOneAndTasksBringTheirOwn) {
-  auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
-  auto registrar = ZU::ZUModule::createModule<Registrar>(broker, "Registrar");
-  ZU::MKIDRegister& texts = registrar->texts;
-
-  auto first = std::make_shared<ZU::MKTaskInstruction>();
-  auto second = std::make_shared<ZU::MKTaskInstruction>();
-  auto a = std::async(std::launch::async, [&] { return texts.newMKID(first, *registrar); });
-  auto b = std::async(std::launch::async, [&] { return texts.newMKID(second, *registrar); });
-  EXPECT_EQ((std::set{a.get(), b.get()}), (std::set{1, 2}));
-  EXPECT_EQ(std::set({first->id, second->id}), (std::set{1, 2}));
-
-  const int task = registrar->pCall(ko::AnyValue::list({"registerText"}));
-  EXPECT_FALSE(registrar->wait(task, 10000));
-  EXPECT_EQ(registrar->registered, task);
-  EXPECT_EQ(texts.nextTextId, 3);
-  EXPECT_FALSE(texts.isMKIDStopped(42));
-  registrar->exit();
-}
 
 TEST(TextRegister, ASharedIdentifierKeepsTheLaterTextAndItsSecondReleaseIsLogged) {
   ko::log::ScopedCapture log(ko::log::Info);
@@ -93,71 +52,6 @@ TEST(TextRegister, ASharedIdentifierKeepsTheLaterTextAndItsSecondReleaseIsLogged
   EXPECT_EQ(records[0].function, "ZU::ZUMokuto::xFreeMKID");
   EXPECT_EQ(records[0].message,
             "Cannot remove the id of the current text because it doesn't exist anymore.");
-}
-
-// The checker of a rig's director, through the host's say as the service's say uses it.
-TEST(TimeChecker, TimesOnlyTheTextsSpokenWhileSwitchedOn) {
-  ko::log::ScopedCapture log(ko::log::Info);
-  mokutotest::DirectorRig rig;
-  const auto& checker = rig.host->director().getTimeChecker();
-  std::size_t says = 0;
-  const auto speak = [&](bool stopBefore) {
-    auto job = rig.job("Hello");
-    if (stopBefore) {
-      // Stopped while it waits for the stage: the director never sees it.
-      std::lock_guard lock(rig.host->textRegister.textsMutex);
-      rig.host->textRegister.textsToStop.insert(rig.host->textRegister.nextTextId);
-    }
-    auto done = rig.sayAsync(job);
-    if (!stopBefore) {
-      const auto say = rig.speech->waitForSay(says++);
-      EXPECT_TRUE(say);
-      rig.speech->finish(say ? say->id : 0);
-    }
-    return done.get();
-  };
-  const auto events = [&](const char* event) { return rig.count("ZUMemory", "raiseEvent", event); };
-  // The lines of "mokuto.times", each checked for its form "<what>: <n>ms".
-  const auto timed = [&] {
-    std::vector<std::string> out;
-    for (const auto& r : log->records()) {
-      if (r.category != "mokuto.times")
-        continue;
-      const auto colon = r.message.find(": ");
-      const std::string ms = r.message.substr(colon + 2);
-      EXPECT_EQ(r.level, ko::log::Info);
-      EXPECT_TRUE(ms.size() > 2 && ms.find_first_not_of("0123456789") == ms.size() - 2 &&
-                  ms.substr(ms.size() - 2) == "ms")
-          << r.message;
-      out.push_back(r.message.substr(0, colon));
-    }
-    return out;
-  };
-  const std::vector<std::string> twoLines = {"time between 'start of MK' and 'start of TTS'",
-                                             "time between 'stop of TTS' and 'stop of MK'"};
-
-  speak(false);  // off
-  EXPECT_EQ(events(ZU::MokutoTimeChecker::kStartEvent), 0u);
-  checker->setEnabled(true);
-  checker->setEnabled(true);
-  EXPECT_EQ(rig.count("ZUMemory", "declareEvent"), 2u);
-  const ZU::MKID id = speak(false);
-  EXPECT_EQ(events(ZU::MokutoTimeChecker::kStopEvent), 1u);
-  EXPECT_EQ(timed(), twoLines);
-  for (const auto& e : rig.timeline->entries("ZUMemory", "raiseEvent")) {
-    const auto args = e.arguments.to<std::vector<ko::AnyValue>>();
-    if (args.at(0).to<std::string>().rfind("ZUMokuto/", 0) == 0) {
-      EXPECT_EQ(args.at(1).to<int>(), id) << e;
-    }
-  }
-
-  speak(true);  // the start mark only
-  EXPECT_EQ(events(ZU::MokutoTimeChecker::kStartEvent), 2u);
-  EXPECT_EQ(events(ZU::MokutoTimeChecker::kStopEvent), 1u);
-  checker->setEnabled(false);
-  speak(false);
-  EXPECT_EQ(events(ZU::MokutoTimeChecker::kStartEvent), 2u);
-  EXPECT_EQ(timed(), twoLines);
 }
 
 }  // namespace

@@ -80,7 +80,7 @@ struct DirectorRig::Waiter {
   std::condition_variable recorded;
 };
 
-DirectorRig::DirectorRig(Speech kind)
+DirectorRig::DirectorRig(Speech kind, bool director)
     : fLibrary(makeGestureLibrary()), fWaiter(std::make_shared<Waiter>()) {
   using ZU::ZUModule;
   if (kind == Speech::Espeak) {
@@ -113,13 +113,16 @@ DirectorRig::DirectorRig(Speech kind)
     waiter->recorded.notify_all();
   });
   ZU::ZUAudioPlayerProxy(broker).loadSoundSet("bells");
+  if (!director)
+    return;
   host = ZUModule::createModule<DirectorHost>(broker, "ZUMokuto");
   // As the posture watcher would report it: the body talk moves the head.
   host->bodyTalk()->getPosture()->setPostureFamily(ZU::Standing);
 }
 
 DirectorRig::~DirectorRig() {
-  host->exit();
+  if (host)
+    host->exit();
   host.reset();
   fRobot.reset();
   while (!fServices.empty()) {

@@ -47,7 +47,8 @@ class DirectorRig {
  public:
   enum class Speech { Scripted, Espeak };
 
-  explicit DirectorRig(Speech speech = Speech::Scripted);
+  // Without `director`, no host: a test may register the service "ZUMokuto" itself.
+  explicit DirectorRig(Speech speech = Speech::Scripted, bool director = true);
   ~DirectorRig();
   DirectorRig(const DirectorRig&) = delete;
   DirectorRig& operator=(const DirectorRig&) = delete;
@@ -72,7 +73,7 @@ class DirectorRig {
   std::shared_ptr<ScriptedSpeech> speech;  // Speech::Scripted only
   // The speech engine of Speech::Espeak; null otherwise.
   std::shared_ptr<robotsim::ZUTextToSpeech> espeak() const;
-  std::shared_ptr<DirectorHost> host;
+  std::shared_ptr<DirectorHost> host;  // null without a director
 
  private:
   struct Waiter;

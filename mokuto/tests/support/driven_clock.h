@@ -4,7 +4,8 @@
 // a limit of the service runs out, and then by that whole limit (as the robot would have
 // waited it). So a test reads how long the service waited on its limits from this clock,
 // whatever the load of the machine: a loaded machine makes the real waits longer, never
-// this time.
+// this time. While rounds are held, a round of the director's watch for a bookmark ends only
+// when the director is woken (a bookmark, a stop), never by running out.
 //
 // Any thread may wait on it; the time is an atomic.
 
@@ -24,12 +25,24 @@ class DrivenClock : public ZU::MokutoClock {
 
   std::cv_status waitFor(std::condition_variable& condition, std::unique_lock<std::mutex>& lock,
                          std::chrono::microseconds duration, Wait wait) override {
+    if (wait == Wait::Round && fHoldRounds.load()) {
+      ++fHeldRounds;
+      std::cv_status status = std::cv_status::timeout;
+      while (fHoldRounds.load() && status == std::cv_status::timeout)
+        status = condition.wait_for(lock, std::chrono::milliseconds(5));
+      --fHeldRounds;
+      return status;
+    }
     const auto real = std::chrono::duration_cast<std::chrono::microseconds>(duration * fScale);
     const std::cv_status status = condition.wait_for(lock, real);
     if (status == std::cv_status::timeout && wait == Wait::Limit)
       fNowUs.fetch_add(duration.count());
     return status;
   }
+
+  void holdRounds(bool hold) { fHoldRounds = hold; }
+  // The threads waiting in a held round now.
+  int heldRounds() const { return fHeldRounds.load(); }
 
   // The limits that ran out so far, in the robot's time.
   std::chrono::milliseconds now() const {
@@ -40,6 +53,8 @@ class DrivenClock : public ZU::MokutoClock {
  private:
   const double fScale;
   std::atomic<std::int64_t> fNowUs{0};
+  std::atomic<bool> fHoldRounds{false};
+  std::atomic<int> fHeldRounds{0};
 };
 
 }  // namespace mokutotest
