@@ -304,7 +304,7 @@ def main():
     parser.add_argument("--coordinations",
                         help="write every coordination of two to five items to this file")
     args = parser.parse_args()
-    mokuto = Mokuto(os.path.join(args.build, "mokuto", "cli", "mokuto"))
+    mokuto = Mokuto(os.path.join(args.build, "mokuto", "mokuto"))
     kind = "heldout" if args.held_out else "dev"
     coordinations = open(args.coordinations, "w", encoding="utf-8") if args.coordinations else None
     for lang in args.languages.split(","):
