@@ -38,6 +38,9 @@ constexpr std::array<std::string_view, 10> kQuestionWords = {
 constexpr std::array<std::string_view, 9> kRelativeWords = {
     "that", "which", "who", "whom", "whose", "qui", "que", "dont", "où"};
 constexpr std::array<std::string_view, 4> kItemSeparators = {",", "、", "，", "､"};
+// Adverbs of sequence: after a coordinating word they announce a second action ("and then
+// insert the comments").
+constexpr std::array<std::string_view, 2> kThenWords = {"then", "ensuite"};
 
 template <std::size_t N>
 bool isOneOf(std::string_view word, const std::array<std::string_view, N>& words) {
@@ -533,7 +536,12 @@ class StructureBuilder {
   // apples"); after a determiner, an adjective or a preposition, a verb that can be a
   // noun is one ("les pommes", "the walk"), unless an infinitive follows a preposition
   // ("de manger"); a determiner that can be an object pronoun before a verb is one ("je
-  // le mange").
+  // le mange"). But after a comma or a coordinating word (adverbs between), a word that is
+  // first a verb and takes an object (a determiner, a pronoun, a name or a word the
+  // lexicon does not know) begins a second action, and so does any word that can be a verb
+  // after "then" ("build it with dpkg-buildpackage and run lintian", "and then insert the
+  // comments"); a word that can be a verb before a known noun stays a noun ("the directory
+  // and file names").
   void xSpacedRoles() {
     enum class List : std::uint8_t { None, Nominal, Verbal };
     const auto listOf = [](Role role) {
@@ -545,6 +553,8 @@ class StructureBuilder {
       return List::None;
     };
     bool verbContext = false;
+    bool clauseStart = false;  // after a comma or a coordinating word, adverbs between
+    bool then = false;         // and after "then"
     List list = List::None;
     Role previous = Role::Conjunction;
     Role lastContent = Role::Conjunction;
@@ -553,12 +563,16 @@ class StructureBuilder {
       Token& token = fTokens[t];
       if (token.type != Token::Word) {
         verbContext = false;
+        clauseStart = token.type == Token::Comma;
+        then = false;
         list = token.type == Token::Comma ? listOf(lastContent) : List::None;
         previousWord = {};
         continue;
       }
       if (token.coordination != Coordination::None) {
         verbContext = false;
+        clauseStart = true;
+        then = false;
         list = listOf(lastContent);
         previous = token.role;
         previousWord = token.lower;
@@ -570,7 +584,11 @@ class StructureBuilder {
                                 (previous == Role::Preposition && previousWord != "to"));
       const bool canBeVerb = token.has(WORD_CLASS_VERB);
       const bool canBeNoun = token.has(WORD_CLASS_NOUN);
-      if (list == List::Verbal && canBeVerb &&
+      const bool action = clauseStart && canBeVerb &&
+                          (then || (token.firstClass == WORD_CLASS_VERB && xObjectAt(t + 1)));
+      if (action) {
+        role = Role::Verb;
+      } else if (list == List::Verbal && canBeVerb &&
           (role == Role::Noun || role == Role::Preposition || role == Role::Adjective)) {
         role = Role::Verb;
       } else if (list == List::Nominal && canBeNoun &&
@@ -594,6 +612,8 @@ class StructureBuilder {
           token.has(WORD_CLASS_INTERJECTION) && !xIsWord(t + 1))
         role = Role::Interjection;
       token.role = role;
+      clauseStart = clauseStart && role == Role::Adverb;
+      then = clauseStart && (then || isOneOf(token.lower, kThenWords));
       verbContext = role == Role::Pronoun || role == Role::Auxiliary || role == Role::Clitic ||
                     (verbContext && role == Role::Adverb);
       if (role != Role::Adverb && role != Role::Determiner)
@@ -602,6 +622,23 @@ class StructureBuilder {
         lastContent = role;
       previous = role;
       previousWord = token.lower;
+    }
+  }
+
+  // Whether token t may begin the object of a verb before it: a determiner, a pronoun, a
+  // name or an unknown word ("run lintian").
+  bool xObjectAt(std::size_t t) const {
+    if (!xIsWord(t) || fTokens[t].coordination != Coordination::None)
+      return false;
+    switch (fTokens[t].firstClass) {
+      case WORD_CLASS_DETERMINANT:
+      case WORD_CLASS_PRONOUN:
+      case WORD_CLASS_PRONOUN_COMP:
+      case WORD_CLASS_PROPER_NOUN:
+      case WORD_CLASS_UNKNOWN:
+        return true;
+      default:
+        return false;
     }
   }
 
