@@ -586,6 +586,7 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"English", "Put a space between each directory or file in the name.", true},
       {"English", "Changing the owner or the rights of a file changes its time.", true},
       {"French", "Je mange des pommes et des poires.", true},
+      {"French", "Lisez les erreurs du paquet et Chapitre 9.", true},
       {"French", "Il ouvre le fichier et ferme la fenêtre.", false},
       {"French", "Il crée le squelette du paquet et il utilise debhelper.", false},
       {"French", "C'est une idée d'UNIX, et les noyaux de Linux ont développé cette idée.", false},

@@ -540,8 +540,8 @@ class StructureBuilder {
   // first a verb and takes an object (a determiner, a pronoun, a name or a word the
   // lexicon does not know) begins a second action, and so does any word that can be a verb
   // after "then" ("build it with dpkg-buildpackage and run lintian", "and then insert the
-  // comments"); a word that can be a verb before a known noun stays a noun ("the directory
-  // and file names").
+  // comments"); a word that can be a verb before a known noun, or written with a capital,
+  // stays a noun ("the directory and file names", "et Chapitre 9").
   void xSpacedRoles() {
     enum class List : std::uint8_t { None, Nominal, Verbal };
     const auto listOf = [](Role role) {
@@ -585,7 +585,8 @@ class StructureBuilder {
       const bool canBeVerb = token.has(WORD_CLASS_VERB);
       const bool canBeNoun = token.has(WORD_CLASS_NOUN);
       const bool action = clauseStart && canBeVerb &&
-                          (then || (token.firstClass == WORD_CLASS_VERB && xObjectAt(t + 1)));
+                          (then || (token.firstClass == WORD_CLASS_VERB &&
+                                    !token.has(WORD_CLASS_PROPER_NOUN) && xObjectAt(t + 1)));
       if (action) {
         role = Role::Verb;
       } else if (list == List::Verbal && canBeVerb &&
