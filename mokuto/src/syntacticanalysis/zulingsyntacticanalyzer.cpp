@@ -38,6 +38,8 @@ constexpr std::array<std::string_view, 10> kQuestionWords = {
 constexpr std::array<std::string_view, 9> kRelativeWords = {
     "that", "which", "who", "whom", "whose", "qui", "que", "dont", "où"};
 constexpr std::array<std::string_view, 4> kItemSeparators = {",", "、", "，", "､"};
+// The negations that stand for a whole clause after "or" ("ou non", "or not").
+constexpr std::array<std::string_view, 2> kNotWords = {"non", "not"};
 // Adverbs of sequence: after a coordinating word they announce a second action ("and then
 // insert the comments").
 constexpr std::array<std::string_view, 2> kThenWords = {"then", "ensuite"};
@@ -608,6 +610,11 @@ class StructureBuilder {
             !next.has(WORD_CLASS_NOUN) && !next.has(WORD_CLASS_ADJECTIVE))
           role = Role::Clitic;
       }
+      // "de" before an infinitive is its preposition ("et de déboguer"), not a partitive.
+      if (role == Role::Determiner && token.has(WORD_CLASS_PREPOSITION) &&
+          (token.lower == "de" || token.lower == "d") && xIsWord(t + 1) &&
+          fTokens[t + 1].infinitive)
+        role = Role::Preposition;
       // The answer "No." or "No, ..." rather than the determiner of "no file".
       if (role == Role::Determiner && token.negativeDeterminer &&
           token.has(WORD_CLASS_INTERJECTION) && !xIsWord(t + 1))
@@ -814,6 +821,10 @@ class StructureBuilder {
       const ZULingStructureKind kind = fGroups[item.group].kind;
       if (kind != STRUCTURE_NOMINAL || (word.particle && !xNounHeaded(item.group)))
         continue;
+      // "garder les fichiers ou non": the choice of doing or not doing, no list.
+      const Group& right = fGroups[item.group];
+      if (right.firstToken == right.lastToken && isOneOf(fTokens[right.firstToken].lower, kNotWords))
+        continue;
       const bool adjectives = fGroups[item.group].lastRole == Role::Adjective;
       const auto sameKind = [&](std::size_t g) {
         return fGroups[g].kind == kind && (fGroups[g].lastRole == Role::Adjective) == adjectives &&
@@ -947,9 +958,15 @@ class StructureBuilder {
     if (k >= fTokens.size() || fGroupOfToken[k] == kNone ||
         fGroups[fGroupOfToken[k]].kind != STRUCTURE_VERB)
       return false;
+    // A verb right after an item with a preposition, where the items before have none:
+    // the item is a complement of the verb ("edit those files and in those lines replace
+    // the path").
+    const bool rightPreposition = right.firstToken != group.firstToken;
+    if (rightPreposition && k == next && firstLeft.firstToken == fGroups[firstLeft.group].firstToken)
+      return true;
     // A subject has no preposition before it ("of books and of documents are", "de
     // livres et de documents sont").
-    if (right.firstToken != group.firstToken || lone.lower == "de" || lone.lower == "d")
+    if (rightPreposition || lone.lower == "de" || lone.lower == "d")
       return false;
     if (k == next && !beginsClause)
       return true;
