@@ -581,6 +581,7 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"English", "The cat and the dog are asleep.", true},
       {"English", "Check the directory and file names.", true},
       {"English", "Edit those files and in those lines replace the path.", false},
+      {"English", "These rules are merely advice, and are not requirements.", false},
       {"English", "It is kept in the patches directory and the source tree is untouched.", false},
       {"English", "Although books and documents are helpful, practice.", true},
       {"English", "Learn how it works and how you can help.", false},

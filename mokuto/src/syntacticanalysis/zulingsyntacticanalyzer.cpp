@@ -539,9 +539,9 @@ class StructureBuilder {
   // noun is one ("les pommes", "the walk"), unless an infinitive follows a preposition
   // ("de manger"); a determiner that can be an object pronoun before a verb is one ("je
   // le mange"). But after a comma or a coordinating word (adverbs between), a word that is
-  // first a verb and takes an object (a determiner, a pronoun, a name or a word the
-  // lexicon does not know) begins a second action, and so does any word that can be a verb
-  // after "then" ("build it with dpkg-buildpackage and run lintian", "and then insert the
+  // first an auxiliary, or first a verb and takes an object (a determiner, a pronoun, a
+  // name or a word the lexicon does not know), begins a second action ("and are not
+  // requirements"), and so does any word that can be a verb after "then" ("build it with dpkg-buildpackage and run lintian", "and then insert the
   // comments"); a word that can be a verb before a known noun, or written with a capital,
   // stays a noun ("the directory and file names", "et Chapitre 9").
   void xSpacedRoles() {
@@ -586,11 +586,13 @@ class StructureBuilder {
                                 (previous == Role::Preposition && previousWord != "to"));
       const bool canBeVerb = token.has(WORD_CLASS_VERB);
       const bool canBeNoun = token.has(WORD_CLASS_NOUN);
-      const bool action = clauseStart && canBeVerb &&
-                          (then || (token.firstClass == WORD_CLASS_VERB &&
-                                    !token.has(WORD_CLASS_PROPER_NOUN) && xObjectAt(t + 1)));
+      const bool auxiliary = token.firstClass == WORD_CLASS_AUXILIARY;
+      const bool action =
+          clauseStart && canBeVerb &&
+          (then || (!token.has(WORD_CLASS_PROPER_NOUN) &&
+                    (auxiliary || (token.firstClass == WORD_CLASS_VERB && xObjectAt(t + 1)))));
       if (action) {
-        role = Role::Verb;
+        role = auxiliary ? Role::Auxiliary : Role::Verb;
       } else if (list == List::Verbal && canBeVerb &&
           (role == Role::Noun || role == Role::Preposition || role == Role::Adjective)) {
         role = Role::Verb;
