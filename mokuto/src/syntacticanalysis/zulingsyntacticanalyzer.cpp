@@ -541,9 +541,10 @@ class StructureBuilder {
   // le mange"). But after a comma or a coordinating word (adverbs between), a word that is
   // first an auxiliary, or first a verb and takes an object (a determiner, a pronoun, a
   // name or a word the lexicon does not know), begins a second action ("and are not
-  // requirements"), and so does any word that can be a verb after "then" ("build it with dpkg-buildpackage and run lintian", "and then insert the
-  // comments"); a word that can be a verb before a known noun, or written with a capital,
-  // stays a noun ("the directory and file names", "et Chapitre 9").
+  // requirements", "build it with dpkg-buildpackage and run lintian"), and so does any
+  // word that can be a verb after "then" ("and then insert the comments"); a word that can
+  // be a verb before a known noun, or written with a capital, stays a noun ("the directory
+  // and file names", "et Chapitre 9").
   void xSpacedRoles() {
     enum class List : std::uint8_t { None, Nominal, Verbal };
     const auto listOf = [](Role role) {
@@ -594,7 +595,7 @@ class StructureBuilder {
       if (action) {
         role = auxiliary ? Role::Auxiliary : Role::Verb;
       } else if (list == List::Verbal && canBeVerb &&
-          (role == Role::Noun || role == Role::Preposition || role == Role::Adjective)) {
+                 (role == Role::Noun || role == Role::Preposition || role == Role::Adjective)) {
         role = Role::Verb;
       } else if (list == List::Nominal && canBeNoun &&
                  (role == Role::Verb || role == Role::Auxiliary)) {
@@ -825,7 +826,8 @@ class StructureBuilder {
         continue;
       // "garder les fichiers ou non": the choice of doing or not doing, no list.
       const Group& right = fGroups[item.group];
-      if (right.firstToken == right.lastToken && isOneOf(fTokens[right.firstToken].lower, kNotWords))
+      if (right.firstToken == right.lastToken &&
+          isOneOf(fTokens[right.firstToken].lower, kNotWords))
         continue;
       const bool adjectives = fGroups[item.group].lastRole == Role::Adjective;
       const auto sameKind = [&](std::size_t g) {
@@ -964,7 +966,8 @@ class StructureBuilder {
     // the item is a complement of the verb ("edit those files and in those lines replace
     // the path").
     const bool rightPreposition = right.firstToken != group.firstToken;
-    if (rightPreposition && k == next && firstLeft.firstToken == fGroups[firstLeft.group].firstToken)
+    if (rightPreposition && k == next &&
+        firstLeft.firstToken == fGroups[firstLeft.group].firstToken)
       return true;
     // A subject has no preposition before it ("of books and of documents are", "de
     // livres et de documents sont").
