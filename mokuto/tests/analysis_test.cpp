@@ -594,6 +594,10 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"French", "Il ouvre le fichier et ferme la fenêtre.", false},
       {"French", "Il crée le squelette du paquet et il utilise debhelper.", false},
       {"French", "C'est une idée d'UNIX, et les noyaux de Linux ont développé cette idée.", false},
+      {"French", "L'ordinateur n'est pas une personne et les écrans de debconf ne parlent pas.", false},
+      {"French", "Il est supprimé du fichier et objcopy --add-gnu-debuglink peut servir.", false},
+      {"French", "Il dit que les pommes et les poires de Paris sont mûres.", true},
+      {"French", "Le chat et le chien de Paul dorment.", true},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

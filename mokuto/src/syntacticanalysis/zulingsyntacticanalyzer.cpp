@@ -429,6 +429,7 @@ struct Token {
   bool infinitive = false;                          // a verb record of the infinitive
   bool participle = false;                          // a verb record of a participle
   bool negativeDeterminer = false;                  // a determiner record of negation ("no")
+  bool finite = false;  // a verb or auxiliary record of a tense, none of a participle
 
   bool has(ZULingWordClass wordClass) const noexcept { return (records >> wordClass) & 1u; }
 };
@@ -509,10 +510,14 @@ class StructureBuilder {
         if (record.wordClass == WORD_CLASS_VERB &&
             record.features.find_first_of("KG") != std::string::npos)
           token.participle = true;
+        if ((record.wordClass == WORD_CLASS_VERB || record.wordClass == WORD_CLASS_AUXILIARY) &&
+            record.features.find_first_of("PIJFCST") != std::string::npos)
+          token.finite = true;
         if (record.wordClass == WORD_CLASS_DETERMINANT &&
             record.features.find('n') != std::string::npos)
           token.negativeDeterminer = true;
       }
+      token.finite = token.finite && (!token.participle || wordClass == WORD_CLASS_AUXILIARY);
       if (kCoordinationFirstBytes[static_cast<unsigned char>(token.lower[0])]) {
         if (isOneOf(token.lower, kAndWords))
           token.coordination = Coordination::And;
@@ -927,13 +932,13 @@ class StructureBuilder {
     if (isOneOf(lone.lower, kQuestionWords))
       return true;
     const std::size_t next = group.lastToken + 1;
-    if (next >= fTokens.size() || fTokens[next].type != Token::Word)
+    if (next >= fTokens.size() || (fTokens[next].type != Token::Word && !xInWordMark(next)))
       return false;
     const std::size_t previous = firstLeft.firstToken;
     const bool beginsClause = previous == 0 || xBeginsClause(previous - 1);
     const bool afterVerb = previous > 0 && fGroupOfToken[previous - 1] != kNone &&
                            fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB;
-    const Role after = fTokens[next].role;
+    const Role after = fTokens[next].type == Token::Word ? fTokens[next].role : Role::Interjection;
     const bool single = group.firstToken == group.lastToken;
     const bool canBeVerb = lone.has(WORD_CLASS_VERB) || lone.has(WORD_CLASS_AUXILIARY);
     const bool objectAfter = after == Role::Pronoun || after == Role::Clitic;
@@ -950,18 +955,31 @@ class StructureBuilder {
                      (after == Role::Determiner && !isOneOf(fTokens[next].lower, kPartitives))))))
       return true;
     // The verb of a subject; after a comma, past its prepositional groups ("the number of
-    // packages in the archive is"), which without a comma would rather belong to the
-    // list ("changing its owner or its rights of a file changes").
+    // packages in the archive is"), which without a comma would rather belong to the list
+    // ("changing its owner or its rights of a file changes") unless the clause of the
+    // first item has a verb of its own: then a verb of a tense there begins the second
+    // clause ("n'est pas une personne et les écrans de debconf ne parlent pas").
+    const bool leftVerb = !commaBefore && xFiniteVerbBefore(previous);
     std::size_t k = next;
-    while (commaBefore && k < fTokens.size() && fTokens[k].type == Token::Word &&
-           (fTokens[k].role == Role::Preposition || fTokens[k].role == Role::Adverb ||
-            ((fTokens[k].role == Role::Noun || fTokens[k].role == Role::Determiner ||
-              fTokens[k].role == Role::Adjective) &&
-             !isOneOf(fTokens[k].lower, kRelativeWords))))
+    while ((commaBefore || leftVerb) && k < fTokens.size() &&
+           ((fTokens[k].type == Token::Word &&
+             (fTokens[k].role == Role::Preposition || fTokens[k].role == Role::Adverb ||
+              ((fTokens[k].role == Role::Noun || fTokens[k].role == Role::Determiner ||
+                fTokens[k].role == Role::Adjective) &&
+               !isOneOf(fTokens[k].lower, kRelativeWords)))) ||
+            xInWordMark(k)))
       ++k;
     if (k >= fTokens.size() || fGroupOfToken[k] == kNone ||
         fGroups[fGroupOfToken[k]].kind != STRUCTURE_VERB)
       return false;
+    if (leftVerb && k != next) {
+      const Group& verb = fGroups[fGroupOfToken[k]];
+      bool finite = false;
+      for (std::size_t v = verb.firstToken; v <= verb.lastToken && !finite; ++v)
+        finite = fTokens[v].finite;
+      if (!finite)
+        return false;
+    }
     // A verb right after an item with a preposition, where the items before have none:
     // the item is a complement of the verb ("edit those files and in those lines replace
     // the path").
@@ -978,6 +996,36 @@ class StructureBuilder {
     if (commaBefore && leftItems == 1)
       return true;
     return afterVerb || (previous > 0 && xIsPreposition(previous - 1));
+  }
+
+  // A mark inside a path or an option, right before the word it leads ("/usr/bin/truc",
+  // "libtruc.so", "--add-gnu-debuglink"): it parts no clause.
+  bool xInWordMark(std::size_t t) const {
+    if (t >= fTokens.size() || fTokens[t].type != Token::Break)
+      return false;
+    const std::size_t c = fTokens[t].chunk;
+    return c + 1 < fChunks.size() && fChunks[c + 1].wordClass() >= WORD_CLASS_UNKNOWN &&
+           fChunks[c].text.find_first_not_of("/._~:-") == std::string::npos;
+  }
+
+  // Whether the clause before token t has a verb of a tense: back to a mark, a comma, a
+  // coordinating or subordinating word, a relative or a question word.
+  bool xFiniteVerbBefore(std::size_t t) const {
+    while (t > 0) {
+      --t;
+      const Token& token = fTokens[t];
+      if (token.type != Token::Word) {
+        if (xInWordMark(t))
+          continue;
+        return false;
+      }
+      if (token.role == Role::Subordinator || token.role == Role::Conjunction ||
+          isOneOf(token.lower, kRelativeWords) || isOneOf(token.lower, kQuestionWords))
+        return false;
+      if (token.finite && (token.role == Role::Verb || token.role == Role::Auxiliary))
+        return true;
+    }
+    return false;
   }
 
   // Whether a clause may begin after token t: a comma, a mark other than a slash
