@@ -596,6 +596,7 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"French", "C'est une idée d'UNIX, et les noyaux de Linux ont développé cette idée.", false},
       {"French", "L'ordinateur n'est pas une personne et les écrans de debconf ne parlent pas.", false},
       {"French", "Il est supprimé du fichier et objcopy --add-gnu-debuglink peut servir.", false},
+      {"French", "Ils sont dans /usr/bin/truc, et les symboles pour /usr/lib/libtruc.so.1 sont ailleurs.", false},
       {"French", "Il dit que les pommes et les poires de Paris sont mûres.", true},
       {"French", "Le chat et le chien de Paul dorment.", true},
   };

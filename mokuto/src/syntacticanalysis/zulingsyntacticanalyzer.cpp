@@ -932,9 +932,11 @@ class StructureBuilder {
     if (isOneOf(lone.lower, kQuestionWords))
       return true;
     const std::size_t next = group.lastToken + 1;
-    if (next >= fTokens.size() || (fTokens[next].type != Token::Word && !xInWordMark(next)))
-      return false;
     const std::size_t previous = firstLeft.firstToken;
+    const bool leftVerb = !commaBefore && xFiniteVerbBefore(previous);
+    if (next >= fTokens.size() ||
+        (fTokens[next].type != Token::Word && !(leftVerb && xInWordMark(next))))
+      return false;
     const bool beginsClause = previous == 0 || xBeginsClause(previous - 1);
     const bool afterVerb = previous > 0 && fGroupOfToken[previous - 1] != kNone &&
                            fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB;
@@ -959,9 +961,9 @@ class StructureBuilder {
     // ("changing its owner or its rights of a file changes") unless the clause of the
     // first item has a verb of its own: then a verb of a tense there begins the second
     // clause ("n'est pas une personne et les écrans de debconf ne parlent pas").
-    const bool leftVerb = !commaBefore && xFiniteVerbBefore(previous);
     std::size_t k = next;
     while ((commaBefore || leftVerb) && k < fTokens.size() &&
+           (fGroupOfToken[k] == kNone || fGroups[fGroupOfToken[k]].kind != STRUCTURE_VERB) &&
            ((fTokens[k].type == Token::Word &&
              (fTokens[k].role == Role::Preposition || fTokens[k].role == Role::Adverb ||
               ((fTokens[k].role == Role::Noun || fTokens[k].role == Role::Determiner ||
@@ -972,14 +974,12 @@ class StructureBuilder {
     if (k >= fTokens.size() || fGroupOfToken[k] == kNone ||
         fGroups[fGroupOfToken[k]].kind != STRUCTURE_VERB)
       return false;
-    if (leftVerb && k != next) {
-      const Group& verb = fGroups[fGroupOfToken[k]];
-      bool finite = false;
-      for (std::size_t v = verb.firstToken; v <= verb.lastToken && !finite; ++v)
-        finite = fTokens[v].finite;
-      if (!finite)
-        return false;
-    }
+    // Not the verb of a preposition or of a determiner ("in order to ease", "this install
+    // file").
+    if (leftVerb && k != next &&
+        (!xFiniteGroup(fGroupOfToken[k]) || fTokens[k - 1].type != Token::Word ||
+         fTokens[k - 1].role == Role::Preposition || fTokens[k - 1].role == Role::Determiner))
+      return false;
     // A verb right after an item with a preposition, where the items before have none:
     // the item is a complement of the verb ("edit those files and in those lines replace
     // the path").
@@ -1008,7 +1008,16 @@ class StructureBuilder {
            fChunks[c].text.find_first_not_of("/._~:-") == std::string::npos;
   }
 
-  // Whether the clause before token t has a verb of a tense: back to a mark, a comma, a
+  bool xFiniteGroup(std::size_t g) const {
+    for (std::size_t t = fGroups[g].firstToken; t <= fGroups[g].lastToken; ++t) {
+      if (fTokens[t].finite && (fTokens[t].role == Role::Verb || fTokens[t].role == Role::Auxiliary))
+        return true;
+    }
+    return false;
+  }
+
+  // Whether the last verb group of the clause before token t has a verb of a tense
+  // ("n'est pas une personne", not "se servant de gettext"): back to a mark, a comma, a
   // coordinating or subordinating word, a relative or a question word.
   bool xFiniteVerbBefore(std::size_t t) const {
     while (t > 0) {
@@ -1022,8 +1031,8 @@ class StructureBuilder {
       if (token.role == Role::Subordinator || token.role == Role::Conjunction ||
           isOneOf(token.lower, kRelativeWords) || isOneOf(token.lower, kQuestionWords))
         return false;
-      if (token.finite && (token.role == Role::Verb || token.role == Role::Auxiliary))
-        return true;
+      if (fGroupOfToken[t] != kNone && fGroups[fGroupOfToken[t]].kind == STRUCTURE_VERB)
+        return xFiniteGroup(fGroupOfToken[t]);
     }
     return false;
   }
