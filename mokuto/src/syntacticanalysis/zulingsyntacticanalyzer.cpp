@@ -35,6 +35,9 @@ constexpr std::array<std::string_view, 4> kPartitives = {"d", "de", "du", "des"}
 // Words that begin an indirect question or a relative clause.
 constexpr std::array<std::string_view, 10> kQuestionWords = {
     "how", "why", "what", "whether", "comment", "pourquoi", "combien", "quoi", "lorsque", "quand"};
+// The conjunction that begins a second subordinate clause ("si vous n'êtes pas ... et que
+// vous utilisez").
+constexpr std::array<std::string_view, 2> kThatWords = {"que", "qu"};
 constexpr std::array<std::string_view, 9> kRelativeWords = {
     "that", "which", "who", "whom", "whose", "qui", "que", "dont", "où"};
 constexpr std::array<std::string_view, 4> kItemSeparators = {",", "、", "，", "､"};
@@ -908,10 +911,14 @@ class StructureBuilder {
   }
 
   // Two clauses, not a list, where the group after the coordinating word
-  // - begins with a question word ("learn how it works and how you can help");
+  // - begins with a question word or "que" ("learn how it works and how you can help",
+  //   "si vous n'êtes pas un porteur et que vous utilisez");
   // - is a lone word that can be a verb followed by its object, an adverb or "by", a
   //   participle followed by a preposition, a lone word that is first a verb followed by
-  //   a preposition where the first item follows a verb, or an unknown word followed by
+  //   a preposition where the first item follows a verb, an infinitive followed by a
+  //   preposition where the last verb group before the first item is a verb of a tense
+  //   and an infinitive ("vous devriez envoyer le paquet vers DELAYED/7 et dire au
+  //   responsable"), or an unknown word followed by
   //   an object pronoun or a determiner: a second action ("type your name and press the
   //   Enter key", "put in the archive and run by dpkg", "provided by the team and sent
   //   to the list", "it does more and comes with examples", "unpack it and repack it");
@@ -929,11 +936,17 @@ class StructureBuilder {
                      std::size_t leftItems) const {
     const Group& group = fGroups[right.group];
     const Token& lone = fTokens[group.firstToken];
-    if (isOneOf(lone.lower, kQuestionWords))
+    if (isOneOf(lone.lower, kQuestionWords) || isOneOf(lone.lower, kThatWords))
       return true;
     const std::size_t next = group.lastToken + 1;
     const std::size_t previous = firstLeft.firstToken;
-    const bool leftVerb = !commaBefore && xFiniteVerbBefore(previous);
+    // The last verb group before the first item: whether it has a verb of a tense ("n'est
+    // pas une personne", not "se servant de gettext"), and ends in an infinitive after it
+    // ("vous devriez envoyer").
+    const std::size_t leftGroup = commaBefore ? kNone : xVerbGroupBefore(previous);
+    const bool leftVerb = leftGroup != kNone && xFiniteGroup(leftGroup);
+    const bool leftInfinitive = leftVerb && fTokens[fGroups[leftGroup].lastToken].infinitive &&
+                                !fTokens[fGroups[leftGroup].lastToken].finite;
     if (next >= fTokens.size() ||
         (fTokens[next].type != Token::Word && !(leftVerb && xInWordMark(next))))
       return false;
@@ -951,7 +964,8 @@ class StructureBuilder {
                                   after == Role::Adverb || after == Role::Adjective ||
                                   isOneOf(fTokens[next].lower, kAgentWords))) ||
                    (after == Role::Preposition &&
-                    (lone.participle || (lone.firstClass == WORD_CLASS_VERB && afterVerb))) ||
+                    (lone.participle || (lone.firstClass == WORD_CLASS_VERB && afterVerb) ||
+                     (lone.infinitive && leftInfinitive))) ||
                    (lone.firstClass == WORD_CLASS_UNKNOWN &&
                     (objectAfter ||
                      (after == Role::Determiner && !isOneOf(fTokens[next].lower, kPartitives))))))
@@ -1008,33 +1022,34 @@ class StructureBuilder {
            fChunks[c].text.find_first_not_of("/._~:-") == std::string::npos;
   }
 
+  // Whether group g has a verb of a tense.
   bool xFiniteGroup(std::size_t g) const {
     for (std::size_t t = fGroups[g].firstToken; t <= fGroups[g].lastToken; ++t) {
-      if (fTokens[t].finite && (fTokens[t].role == Role::Verb || fTokens[t].role == Role::Auxiliary))
+      if (fTokens[t].finite &&
+          (fTokens[t].role == Role::Verb || fTokens[t].role == Role::Auxiliary))
         return true;
     }
     return false;
   }
 
-  // Whether the last verb group of the clause before token t has a verb of a tense
-  // ("n'est pas une personne", not "se servant de gettext"): back to a mark, a comma, a
-  // coordinating or subordinating word, a relative or a question word.
-  bool xFiniteVerbBefore(std::size_t t) const {
+  // The last verb group of the clause before token t, back to a mark, a comma, a
+  // coordinating or subordinating word, a relative or a question word; kNone if none.
+  std::size_t xVerbGroupBefore(std::size_t t) const {
     while (t > 0) {
       --t;
       const Token& token = fTokens[t];
       if (token.type != Token::Word) {
         if (xInWordMark(t))
           continue;
-        return false;
+        return kNone;
       }
       if (token.role == Role::Subordinator || token.role == Role::Conjunction ||
           isOneOf(token.lower, kRelativeWords) || isOneOf(token.lower, kQuestionWords))
-        return false;
+        return kNone;
       if (fGroupOfToken[t] != kNone && fGroups[fGroupOfToken[t]].kind == STRUCTURE_VERB)
-        return xFiniteGroup(fGroupOfToken[t]);
+        return fGroupOfToken[t];
     }
-    return false;
+    return kNone;
   }
 
   // Whether a clause may begin after token t: a comma, a mark other than a slash
