@@ -919,9 +919,9 @@ class StructureBuilder {
   //   preposition where the last verb group before the first item is a verb of a tense
   //   and an infinitive ("vous devriez envoyer le paquet vers DELAYED/7 et dire au
   //   responsable"), or an unknown word followed by an object pronoun or a determiner: a
-  //   second action ("type your name and press the
-  //   Enter key", "put in the archive and run by dpkg", "provided by the team and sent
-  //   to the list", "it does more and comes with examples", "unpack it and repack it");
+  //   second action ("type your name and press the Enter key", "put in the archive and
+  //   run by dpkg", "provided by the team and sent to the list", "it does more and comes
+  //   with examples", "unpack it and repack it");
   // - begins with a verb that is first a verb, when the first item follows a verb ("copy
   //   the files and run the tool");
   // - or is a subject, followed by a verb (after a comma, past its prepositional
