@@ -41,3 +41,7 @@ moi	pronoun/1s=moi
 toi	pronoun/2s=toi
 soi	pronoun/3=soi
 eux	pronoun/3mp=eux
+# Verbs of computing that Lefff lacks, in the infinitive ("et de déboguer ses problèmes").
+déboguer	verb/W=déboguer
+désinstaller	verb/W=désinstaller
+téléverser	verb/W=téléverser

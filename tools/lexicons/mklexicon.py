@@ -21,8 +21,9 @@ import glob
 import json
 import os
 import re
-import subprocess
 import sys
+
+from mecabcut import mecab_analyses
 
 # Emotion labels, stored as the base form of a class-4 ("unkonwn") record.
 VERY_POSITIVE = "very positive"
@@ -474,24 +475,6 @@ JAPANESE_WORDS = [("ません", "auxiliary", "n", "ます"),
                   ("すみません", "interjection", "", "すみません"),
                   ("申し訳ありません", "interjection", "", "申し訳ありません"),
                   ("申し訳ございません", "interjection", "", "申し訳ございません")]
-
-
-def mecab_analyses(dictionary, lines):
-    """MeCab's cut of each line: (surface, pos1, pos2, base form), base form None for an
-    unknown word."""
-    result = subprocess.run(["mecab", "-d", dictionary], input="\n".join(lines) + "\n",
-                            capture_output=True, text=True, check=True)
-    out, current = [], []
-    for line in result.stdout.split("\n"):
-        if line == "EOS":
-            out.append(current)
-            current = []
-        elif "\t" in line:
-            surface, features = line.split("\t", 1)
-            fields = features.split(",")
-            base = fields[6] if len(fields) > 6 and fields[6] != "*" else None
-            current.append((surface, fields[0], fields[1] if len(fields) > 1 else "*", base))
-    return out
 
 
 # The character kinds of the analysis' tokeniser where words are not spaced.

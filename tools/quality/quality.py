@@ -32,6 +32,8 @@ import sys
 from collections import Counter
 
 HERE = os.path.dirname(os.path.abspath(__file__))
+sys.path.insert(0, os.path.join(HERE, "..", "lexicons"))
+from mecabcut import mecab_analyses  # noqa: E402  (the lexicon build's own)
 LANGUAGES = {"en": "English", "fr": "French", "ja": "Japanese"}
 APERTIUM = {
     "fr": ("/usr/share/apertium/apertium-fr-es/fr-es.automorf.bin",
@@ -124,19 +126,8 @@ def is_word(word_class):
 
 def mecab(sentences):
     """Per sentence, MeCab's tokens: (surface, part of speech, base form)."""
-    result = subprocess.run(["mecab", "-d", MECAB_DICTIONARY], input="\n".join(sentences) + "\n",
-                            capture_output=True, text=True, check=True)
-    out, current = [], []
-    for line in result.stdout.split("\n"):
-        if line == "EOS":
-            out.append(current)
-            current = []
-        elif "\t" in line:
-            surface, features = line.split("\t", 1)
-            fields = features.split(",")
-            base = fields[6] if len(fields) > 6 and fields[6] != "*" else surface
-            current.append((surface, fields[0], base))
-    return out
+    return [[(surface, pos, base or surface) for surface, pos, _, base in tokens]
+            for tokens in mecab_analyses(MECAB_DICTIONARY, sentences)]
 
 
 def apertium(lang, sentences):
@@ -304,7 +295,7 @@ def main():
     parser.add_argument("--coordinations",
                         help="write every coordination of two to five items to this file")
     args = parser.parse_args()
-    mokuto = Mokuto(os.path.join(args.build, "mokuto", "cli", "mokuto"))
+    mokuto = Mokuto(os.path.join(args.build, "mokuto", "mokuto"))
     kind = "heldout" if args.held_out else "dev"
     coordinations = open(args.coordinations, "w", encoding="utf-8") if args.coordinations else None
     for lang in args.languages.split(","):

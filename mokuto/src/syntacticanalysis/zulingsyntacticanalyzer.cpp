@@ -35,9 +35,17 @@ constexpr std::array<std::string_view, 4> kPartitives = {"d", "de", "du", "des"}
 // Words that begin an indirect question or a relative clause.
 constexpr std::array<std::string_view, 10> kQuestionWords = {
     "how", "why", "what", "whether", "comment", "pourquoi", "combien", "quoi", "lorsque", "quand"};
+// The conjunction that begins a second subordinate clause ("si vous n'êtes pas ... et que
+// vous utilisez").
+constexpr std::array<std::string_view, 2> kThatWords = {"que", "qu"};
 constexpr std::array<std::string_view, 9> kRelativeWords = {
     "that", "which", "who", "whom", "whose", "qui", "que", "dont", "où"};
 constexpr std::array<std::string_view, 4> kItemSeparators = {",", "、", "，", "､"};
+// The negations that stand for a whole clause after "or" ("ou non", "or not").
+constexpr std::array<std::string_view, 2> kNotWords = {"non", "not"};
+// Adverbs of sequence: after a coordinating word they announce a second action ("and then
+// insert the comments").
+constexpr std::array<std::string_view, 2> kThenWords = {"then", "ensuite"};
 
 template <std::size_t N>
 bool isOneOf(std::string_view word, const std::array<std::string_view, N>& words) {
@@ -424,6 +432,7 @@ struct Token {
   bool infinitive = false;                          // a verb record of the infinitive
   bool participle = false;                          // a verb record of a participle
   bool negativeDeterminer = false;                  // a determiner record of negation ("no")
+  bool finite = false;  // a verb or auxiliary record of a tense, none of a participle
 
   bool has(ZULingWordClass wordClass) const noexcept { return (records >> wordClass) & 1u; }
 };
@@ -504,10 +513,14 @@ class StructureBuilder {
         if (record.wordClass == WORD_CLASS_VERB &&
             record.features.find_first_of("KG") != std::string::npos)
           token.participle = true;
+        if ((record.wordClass == WORD_CLASS_VERB || record.wordClass == WORD_CLASS_AUXILIARY) &&
+            record.features.find_first_of("PIJFCST") != std::string::npos)
+          token.finite = true;
         if (record.wordClass == WORD_CLASS_DETERMINANT &&
             record.features.find('n') != std::string::npos)
           token.negativeDeterminer = true;
       }
+      token.finite = token.finite && (!token.participle || wordClass == WORD_CLASS_AUXILIARY);
       if (kCoordinationFirstBytes[static_cast<unsigned char>(token.lower[0])]) {
         if (isOneOf(token.lower, kAndWords))
           token.coordination = Coordination::And;
@@ -533,7 +546,13 @@ class StructureBuilder {
   // apples"); after a determiner, an adjective or a preposition, a verb that can be a
   // noun is one ("les pommes", "the walk"), unless an infinitive follows a preposition
   // ("de manger"); a determiner that can be an object pronoun before a verb is one ("je
-  // le mange").
+  // le mange"). But after a comma or a coordinating word (adverbs between), a word that is
+  // first an auxiliary, or first a verb and takes an object (a determiner, a pronoun, a
+  // name or a word the lexicon does not know), begins a second action ("and are not
+  // requirements", "build it with dpkg-buildpackage and run lintian"), and so does any
+  // word that can be a verb after "then" ("and then insert the comments"); a word that can
+  // be a verb before a known noun, or written with a capital, stays a noun ("the directory
+  // and file names", "et Chapitre 9").
   void xSpacedRoles() {
     enum class List : std::uint8_t { None, Nominal, Verbal };
     const auto listOf = [](Role role) {
@@ -545,6 +564,8 @@ class StructureBuilder {
       return List::None;
     };
     bool verbContext = false;
+    bool clauseStart = false;  // after a comma or a coordinating word, adverbs between
+    bool then = false;         // and after "then"
     List list = List::None;
     Role previous = Role::Conjunction;
     Role lastContent = Role::Conjunction;
@@ -553,12 +574,16 @@ class StructureBuilder {
       Token& token = fTokens[t];
       if (token.type != Token::Word) {
         verbContext = false;
+        clauseStart = token.type == Token::Comma;
+        then = false;
         list = token.type == Token::Comma ? listOf(lastContent) : List::None;
         previousWord = {};
         continue;
       }
       if (token.coordination != Coordination::None) {
         verbContext = false;
+        clauseStart = true;
+        then = false;
         list = listOf(lastContent);
         previous = token.role;
         previousWord = token.lower;
@@ -570,8 +595,15 @@ class StructureBuilder {
                                 (previous == Role::Preposition && previousWord != "to"));
       const bool canBeVerb = token.has(WORD_CLASS_VERB);
       const bool canBeNoun = token.has(WORD_CLASS_NOUN);
-      if (list == List::Verbal && canBeVerb &&
-          (role == Role::Noun || role == Role::Preposition || role == Role::Adjective)) {
+      const bool auxiliary = token.firstClass == WORD_CLASS_AUXILIARY;
+      const bool action =
+          clauseStart && canBeVerb &&
+          (then || (!token.has(WORD_CLASS_PROPER_NOUN) &&
+                    (auxiliary || (token.firstClass == WORD_CLASS_VERB && xObjectAt(t + 1)))));
+      if (action) {
+        role = auxiliary ? Role::Auxiliary : Role::Verb;
+      } else if (list == List::Verbal && canBeVerb &&
+                 (role == Role::Noun || role == Role::Preposition || role == Role::Adjective)) {
         role = Role::Verb;
       } else if (list == List::Nominal && canBeNoun &&
                  (role == Role::Verb || role == Role::Auxiliary)) {
@@ -589,11 +621,18 @@ class StructureBuilder {
             !next.has(WORD_CLASS_NOUN) && !next.has(WORD_CLASS_ADJECTIVE))
           role = Role::Clitic;
       }
+      // "de" before an infinitive is its preposition ("et de déboguer"), not a partitive.
+      if (role == Role::Determiner && token.has(WORD_CLASS_PREPOSITION) &&
+          (token.lower == "de" || token.lower == "d") && xIsWord(t + 1) &&
+          fTokens[t + 1].infinitive)
+        role = Role::Preposition;
       // The answer "No." or "No, ..." rather than the determiner of "no file".
       if (role == Role::Determiner && token.negativeDeterminer &&
           token.has(WORD_CLASS_INTERJECTION) && !xIsWord(t + 1))
         role = Role::Interjection;
       token.role = role;
+      clauseStart = clauseStart && role == Role::Adverb;
+      then = clauseStart && (then || isOneOf(token.lower, kThenWords));
       verbContext = role == Role::Pronoun || role == Role::Auxiliary || role == Role::Clitic ||
                     (verbContext && role == Role::Adverb);
       if (role != Role::Adverb && role != Role::Determiner)
@@ -602,6 +641,23 @@ class StructureBuilder {
         lastContent = role;
       previous = role;
       previousWord = token.lower;
+    }
+  }
+
+  // Whether token t may begin the object of a verb before it: a determiner, a pronoun, a
+  // name or an unknown word ("run lintian").
+  bool xObjectAt(std::size_t t) const {
+    if (!xIsWord(t) || fTokens[t].coordination != Coordination::None)
+      return false;
+    switch (fTokens[t].firstClass) {
+      case WORD_CLASS_DETERMINANT:
+      case WORD_CLASS_PRONOUN:
+      case WORD_CLASS_PRONOUN_COMP:
+      case WORD_CLASS_PROPER_NOUN:
+      case WORD_CLASS_UNKNOWN:
+        return true;
+      default:
+        return false;
     }
   }
 
@@ -776,6 +832,11 @@ class StructureBuilder {
       const ZULingStructureKind kind = fGroups[item.group].kind;
       if (kind != STRUCTURE_NOMINAL || (word.particle && !xNounHeaded(item.group)))
         continue;
+      // "garder les fichiers ou non": the choice of doing or not doing, no list.
+      const Group& right = fGroups[item.group];
+      if (right.firstToken == right.lastToken &&
+          isOneOf(fTokens[right.firstToken].lower, kNotWords))
+        continue;
       const bool adjectives = fGroups[item.group].lastRole == Role::Adjective;
       const auto sameKind = [&](std::size_t g) {
         return fGroups[g].kind == kind && (fGroups[g].lastRole == Role::Adjective) == adjectives &&
@@ -850,13 +911,17 @@ class StructureBuilder {
   }
 
   // Two clauses, not a list, where the group after the coordinating word
-  // - begins with a question word ("learn how it works and how you can help");
+  // - begins with a question word or "que" ("learn how it works and how you can help",
+  //   "si vous n'êtes pas un porteur et que vous utilisez");
   // - is a lone word that can be a verb followed by its object, an adverb or "by", a
   //   participle followed by a preposition, a lone word that is first a verb followed by
-  //   a preposition where the first item follows a verb, or an unknown word followed by
-  //   an object pronoun or a determiner: a second action ("type your name and press the
-  //   Enter key", "put in the archive and run by dpkg", "provided by the team and sent
-  //   to the list", "it does more and comes with examples", "unpack it and repack it");
+  //   a preposition where the first item follows a verb, an infinitive followed by a
+  //   preposition where the last verb group before the first item is a verb of a tense
+  //   and an infinitive ("vous devriez envoyer le paquet vers DELAYED/7 et dire au
+  //   responsable"), or an unknown word followed by an object pronoun or a determiner: a
+  //   second action ("type your name and press the Enter key", "put in the archive and
+  //   run by dpkg", "provided by the team and sent to the list", "it does more and comes
+  //   with examples", "unpack it and repack it");
   // - begins with a verb that is first a verb, when the first item follows a verb ("copy
   //   the files and run the tool");
   // - or is a subject, followed by a verb (after a comma, past its prepositional
@@ -871,16 +936,24 @@ class StructureBuilder {
                      std::size_t leftItems) const {
     const Group& group = fGroups[right.group];
     const Token& lone = fTokens[group.firstToken];
-    if (isOneOf(lone.lower, kQuestionWords))
+    if (isOneOf(lone.lower, kQuestionWords) || isOneOf(lone.lower, kThatWords))
       return true;
     const std::size_t next = group.lastToken + 1;
-    if (next >= fTokens.size() || fTokens[next].type != Token::Word)
-      return false;
     const std::size_t previous = firstLeft.firstToken;
+    // The last verb group before the first item: whether it has a verb of a tense ("n'est
+    // pas une personne", not "se servant de gettext"), and ends in an infinitive after it
+    // ("vous devriez envoyer").
+    const std::size_t leftGroup = commaBefore ? kNone : xVerbGroupBefore(previous);
+    const bool leftVerb = leftGroup != kNone && xFiniteGroup(leftGroup);
+    const bool leftInfinitive = leftVerb && fTokens[fGroups[leftGroup].lastToken].infinitive &&
+                                !fTokens[fGroups[leftGroup].lastToken].finite;
+    if (next >= fTokens.size() ||
+        (fTokens[next].type != Token::Word && !(leftVerb && xInWordMark(next))))
+      return false;
     const bool beginsClause = previous == 0 || xBeginsClause(previous - 1);
     const bool afterVerb = previous > 0 && fGroupOfToken[previous - 1] != kNone &&
                            fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB;
-    const Role after = fTokens[next].role;
+    const Role after = fTokens[next].type == Token::Word ? fTokens[next].role : Role::Interjection;
     const bool single = group.firstToken == group.lastToken;
     const bool canBeVerb = lone.has(WORD_CLASS_VERB) || lone.has(WORD_CLASS_AUXILIARY);
     const bool objectAfter = after == Role::Pronoun || after == Role::Clitic;
@@ -891,33 +964,92 @@ class StructureBuilder {
                                   after == Role::Adverb || after == Role::Adjective ||
                                   isOneOf(fTokens[next].lower, kAgentWords))) ||
                    (after == Role::Preposition &&
-                    (lone.participle || (lone.firstClass == WORD_CLASS_VERB && afterVerb))) ||
+                    (lone.participle || (lone.firstClass == WORD_CLASS_VERB && afterVerb) ||
+                     (lone.infinitive && leftInfinitive))) ||
                    (lone.firstClass == WORD_CLASS_UNKNOWN &&
                     (objectAfter ||
                      (after == Role::Determiner && !isOneOf(fTokens[next].lower, kPartitives))))))
       return true;
     // The verb of a subject; after a comma, past its prepositional groups ("the number of
-    // packages in the archive is"), which without a comma would rather belong to the
-    // list ("changing its owner or its rights of a file changes").
+    // packages in the archive is"), which without a comma would rather belong to the list
+    // ("changing its owner or its rights of a file changes") unless the clause of the
+    // first item has a verb of its own: then a verb of a tense there begins the second
+    // clause ("n'est pas une personne et les écrans de debconf ne parlent pas").
     std::size_t k = next;
-    while (commaBefore && k < fTokens.size() && fTokens[k].type == Token::Word &&
-           (fTokens[k].role == Role::Preposition || fTokens[k].role == Role::Adverb ||
-            ((fTokens[k].role == Role::Noun || fTokens[k].role == Role::Determiner ||
-              fTokens[k].role == Role::Adjective) &&
-             !isOneOf(fTokens[k].lower, kRelativeWords))))
+    while ((commaBefore || leftVerb) && k < fTokens.size() &&
+           (fGroupOfToken[k] == kNone || fGroups[fGroupOfToken[k]].kind != STRUCTURE_VERB) &&
+           ((fTokens[k].type == Token::Word &&
+             (fTokens[k].role == Role::Preposition || fTokens[k].role == Role::Adverb ||
+              ((fTokens[k].role == Role::Noun || fTokens[k].role == Role::Determiner ||
+                fTokens[k].role == Role::Adjective) &&
+               !isOneOf(fTokens[k].lower, kRelativeWords)))) ||
+            xInWordMark(k)))
       ++k;
     if (k >= fTokens.size() || fGroupOfToken[k] == kNone ||
         fGroups[fGroupOfToken[k]].kind != STRUCTURE_VERB)
       return false;
+    // Not the verb of a preposition or of a determiner ("in order to ease", "this install
+    // file").
+    if (leftVerb && k != next &&
+        (!xFiniteGroup(fGroupOfToken[k]) || fTokens[k - 1].type != Token::Word ||
+         fTokens[k - 1].role == Role::Preposition || fTokens[k - 1].role == Role::Determiner))
+      return false;
+    // A verb right after an item with a preposition, where the items before have none:
+    // the item is a complement of the verb ("edit those files and in those lines replace
+    // the path").
+    const bool rightPreposition = right.firstToken != group.firstToken;
+    if (rightPreposition && k == next &&
+        firstLeft.firstToken == fGroups[firstLeft.group].firstToken)
+      return true;
     // A subject has no preposition before it ("of books and of documents are", "de
     // livres et de documents sont").
-    if (right.firstToken != group.firstToken || lone.lower == "de" || lone.lower == "d")
+    if (rightPreposition || lone.lower == "de" || lone.lower == "d")
       return false;
     if (k == next && !beginsClause)
       return true;
     if (commaBefore && leftItems == 1)
       return true;
     return afterVerb || (previous > 0 && xIsPreposition(previous - 1));
+  }
+
+  // A mark inside a path or an option, right before the word it leads ("/usr/bin/truc",
+  // "libtruc.so", "--add-gnu-debuglink"): it parts no clause.
+  bool xInWordMark(std::size_t t) const {
+    if (t >= fTokens.size() || fTokens[t].type != Token::Break)
+      return false;
+    const std::size_t c = fTokens[t].chunk;
+    return c + 1 < fChunks.size() && fChunks[c + 1].wordClass() >= WORD_CLASS_UNKNOWN &&
+           fChunks[c].text.find_first_not_of("/._~:-") == std::string::npos;
+  }
+
+  // Whether group g has a verb of a tense.
+  bool xFiniteGroup(std::size_t g) const {
+    for (std::size_t t = fGroups[g].firstToken; t <= fGroups[g].lastToken; ++t) {
+      if (fTokens[t].finite &&
+          (fTokens[t].role == Role::Verb || fTokens[t].role == Role::Auxiliary))
+        return true;
+    }
+    return false;
+  }
+
+  // The last verb group of the clause before token t, back to a mark, a comma, a
+  // coordinating or subordinating word, a relative or a question word; kNone if none.
+  std::size_t xVerbGroupBefore(std::size_t t) const {
+    while (t > 0) {
+      --t;
+      const Token& token = fTokens[t];
+      if (token.type != Token::Word) {
+        if (xInWordMark(t))
+          continue;
+        return kNone;
+      }
+      if (token.role == Role::Subordinator || token.role == Role::Conjunction ||
+          isOneOf(token.lower, kRelativeWords) || isOneOf(token.lower, kQuestionWords))
+        return kNone;
+      if (fGroupOfToken[t] != kNone && fGroups[fGroupOfToken[t]].kind == STRUCTURE_VERB)
+        return fGroupOfToken[t];
+    }
+    return kNone;
   }
 
   // Whether a clause may begin after token t: a comma, a mark other than a slash
