@@ -386,10 +386,10 @@ void RemoteNode::xHandle(std::vector<std::string_view> frames) {
 
   // An error about a message: to its requester, with its id when the header was read.
   const auto refuse = [&](const std::string& text, const std::optional<wire::Header>& header) {
-    const std::string who = role_ != Role::Listening ? "the listening process"
-                            : peer ? "process '" + xPeerName(peerId) + "' (#" +
-                                         std::to_string(peerId) + ")"
-                                   : "a process not introduced yet";
+    const std::string who =
+        role_ != Role::Listening ? "the listening process"
+        : peer ? "process '" + xPeerName(peerId) + "' (#" + std::to_string(peerId) + ")"
+               : "a process not introduced yet";
     KO_LOG_WARNING(kCategory) << "Refused a message of " << total << " bytes from " << who << ": "
                               << text;
     if (header && !isRequest(header->kind))
@@ -400,7 +400,8 @@ void RemoteNode::xHandle(std::vector<std::string_view> frames) {
     h.to = role_ == Role::Listening ? peerId : (header ? header->from : 0);
     h.from = role_ == Role::Listening ? 0 : self_;
     h.fields = {AnyValue(text)};
-    xSendNow(Outgoing{h.to, peer ? std::string() : routing, wire::encodeHeader(h), std::nullopt, 0});
+    xSendNow(
+        Outgoing{h.to, peer ? std::string() : routing, wire::encodeHeader(h), std::nullopt, 0});
   };
 
   std::optional<wire::Header> header;
@@ -826,8 +827,8 @@ void RemoteNode::xFailPending(std::optional<std::uint32_t> peer, const std::stri
 }
 
 Future<AnyValue> RemoteNode::xRequest(MessageKind kind, std::uint32_t to,
-                                      std::vector<AnyValue> fields, Body body,
-                                      std::string what, std::chrono::milliseconds timeout) {
+                                      std::vector<AnyValue> fields, Body body, std::string what,
+                                      std::chrono::milliseconds timeout) {
   Promise<AnyValue> promise;
   Future<AnyValue> result = promise.future();
   xRequestWith(kind, to, std::move(fields), body, std::move(what), timeout,
@@ -839,8 +840,7 @@ Future<AnyValue> RemoteNode::xRequest(MessageKind kind, std::uint32_t to,
 }
 
 void RemoteNode::xRequestWith(MessageKind kind, std::uint32_t to, std::vector<AnyValue> fields,
-                              Body body, std::string what,
-                              std::chrono::milliseconds timeout,
+                              Body body, std::string what, std::chrono::milliseconds timeout,
                               std::function<void(Outcome)> done) {
   Outgoing out;
   out.to = to;

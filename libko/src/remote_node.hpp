@@ -202,8 +202,7 @@ class RemoteNode : public std::enable_shared_from_this<RemoteNode> {
              std::vector<AnyValue> fields, Body body = {});
   void xReplyError(const wire::Header& request, const std::string& text);
   Future<AnyValue> xRequest(wire::MessageKind kind, std::uint32_t to, std::vector<AnyValue> fields,
-                            Body body, std::string what,
-                            std::chrono::milliseconds timeout);
+                            Body body, std::string what, std::chrono::milliseconds timeout);
   // `done` runs on the I/O thread (or at once in this one when the request cannot go).
   void xRequestWith(wire::MessageKind kind, std::uint32_t to, std::vector<AnyValue> fields,
                     Body body, std::string what, std::chrono::milliseconds timeout,

@@ -28,7 +28,8 @@ namespace detail {
 template <class A>
 AnyValue toAnyValue(A&& a) {
   using T = std::remove_cvref_t<A>;
-  if constexpr (std::is_same_v<T, AnyValue> || (std::is_same_v<T, std::string> && !std::is_lvalue_reference_v<A>))
+  if constexpr (std::is_same_v<T, AnyValue> ||
+                (std::is_same_v<T, std::string> && !std::is_lvalue_reference_v<A>))
     return std::forward<A>(a);
   else
     return AnyValue::from(a);
@@ -130,9 +131,7 @@ class GenericObject {
   // takes one list is called with AnyValue::list(...) or with a one-element vector.
   template <class R = AnyValue, class... A>
   requires(!detail::isSingleArgVector<A...>) R call(std::string_view name, A&&... args)
-  const {
-    return call<R>(name, detail::argumentList(std::forward<A>(args)...));
-  }
+  const { return call<R>(name, detail::argumentList(std::forward<A>(args)...)); }
   template <class R = AnyValue>
   R call(std::string_view name, const std::vector<AnyValue>& args) const {
     return callById<R>(resolveMethod(name, args), args);
@@ -147,9 +146,7 @@ class GenericObject {
   // included) comes back as the future's error.
   template <class R = AnyValue, class... A>
   requires(!detail::isSingleArgVector<A...>) Future<R> async(std::string_view name, A&&... args)
-  const {
-    return async<R>(name, detail::argumentList(std::forward<A>(args)...));
-  }
+  const { return async<R>(name, detail::argumentList(std::forward<A>(args)...)); }
   template <class R = AnyValue>
   Future<R> async(std::string_view name, std::vector<AnyValue> args) const {
     return detail::convertFuture<R>(asyncCall(name, std::move(args)));
