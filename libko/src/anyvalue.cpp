@@ -240,6 +240,11 @@ const std::string& AnyValue::asString() const {
     return *p;
   throwKind(Kind::String);
 }
+std::string& AnyValue::asString() {
+  if (auto* p = std::get_if<std::string>(&data_))
+    return *p;
+  throwKind(Kind::String);
+}
 const AnyValue::List& AnyValue::asList() const {
   if (auto* p = std::get_if<List>(&data_))
     return *p;

@@ -67,6 +67,20 @@ AnyValue number(std::uint64_t v) {
   return AnyValue::integer(static_cast<std::int64_t>(v), 8, false);
 }
 
+// A frame of the bytes: a large one is handed to ZeroMQ as it is (freed once sent, in
+// ZeroMQ's I/O thread), a small one copied (cheaper than a second allocation).
+zmq::message_t frameOf(std::string&& bytes) {
+  constexpr std::size_t kHandOverBytes = 2048;
+  if (bytes.size() < kHandOverBytes)
+    return zmq::message_t(bytes.data(), bytes.size());
+  auto owned = std::make_unique<std::string>(std::move(bytes));
+  zmq::message_t frame(
+      owned->data(), owned->size(),
+      [](void*, void* hint) { delete static_cast<std::string*>(hint); }, owned.get());
+  owned.release();
+  return frame;
+}
+
 // Settles a promise in this thread, unless this is the I/O thread and continuations wait on
 // it: those run on the pool.
 void settle(Promise<AnyValue> promise, ServingPool& pool, bool onIoThread, bool ok, AnyValue value,
@@ -313,10 +327,11 @@ void RemoteNode::xReceive() {
     }
     if (!got)
       return;
-    std::vector<std::string> frames;
+    // Decoded where ZeroMQ received them.
+    std::vector<std::string_view> frames;
     frames.reserve(parts.size());
-    for (auto& p : parts)
-      frames.emplace_back(p.to_string());
+    for (const auto& p : parts)
+      frames.emplace_back(p.data<char>(), p.size());
     xHandle(std::move(frames));
   }
 }
@@ -343,12 +358,12 @@ void RemoteNode::xHandleZap() {
   zmq::send_multipart(*sockets_->zap, reply);
 }
 
-void RemoteNode::xHandle(std::vector<std::string> frames) {
+void RemoteNode::xHandle(std::vector<std::string_view> frames) {
   std::string routing;
   if (role_ == Role::Listening) {
     if (frames.size() < 2)
       return;
-    routing = std::move(frames.front());
+    routing = frames.front();
     frames.erase(frames.begin());
   }
   std::size_t total = 0;
@@ -357,7 +372,6 @@ void RemoteNode::xHandle(std::vector<std::string> frames) {
 
   Peer* peer = nullptr;
   std::uint32_t peerId = 0;
-  std::string who = "the listening process";
   if (role_ == Role::Listening) {
     std::lock_guard lock(mutex_);
     const auto it = peersByRouting_.find(routing);
@@ -365,9 +379,6 @@ void RemoteNode::xHandle(std::vector<std::string> frames) {
       peer = &peers_.at(it->second);
       peer->lastSeen = Clock::now();
       peerId = peer->id;
-      who = "process '" + peer->name + "' (#" + std::to_string(peerId) + ")";
-    } else {
-      who = "a process not introduced yet";
     }
   } else {
     hubSeen_ = Clock::now();
@@ -375,6 +386,10 @@ void RemoteNode::xHandle(std::vector<std::string> frames) {
 
   // An error about a message: to its requester, with its id when the header was read.
   const auto refuse = [&](const std::string& text, const std::optional<wire::Header>& header) {
+    const std::string who =
+        role_ != Role::Listening ? "the listening process"
+        : peer ? "process '" + xPeerName(peerId) + "' (#" + std::to_string(peerId) + ")"
+               : "a process not introduced yet";
     KO_LOG_WARNING(kCategory) << "Refused a message of " << total << " bytes from " << who << ": "
                               << text;
     if (header && !isRequest(header->kind))
@@ -385,8 +400,8 @@ void RemoteNode::xHandle(std::vector<std::string> frames) {
     h.to = role_ == Role::Listening ? peerId : (header ? header->from : 0);
     h.from = role_ == Role::Listening ? 0 : self_;
     h.fields = {AnyValue(text)};
-    Outgoing out{h.to, peer ? std::string() : routing, wire::encodeHeader(h), std::nullopt, 0};
-    xSendNow(out);
+    xSendNow(
+        Outgoing{h.to, peer ? std::string() : routing, wire::encodeHeader(h), std::nullopt, 0});
   };
 
   std::optional<wire::Header> header;
@@ -439,7 +454,7 @@ void RemoteNode::xHandle(std::vector<std::string> frames) {
                                        0,
                                        {AnyValue("this process does not know yours: say hello")}}),
                    std::nullopt, 0};
-      xSendNow(out);
+      xSendNow(std::move(out));
       return;
     }
     header->from = peerId;  // never taken from the message
@@ -457,25 +472,24 @@ void RemoteNode::xHandle(std::vector<std::string> frames) {
       }
       Outgoing out{header->to, {}, wire::encodeHeader(*header), std::nullopt, 0};
       if (frames.size() > 1)
-        out.body = std::move(frames[1]);
-      xSendNow(out);
+        out.body = std::string(frames[1]);
+      xSendNow(std::move(out));
       return;
     }
   }
 
-  std::vector<std::string_view> views(frames.begin(), frames.end());
   wire::Message m;
   try {
-    m = wire::decodeMessage(views);
+    m = wire::decodeMessage(frames);
   } catch (const wire::MessageError& e) {
     refuse(std::string("Malformed message: ") + e.what(), e.header());
     return;
   }
   m.header.from = header->from;
-  xHandleFor(m, peer);
+  xHandleFor(std::move(m), peer);
 }
 
-void RemoteNode::xHandleFor(const wire::Message& m, Peer* peer) {
+void RemoteNode::xHandleFor(wire::Message m, Peer* peer) {
   const wire::Header& h = m.header;
   const bool listening = role_ == Role::Listening;
   if (!listening && h.kind != MessageKind::Welcome && h.kind != MessageKind::Reset) {
@@ -484,7 +498,7 @@ void RemoteNode::xHandleFor(const wire::Message& m, Peer* peer) {
       return;  // for a link that is gone
   }
   const auto serve = [this, &m](void (RemoteNode::*method)(wire::Message)) {
-    pool_->post([this, method, m]() mutable { (this->*method)(std::move(m)); });
+    pool_->post([this, method, m = std::move(m)]() mutable { (this->*method)(std::move(m)); });
   };
   const auto hubOnly = [&] {
     if (listening)
@@ -570,16 +584,7 @@ void RemoteNode::xHandleFor(const wire::Message& m, Peer* peer) {
     case MessageKind::List: {
       if (!hubOnly())
         return;
-      std::set<std::string> names;
-      for (auto& n : session_.services())
-        names.insert(std::move(n));
-      {
-        std::lock_guard dirLock(directoryMutex_);
-        for (const auto& [n, e] : directory_)
-          names.insert(n);
-      }
-      AnyValue::List list(names.begin(), names.end());
-      const AnyValue value = AnyValue::list(std::move(list));
+      const AnyValue value = AnyValue::from(xServiceNames());
       xSend(MessageKind::Reply, h.from, h.id, {}, &value);
       return;
     }
@@ -594,7 +599,7 @@ void RemoteNode::xHandleFor(const wire::Message& m, Peer* peer) {
     case MessageKind::SetProperty:
       return serve(&RemoteNode::xServeProperty);
     case MessageKind::Reply:
-      return xComplete(h.id, h.from, Outcome{true, m.body, {}});
+      return xComplete(h.id, h.from, Outcome{true, std::move(m.body), {}});
     case MessageKind::Error:
       return xComplete(h.id, h.from, Outcome{false, {}, h.text(0)});
     case MessageKind::Signal: {
@@ -606,7 +611,7 @@ void RemoteNode::xHandleFor(const wire::Message& m, Peer* peer) {
           object = it->second;
       }
       if (object)
-        object->deliver(h.text(1), m.body.asList());
+        object->deliver(h.text(1), std::move(m.body.asList()));
       return;
     }
     case MessageKind::Service:
@@ -645,7 +650,7 @@ void RemoteNode::xSend(Outgoing out) {
 }
 
 void RemoteNode::xSend(MessageKind kind, std::uint32_t to, std::uint64_t id,
-                       std::vector<AnyValue> fields, const AnyValue* body) {
+                       std::vector<AnyValue> fields, Body body) {
   wire::Header h{kind, id, to, 0, std::move(fields)};
   Outgoing out{to, {}, {}, std::nullopt, 0};
   {
@@ -655,7 +660,7 @@ void RemoteNode::xSend(MessageKind kind, std::uint32_t to, std::uint64_t id,
   }
   out.header = wire::encodeHeader(h);
   if (body)
-    out.body = wire::encodeValue(*body);
+    out.body = body.list ? wire::encodeList(*body.list) : wire::encodeValue(*body.value);
   else if (wire::hasBody(kind))
     out.body = wire::encodeValue(AnyValue());
   xSend(std::move(out));
@@ -671,11 +676,11 @@ void RemoteNode::xFlush() {
     std::lock_guard lock(outMutex_);
     batch.swap(outbox_);
   }
-  for (const auto& out : batch)
-    xSendNow(out);
+  for (auto& out : batch)
+    xSendNow(std::move(out));
 }
 
-void RemoteNode::xSendNow(const Outgoing& out) {
+void RemoteNode::xSendNow(Outgoing out) {
   auto& s = sockets_->socket;
   try {
     if (role_ == Role::Listening) {
@@ -696,7 +701,7 @@ void RemoteNode::xSendNow(const Outgoing& out) {
     s.send(zmq::buffer(out.header), out.body ? zmq::send_flags::sndmore | zmq::send_flags::dontwait
                                              : zmq::send_flags::dontwait);
     if (out.body)
-      s.send(zmq::buffer(*out.body), zmq::send_flags::dontwait);
+      s.send(frameOf(std::move(*out.body)), zmq::send_flags::dontwait);
   } catch (const zmq::error_t& e) {
     // The process left between routing and sending.
     KO_LOG_VERBOSE(kCategory) << "A message to #" << out.to << " was not sent: " << e.what();
@@ -822,8 +827,8 @@ void RemoteNode::xFailPending(std::optional<std::uint32_t> peer, const std::stri
 }
 
 Future<AnyValue> RemoteNode::xRequest(MessageKind kind, std::uint32_t to,
-                                      std::vector<AnyValue> fields, const AnyValue* body,
-                                      std::string what, std::chrono::milliseconds timeout) {
+                                      std::vector<AnyValue> fields, Body body, std::string what,
+                                      std::chrono::milliseconds timeout) {
   Promise<AnyValue> promise;
   Future<AnyValue> result = promise.future();
   xRequestWith(kind, to, std::move(fields), body, std::move(what), timeout,
@@ -835,15 +840,14 @@ Future<AnyValue> RemoteNode::xRequest(MessageKind kind, std::uint32_t to,
 }
 
 void RemoteNode::xRequestWith(MessageKind kind, std::uint32_t to, std::vector<AnyValue> fields,
-                              const AnyValue* body, std::string what,
-                              std::chrono::milliseconds timeout,
+                              Body body, std::string what, std::chrono::milliseconds timeout,
                               std::function<void(Outcome)> done) {
   Outgoing out;
   out.to = to;
   std::string error;
   try {
     if (body)
-      out.body = wire::encodeValue(*body);
+      out.body = body.list ? wire::encodeList(*body.list) : wire::encodeValue(*body.value);
     std::size_t size = out.body ? out.body->size() : 0;
     for (const auto& f : fields)
       size += f.kind() == Kind::String ? f.asString().size() : 8;
@@ -886,17 +890,15 @@ void RemoteNode::xRequestWith(MessageKind kind, std::uint32_t to, std::vector<An
 
 Future<AnyValue> RemoteNode::call(std::uint32_t peer, const std::string& service, unsigned methodId,
                                   const std::string& method, const std::vector<AnyValue>& args) {
-  const AnyValue body = AnyValue::list(args);
   return xRequest(MessageKind::Call, peer,
                   {AnyValue(service), AnyValue(methodId),
                    AnyValue(static_cast<std::int64_t>(options_.callTimeout.count()))},
-                  &body, "call of " + service + "." + method, options_.callTimeout);
+                  args, "call of " + service + "." + method, options_.callTimeout);
 }
 
 void RemoteNode::post(std::uint32_t peer, const std::string& service, const std::string& signal,
                       const std::vector<AnyValue>& args) {
-  const AnyValue body = AnyValue::list(args);
-  xSend(MessageKind::Post, peer, 0, {AnyValue(service), AnyValue(signal)}, &body);
+  xSend(MessageKind::Post, peer, 0, {AnyValue(service), AnyValue(signal)}, args);
 }
 
 Future<void> RemoteNode::subscribe(std::uint32_t peer, const std::string& service,
@@ -1039,16 +1041,19 @@ Future<AnyObject> RemoteNode::lookup(const std::string& name) {
   return result;
 }
 
+std::vector<std::string> RemoteNode::xServiceNames() {
+  std::set<std::string> names;
+  for (auto& n : session_.services())
+    names.insert(std::move(n));
+  std::lock_guard dirLock(directoryMutex_);
+  for (const auto& [n, e] : directory_)
+    names.insert(n);
+  return {names.begin(), names.end()};
+}
+
 Future<std::vector<std::string>> RemoteNode::directory() {
-  if (role_ == Role::Listening) {
-    std::set<std::string> names;
-    for (auto& n : session_.services())
-      names.insert(std::move(n));
-    std::lock_guard dirLock(directoryMutex_);
-    for (const auto& [n, e] : directory_)
-      names.insert(n);
-    return Future<std::vector<std::string>>::fromValue({names.begin(), names.end()});
-  }
+  if (role_ == Role::Listening)
+    return Future<std::vector<std::string>>::fromValue(xServiceNames());
   return xRequest(MessageKind::List, 0, {}, nullptr, "listing of the directory",
                   options_.requestTimeout)
       .andThen([](const AnyValue& v) { return v.to<std::vector<std::string>>(); });
@@ -1301,10 +1306,9 @@ void RemoteNode::xServeCall(wire::Message m) {
       return xReplyError(h, e.what());
     }
   }
-  const Future<AnyValue> result = target->metaCall(id, args, MetaCallType::Direct);
+  Future<AnyValue> result = target->metaCall(id, args, MetaCallType::Direct);
   auto reply = [self = weak_from_this(), h,
-                what = name + "." +
-                       target->metaObject().method(id)->name](const Future<AnyValue>& done) {
+                what = name + "." + target->metaObject().method(id)->name](Future<AnyValue> done) {
     const auto node = self.lock();
     if (!node)
       return;
@@ -1313,8 +1317,7 @@ void RemoteNode::xServeCall(wire::Message m) {
       return node->xReplyError(h, error.empty() ? "The call of " + what + " failed" : error);
     }
     try {
-      const AnyValue value = done.value();
-      std::string body = wire::encodeValue(value);
+      std::string body = wire::encodeValue(std::move(done).value());
       if (body.size() > node->options_.maxMessageBytes)
         return node->xReplyError(h, "The result of " + what + " is " + std::to_string(body.size()) +
                                         " bytes: more than the limit of " +
@@ -1333,7 +1336,7 @@ void RemoteNode::xServeCall(wire::Message m) {
     }
   };
   if (result.isFinished())
-    reply(result);
+    reply(std::move(result));
   else
     result.then(reply);
 }
@@ -1376,9 +1379,8 @@ void RemoteNode::xServeSubscribe(wire::Message m) {
       const auto node = self.lock();
       if (!node)
         return;
-      const AnyValue body = AnyValue::list(args);
       try {
-        node->xSend(MessageKind::Signal, to, 0, {AnyValue(service), AnyValue(signal)}, &body);
+        node->xSend(MessageKind::Signal, to, 0, {AnyValue(service), AnyValue(signal)}, args);
       } catch (const Error& e) {
         KO_LOG_WARNING(kCategory) << "Signal " << service << "." << signal
                                   << " cannot be sent to process #" << to << ": " << e.what();

@@ -26,6 +26,7 @@
 #include <optional>
 #include <set>
 #include <string>
+#include <string_view>
 #include <thread>
 #include <tuple>
 #include <vector>
@@ -170,6 +171,16 @@ class RemoteNode : public std::enable_shared_from_this<RemoteNode> {
     AnyObject object;
     SignalLink link = kInvalidSignalLink;
   };
+  // The body of a message: a value, or a list of arguments (encoded as a list without
+  // being copied into one), or none.
+  struct Body {
+    Body() : value(nullptr), list(nullptr) {}
+    Body(const AnyValue* v) : value(v), list(nullptr) {}
+    Body(const std::vector<AnyValue>& l) : value(nullptr), list(&l) {}
+    explicit operator bool() const { return value || list; }
+    const AnyValue* value;
+    const std::vector<AnyValue>* list;
+  };
   using ForwarderKey =
       std::tuple<std::uint32_t, std::string, std::string>;  // subscriber, service, signal
 
@@ -177,24 +188,24 @@ class RemoteNode : public std::enable_shared_from_this<RemoteNode> {
   void xOpenDealer();
   void xRun();
   void xReceive();
-  void xHandle(std::vector<std::string> frames);
-  void xHandleFor(const wire::Message& m, Peer* peer);
+  // The frames point into the messages ZeroMQ received, alive for the call.
+  void xHandle(std::vector<std::string_view> frames);
+  void xHandleFor(wire::Message m, Peer* peer);
   void xFlush();
   void xTick();
-  void xSendNow(const Outgoing& out);
+  void xSendNow(Outgoing out);
   void xHandleZap();
 
   // Any thread: queues a message and wakes the I/O thread.
   void xSend(Outgoing out);
   void xSend(wire::MessageKind kind, std::uint32_t to, std::uint64_t id,
-             std::vector<AnyValue> fields, const AnyValue* body = nullptr);
+             std::vector<AnyValue> fields, Body body = {});
   void xReplyError(const wire::Header& request, const std::string& text);
   Future<AnyValue> xRequest(wire::MessageKind kind, std::uint32_t to, std::vector<AnyValue> fields,
-                            const AnyValue* body, std::string what,
-                            std::chrono::milliseconds timeout);
+                            Body body, std::string what, std::chrono::milliseconds timeout);
   // `done` runs on the I/O thread (or at once in this one when the request cannot go).
   void xRequestWith(wire::MessageKind kind, std::uint32_t to, std::vector<AnyValue> fields,
-                    const AnyValue* body, std::string what, std::chrono::milliseconds timeout,
+                    Body body, std::string what, std::chrono::milliseconds timeout,
                     std::function<void(Outcome)> done);
   std::uint64_t xAddPending(Pending pending);
   void xComplete(std::uint64_t id, std::uint32_t from, Outcome outcome);
@@ -213,6 +224,8 @@ class RemoteNode : public std::enable_shared_from_this<RemoteNode> {
   void xPeerGone(std::uint32_t peer, const std::string& reason, bool saidGoodbye = false);
   void xAnnounce(const std::string& event, const std::string& service, std::uint32_t owner);
   AnyValue xServiceInfo(const std::string& name, std::string* error);
+  // Every service's name, this process's and the others', in order.
+  std::vector<std::string> xServiceNames();
   // Both: drop what belongs to a process that is gone (`peer`), or to every one.
   void xForget(std::optional<std::uint32_t> peer);
   void xDropForwarders(const std::function<bool(const ForwarderKey&)>& which);

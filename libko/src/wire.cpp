@@ -190,6 +190,14 @@ std::string encodeValue(const AnyValue& value) {
   return out;
 }
 
+std::string encodeList(const AnyValue::List& items) {
+  std::string out;
+  StringWriter writer{out};
+  Packer p(writer);
+  packList(out, p, items);
+  return out;
+}
+
 // ---- decoding ----------------------------------------------------------------------------
 
 namespace {

@@ -182,6 +182,7 @@ class AnyValue {
   const Int& asInt() const;
   const Float& asFloat() const;
   const std::string& asString() const;
+  std::string& asString();
   const List& asList() const;
   List& asList();
   const Map& asMap() const;

@@ -101,8 +101,9 @@ AnyValue invokeWithArgs(F& f, const std::vector<AnyValue>& args, std::index_sequ
   if constexpr (std::is_void_v<R>) {
     std::invoke(f, std::forward<A>(std::get<I>(values))...);
     return AnyValue();
-  } else if constexpr (std::is_same_v<std::remove_cvref_t<R>, AnyValue>) {
-    return std::invoke(f, std::forward<A>(std::get<I>(values))...);
+  } else if constexpr (std::is_same_v<std::remove_cvref_t<R>, AnyValue> ||
+                       std::is_same_v<R, std::string>) {
+    return std::invoke(f, std::forward<A>(std::get<I>(values))...);  // moved in
   } else {
     return AnyValue::from(std::invoke(f, std::forward<A>(std::get<I>(values))...));
   }

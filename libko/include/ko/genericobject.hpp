@@ -27,10 +27,21 @@ namespace ko {
 namespace detail {
 template <class A>
 AnyValue toAnyValue(A&& a) {
-  if constexpr (std::is_same_v<std::remove_cvref_t<A>, AnyValue>)
+  using T = std::remove_cvref_t<A>;
+  if constexpr (std::is_same_v<T, AnyValue> ||
+                (std::is_same_v<T, std::string> && !std::is_lvalue_reference_v<A>))
     return std::forward<A>(a);
   else
     return AnyValue::from(a);
+}
+
+// The arguments of a call, each converted once (a braced list would copy them again).
+template <class... A>
+std::vector<AnyValue> argumentList(A&&... args) {
+  std::vector<AnyValue> list;
+  list.reserve(sizeof...(A));
+  (list.push_back(toAnyValue(std::forward<A>(args))), ...);
+  return list;
 }
 
 template <class... A>
@@ -46,6 +57,10 @@ R convertResult(AnyValue&& result) {
     return std::move(result);
   } else {
     try {
+      if constexpr (std::is_same_v<R, std::string>) {
+        if (result.kind() == Kind::String)
+          return std::move(result.asString());
+      }
       return result.template to<R>();
     } catch (const ConversionError&) {
       throw ResultConversionError(result.signature(), signatureOf<R>());
@@ -116,9 +131,7 @@ class GenericObject {
   // takes one list is called with AnyValue::list(...) or with a one-element vector.
   template <class R = AnyValue, class... A>
   requires(!detail::isSingleArgVector<A...>) R call(std::string_view name, A&&... args)
-  const {
-    return call<R>(name, std::vector<AnyValue>{detail::toAnyValue(std::forward<A>(args))...});
-  }
+  const { return call<R>(name, detail::argumentList(std::forward<A>(args)...)); }
   template <class R = AnyValue>
   R call(std::string_view name, const std::vector<AnyValue>& args) const {
     return callById<R>(resolveMethod(name, args), args);
@@ -133,9 +146,7 @@ class GenericObject {
   // included) comes back as the future's error.
   template <class R = AnyValue, class... A>
   requires(!detail::isSingleArgVector<A...>) Future<R> async(std::string_view name, A&&... args)
-  const {
-    return async<R>(name, std::vector<AnyValue>{detail::toAnyValue(std::forward<A>(args))...});
-  }
+  const { return async<R>(name, detail::argumentList(std::forward<A>(args)...)); }
   template <class R = AnyValue>
   Future<R> async(std::string_view name, std::vector<AnyValue> args) const {
     return detail::convertFuture<R>(asyncCall(name, std::move(args)));
@@ -149,7 +160,7 @@ class GenericObject {
   template <class... A>
   requires(!detail::isSingleArgVector<A...>) void post(std::string_view signalName,
                                                        A&&... args) const {
-    post(signalName, std::vector<AnyValue>{detail::toAnyValue(std::forward<A>(args))...});
+    post(signalName, detail::argumentList(std::forward<A>(args)...));
   }
   void post(std::string_view signalName, const std::vector<AnyValue>& args) const;
 

@@ -46,6 +46,8 @@ enum ExtensionType : std::int8_t {
 // Appends the MessagePack of `value`; raises ko::Error for an object or a pointer.
 void appendValue(std::string& out, const AnyValue& value);
 std::string encodeValue(const AnyValue& value);
+// What encodeValue(AnyValue::list(items)) answers, without the copy of the items.
+std::string encodeList(const AnyValue::List& items);
 // Exactly one value taking every byte; raises DecodeError otherwise.
 AnyValue decodeValue(std::string_view bytes);
 
