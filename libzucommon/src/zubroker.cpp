@@ -167,21 +167,30 @@ ko::AnyObject ZUBroker::service(const std::string& name) const {
 
   const ko::Future<ko::AnyObject> local = fSession->service(name, "local");
   const ko::FutureState localState = local.wait(timeout);
+  // A service of another process is not in this one: the local failure is an error only
+  // when the service is found nowhere.
+  std::string localFailure;
   if (localState == ko::FutureState::Timeout) {
     KO_LOG_ERROR(kCategory) << "session.service(" << name << ") timeout after 30sec.";
   } else if (localState == ko::FutureState::FinishedWithValue && local.value()) {
     return local.value();
   } else {
-    KO_LOG_ERROR(kCategory) << "Future exception while checking local service: "
-                            << failureText(local);
+    localFailure = "Future exception while checking local service: " + failureText(local);
   }
 
   const ko::Future<ko::AnyObject> any = fSession->service(name, "");
   const ko::FutureState anyState = any.wait(timeout);
+  if (anyState == ko::FutureState::FinishedWithValue && any.value()) {
+    if (!localFailure.empty()) {
+      KO_LOG_VERBOSE(kCategory) << localFailure << " (found in another process)";
+    }
+    return any.value();
+  }
+  if (!localFailure.empty()) {
+    KO_LOG_ERROR(kCategory) << localFailure;
+  }
   if (anyState == ko::FutureState::Timeout) {
     KO_LOG_ERROR(kCategory) << "session.service(" << name << ") timed out after 30sec.";
-  } else if (anyState == ko::FutureState::FinishedWithValue && any.value()) {
-    return any.value();
   } else {
     KO_LOG_ERROR(kCategory) << "Future exception while checking remote service: "
                             << failureText(any);

@@ -119,6 +119,23 @@ TEST(BrokerTest, AMissingServiceIsAnEmptyObjectAfterBothLookups) {
                             "service 'Nobody'"));
 }
 
+// A service of another process (here: one the local scope does not give): the local miss
+// is no error.
+TEST(BrokerTest, AServiceFoundInAnotherProcessLogsNoError) {
+  zutest::Process process;
+  ZU::ZUModule::createModule<Greeter>(process.broker, "Greeter");
+  process.session->setLookupHook(
+      [](const std::string& name,
+         const std::string& scope) -> std::optional<ko::Future<ko::AnyObject>> {
+        if (scope != "local")
+          return std::nullopt;
+        return ko::makeFutureError<ko::AnyObject>("Cannot find service '" + name + "'");
+      });
+  ko::log::ScopedCapture cap;
+  EXPECT_NE(process.broker->service("Greeter"), nullptr);
+  EXPECT_FALSE(cap->containsPart("ZUBroker", ko::log::Error, "checking local service"));
+}
+
 TEST(DeadlockTimeoutTest, ReadsTheBaseFromThePrefix) {
   const std::pair<const char*, int> cases[] = {
       {"0x1F4", 500}, {"0X1f4", 500}, {"500", 500},    {"0764", 500},
