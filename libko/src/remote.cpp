@@ -11,6 +11,7 @@
 #include <sstream>
 
 #include "ko/log.hpp"
+#include "ko/os.hpp"
 #include "ko/reaper.hpp"
 #include "remote_node.hpp"
 
@@ -144,6 +145,9 @@ struct ServingPool::State {
 namespace {
 void servingThread(const std::shared_ptr<ServingPool::State>& s) {
   FrameworkThreadScope scope;
+  // Calls and events from other processes run here, as the memory service's deliveries run
+  // on its real-time threads in one process.
+  const os::RealtimeScope realtime;
   std::unique_lock lock(s->mutex);
   for (;;) {
     ++s->idle;

@@ -1,5 +1,6 @@
 #include "remote_node.hpp"
 
+#include <sched.h>
 #include <sys/eventfd.h>
 #include <unistd.h>
 
@@ -16,6 +17,7 @@
 #include "ko/dynamicobject.hpp"
 #include "ko/genericobject.hpp"
 #include "ko/log.hpp"
+#include "ko/os.hpp"
 #include "ko/reaper.hpp"
 #include "ko/session.hpp"
 
@@ -140,6 +142,13 @@ RemoteNode::~RemoteNode() {
 
 void RemoteNode::xOpen(const std::string& endpoint) {
   sockets_ = std::make_unique<Sockets>();
+  // ZeroMQ's own I/O thread carries every message between the socket and the wire: it runs
+  // at the real-time priority of the link's threads. ZeroMQ aborts the process when it
+  // may not raise its threads, so it is asked only once this thread could be raised.
+  if (const os::RealtimeScope probe; probe.raised()) {
+    zmq_ctx_set(sockets_->context.handle(), ZMQ_THREAD_SCHED_POLICY, SCHED_FIFO);
+    zmq_ctx_set(sockets_->context.handle(), ZMQ_THREAD_PRIORITY, os::realtimePriority());
+  }
   wakeFd_ = ::eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC);
   if (wakeFd_ < 0)
     throw Error("Cannot make the wake-up descriptor of the remote link");
@@ -270,6 +279,8 @@ void RemoteNode::setLinkListener(std::function<void(bool)> listener) {
 
 void RemoteNode::xRun() {
   FrameworkThreadScope scope;
+  // On the way of every event and call between processes.
+  const os::RealtimeScope realtime;
   ioThread_.store(std::this_thread::get_id());
   const auto tick = std::clamp(options_.heartbeatInterval / 4, std::chrono::milliseconds(10),
                                std::chrono::milliseconds(100));

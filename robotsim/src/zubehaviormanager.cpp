@@ -430,13 +430,15 @@ std::uint64_t ZUBehaviorManager::xStart(const std::string& method, const std::st
                    "Behavior " + quoted(behavior) + " cannot move the body: " + e.what());
   }
 
+  // The entry says when the body began to move, not when the delivery thread writes it.
+  const std::int64_t startUs = fTimeline ? fTimeline->now() : -1;
   bool stopNow = false;
   {
     std::lock_guard lock(fMutex);
     Running& run = fRunning[behavior];
     run.moveId = moveId;
     fMoves[moveId] = behavior;
-    fDeliveries.push_back({behavior, true, false});
+    fDeliveries.push_back({behavior, true, false, false, startUs});
     fDeliveryWake.notify_all();
     if (const auto early = fEarlyEnds.find(moveId); early != fEarlyEnds.end()) {
       const bool interrupted = early->second;
@@ -491,7 +493,9 @@ void ZUBehaviorManager::xDeliver() {
     // The thread outlives whatever a news throws.
     try {
       if (delivery.started) {
-        xRecord("startBehavior", ko::AnyValue::list({delivery.behavior}));
+        if (fTimeline)
+          fTimeline->recordAt(delivery.startUs, getName(), "startBehavior",
+                              ko::AnyValue::list({delivery.behavior}));
       } else {
         xRecord("behaviorStopped", ko::AnyValue::list({delivery.behavior}),
                 delivery.interrupted ? "stopped" : "ended");

@@ -102,7 +102,8 @@ class ZUBehaviorManager : public ZU::ZUModule {
     std::string behavior;
     bool started = false;  // else stopped
     bool interrupted = false;
-    bool superseded = false;  // a later run started before the stop was signalled
+    bool superseded = false;    // a later run started before the stop was signalled
+    std::int64_t startUs = -1;  // a start: when its move began, on the timeline's clock
   };
 
   void xBindMethods();

@@ -5,14 +5,17 @@
 // the entry's time on ko::os::ustime()'s clock, the steady clock that every process of the
 // machine shares.
 //
-// Threads: the signal is triggered in the thread that records the entry; the timeline's
-// listener outlives the module harmlessly (it holds the signal, not the module).
+// Threads: the signal is triggered in the module's own thread, entry after entry in the
+// order recorded, never in the thread that records: the robot's threads on the way from a
+// bookmark to its gesture never wait for an observer. The timeline's listener outlives the
+// module harmlessly (it holds the signal and a weak handle on that thread).
 
 #include <cstdint>
 #include <memory>
 #include <string>
 
 #include "ko/anyvalue.hpp"
+#include "ko/eventloop.hpp"
 #include "ko/signal.hpp"
 #include "robotsim/timeline.h"
 #include "zu/zumodule.h"
@@ -35,6 +38,7 @@ class ZUTimelineService : public ZU::ZUModule {
 
  private:
   std::shared_ptr<Timeline> fTimeline;
+  std::shared_ptr<ko::EventLoop> fTeller;  // one thread: the entries in order
 };
 
 }  // namespace robotsim
