@@ -34,8 +34,6 @@ Host::Host(HostOptions options) : fSession(std::make_shared<ko::Session>()) {
   if (!options.listen.empty() && !options.connect.empty())
     throw HostError("A host listens or connects, not both");
   try {
-    if (!options.listen.empty())
-      fEndpoint = fSession->listen(options.listen, options.remote);
     if (!options.connect.empty()) {
       fSession->connect(options.connect, options.remote);
       fEndpoint = options.connect;
@@ -50,6 +48,14 @@ Host::Host(HostOptions options) : fSession(std::make_shared<ko::Session>()) {
   if (!options.postureFamily.empty())
     ZU::ZUProxy("ZURobotPosture", fRobot->broker())
         .call<void>("setPostureFamily", options.postureFamily);
+  // Only once the robot's services stand: a process that connects at once (a host of modules
+  // waiting for this robot to come back) looks them up as soon as the link is up.
+  try {
+    if (!options.listen.empty())
+      fEndpoint = fSession->listen(options.listen, options.remote);
+  } catch (const ko::Error& e) {
+    throw HostError(e.what());
+  }
 }
 
 robotsim::Robot& Host::robot() {
