@@ -17,11 +17,11 @@ endfunction()
 
 # A unit-test executable registered with CTest.
 function(mokuto_test name)
-  cmake_parse_arguments(T "" "" "SOURCES;LIBS" ${ARGN})
+  cmake_parse_arguments(T "" "" "SOURCES;LIBS;PROPERTIES" ${ARGN})
   add_executable(${name} ${T_SOURCES})
   mokuto_warnings(${name})
   target_link_libraries(${name} PRIVATE ${T_LIBS} GTest::gmock GTest::gtest_main)
   # The framework's threads keep normal scheduling in tests, unless a test asks.
   gtest_discover_tests(${name} NO_PRETTY_VALUES DISCOVERY_TIMEOUT 60
-    PROPERTIES TIMEOUT 120 ENVIRONMENT KO_REALTIME_PRIORITY=0)
+    PROPERTIES TIMEOUT 120 ENVIRONMENT KO_REALTIME_PRIORITY=0 ${T_PROPERTIES})
 endfunction()
