@@ -405,6 +405,10 @@ def french(args):
                        for r in records]
         for _, _, word_class, features, lemma in sorted(records):
             lexicon.add(word, word_class, features, lemma)
+            # Lefff writes the ligature as two letters ("coeur", "oeuvrer"); texts write it
+            # "cœur", "œuvrer". Both are stored, with Lefff's base form.
+            if "oe" in word:
+                lexicon.add(word.replace("oe", "œ"), word_class, features, lemma)
     print("french: %d words, %d base forms of Lefff repaired" % (lexicon.write(args.lexicon),
                                                                  len(fixes)), file=sys.stderr)
     with open(args.lexicon + ".fixes", "w", encoding="utf-8") as out:

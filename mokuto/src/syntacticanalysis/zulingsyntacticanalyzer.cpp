@@ -46,6 +46,8 @@ constexpr std::array<std::string_view, 2> kNotWords = {"non", "not"};
 // Adverbs of sequence: after a coordinating word they announce a second action ("and then
 // insert the comments").
 constexpr std::array<std::string_view, 2> kThenWords = {"then", "ensuite"};
+// What a verb of checking asks: "and check if anyone is there".
+constexpr std::array<std::string_view, 3> kIfWords = {"if", "whether", "si"};
 
 template <std::size_t N>
 bool isOneOf(std::string_view word, const std::array<std::string_view, N>& words) {
@@ -552,7 +554,8 @@ class StructureBuilder {
   // requirements", "build it with dpkg-buildpackage and run lintian"), and so does any
   // word that can be a verb after "then" ("and then insert the comments"); a word that can
   // be a verb before a known noun, or written with a capital, stays a noun ("the directory
-  // and file names", "et Chapitre 9").
+  // and file names", "et Chapitre 9"). A quantifier between a subject that begins its clause
+  // and a verb is an adverb of that verb ("and they all have").
   void xSpacedRoles() {
     enum class List : std::uint8_t { None, Nominal, Verbal };
     const auto listOf = [](Role role) {
@@ -570,9 +573,12 @@ class StructureBuilder {
     Role previous = Role::Conjunction;
     Role lastContent = Role::Conjunction;
     std::string_view previousWord;
+    bool subjectBefore = false;  // the word before is a pronoun that begins its clause
     for (std::size_t t = 0; t < fTokens.size(); ++t) {
       Token& token = fTokens[t];
+      const bool beginsClause = clauseStart || t == 0 || !xIsWord(t - 1);
       if (token.type != Token::Word) {
+        subjectBefore = false;
         verbContext = false;
         clauseStart = token.type == Token::Comma;
         then = false;
@@ -581,6 +587,7 @@ class StructureBuilder {
         continue;
       }
       if (token.coordination != Coordination::None) {
+        subjectBefore = false;
         verbContext = false;
         clauseStart = true;
         then = false;
@@ -621,16 +628,29 @@ class StructureBuilder {
             !next.has(WORD_CLASS_NOUN) && !next.has(WORD_CLASS_ADJECTIVE))
           role = Role::Clitic;
       }
-      // "de" before an infinitive is its preposition ("et de déboguer"), not a partitive.
+      if (role == Role::Determiner && subjectBefore &&
+          (token.has(WORD_CLASS_ADVERB) || token.has(WORD_CLASS_PRONOUN)) && xIsWord(t + 1) &&
+          (fTokens[t + 1].has(WORD_CLASS_VERB) || fTokens[t + 1].has(WORD_CLASS_AUXILIARY)))
+        role = Role::Adverb;
+      // "de" before an infinitive, its object pronoun between or not, is its preposition
+      // ("et de déboguer", "et de le mentionner"), not a partitive.
       if (role == Role::Determiner && token.has(WORD_CLASS_PREPOSITION) &&
           (token.lower == "de" || token.lower == "d") && xIsWord(t + 1) &&
-          fTokens[t + 1].infinitive)
+          (fTokens[t + 1].infinitive || (fTokens[t + 1].has(WORD_CLASS_PRONOUN_COMP) &&
+                                         xIsWord(t + 2) && fTokens[t + 2].infinitive)))
         role = Role::Preposition;
+      // A pronoun that can be an object, between a subject and its verb, is the verb's
+      // ("et vous vous apprêtez", "nous nous levons").
+      if (role == Role::Pronoun && previous == Role::Pronoun && t > 0 && xIsWord(t - 1) &&
+          token.has(WORD_CLASS_PRONOUN_COMP) && xIsWord(t + 1) &&
+          (fTokens[t + 1].has(WORD_CLASS_VERB) || fTokens[t + 1].has(WORD_CLASS_AUXILIARY)))
+        role = Role::Clitic;
       // The answer "No." or "No, ..." rather than the determiner of "no file".
       if (role == Role::Determiner && token.negativeDeterminer &&
           token.has(WORD_CLASS_INTERJECTION) && !xIsWord(t + 1))
         role = Role::Interjection;
       token.role = role;
+      subjectBefore = role == Role::Pronoun && beginsClause;
       clauseStart = clauseStart && role == Role::Adverb;
       then = clauseStart && (then || isOneOf(token.lower, kThenWords));
       verbContext = role == Role::Pronoun || role == Role::Auxiliary || role == Role::Clitic ||
@@ -913,7 +933,7 @@ class StructureBuilder {
   // Two clauses, not a list, where the group after the coordinating word
   // - begins with a question word or "que" ("learn how it works and how you can help",
   //   "si vous n'êtes pas un porteur et que vous utilisez");
-  // - is a lone word that can be a verb followed by its object, an adverb or "by", a
+  // - is a lone word that can be a verb followed by its object, an adverb, "by" or "if", a
   //   participle followed by a preposition, a lone word that is first a verb followed by
   //   a preposition where the first item follows a verb, an infinitive followed by a
   //   preposition where the last verb group before the first item is a verb of a tense
@@ -921,7 +941,7 @@ class StructureBuilder {
   //   responsable"), or an unknown word followed by an object pronoun or a determiner: a
   //   second action ("type your name and press the Enter key", "put in the archive and
   //   run by dpkg", "provided by the team and sent to the list", "it does more and comes
-  //   with examples", "unpack it and repack it");
+  //   with examples", "unpack it and repack it", "book a holiday and check if");
   // - begins with a verb that is first a verb, when the first item follows a verb ("copy
   //   the files and run the tool");
   // - or is a subject, followed by a verb (after a comma, past its prepositional
@@ -962,7 +982,8 @@ class StructureBuilder {
       return true;
     if (single && ((canBeVerb && (objectAfter || after == Role::Determiner || after == Role::Noun ||
                                   after == Role::Adverb || after == Role::Adjective ||
-                                  isOneOf(fTokens[next].lower, kAgentWords))) ||
+                                  isOneOf(fTokens[next].lower, kAgentWords) ||
+                                  isOneOf(fTokens[next].lower, kIfWords))) ||
                    (after == Role::Preposition &&
                     (lone.participle || (lone.firstClass == WORD_CLASS_VERB && afterVerb) ||
                      (lone.infinitive && leftInfinitive))) ||
