@@ -480,21 +480,12 @@ TEST(ServiceOnTheRobot, TheTimingCheckerFramesTheEndEventAndComesBackWhenSwitche
 // ---- the module library -------------------------------------------------------------------
 
 TEST(ServiceLibrary, TheHostLoadsItAndItsEntryPointsAnswerZero) {
+  // The texts spoken through the library loaded by a host are the remote processes' tests'.
   zefoko::HostOptions options;
   options.robot.speech.backend = robotsim::ZUTextToSpeechOptions::Backend::Timing;
-  options.robot.speech.playbackRate = robotsim::kSpeechAsFastAsPossible;
   zefoko::Host host(options);
   ASSERT_EQ(host.loadModuleLibrary(ZUMOKUTO_PLUGIN), std::vector<std::string>{"ZUMokuto"});
   const ZU::ZUProxy mokuto("ZUMokuto", host.broker());
-  mokuto.call("setBodyLanguageModeFromStr", std::string("disabled"));
-  mokuto.call("say", std::string("Hello from the library."));
-  bool ended = false;
-  for (const auto& entry : host.robot().timeline()->entries("ZUMemory", "raiseEvent")) {
-    ended =
-        ended || entry.arguments.to<std::vector<ko::AnyValue>>().at(0).to<std::string>() == kEnd;
-  }
-  EXPECT_TRUE(ended);
-
   void* library = ::dlopen(ZUMOKUTO_PLUGIN, RTLD_NOW | RTLD_NOLOAD);
   ASSERT_NE(library, nullptr);
   const auto close =
