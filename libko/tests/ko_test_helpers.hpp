@@ -1,10 +1,17 @@
 #pragma once
-// Synchronisation helpers of the ko tests: every wait is bounded.
+// Helpers of the tests: synchronisation (every wait is bounded) and scratch folders.
+
+#include <stdlib.h>
 
 #include <chrono>
 #include <condition_variable>
+#include <filesystem>
+#include <fstream>
 #include <functional>
 #include <mutex>
+#include <stdexcept>
+#include <string>
+#include <system_error>
 #include <thread>
 
 namespace ko::test {
@@ -68,5 +75,37 @@ inline bool eventually(const std::function<bool()>& pred) {
   }
   return true;
 }
+
+// A temporary folder for one test, deleted with everything in it at the end of its scope.
+class ScratchFolder {
+ public:
+  ScratchFolder() {
+    std::string pattern = (std::filesystem::temp_directory_path() / "kotest-XXXXXX").string();
+    if (!::mkdtemp(pattern.data()))
+      throw std::runtime_error("cannot create a temporary folder");
+    path_ = pattern;
+  }
+  ~ScratchFolder() {
+    std::error_code ec;
+    std::filesystem::remove_all(path_, ec);
+  }
+  ScratchFolder(const ScratchFolder&) = delete;
+  ScratchFolder& operator=(const ScratchFolder&) = delete;
+
+  const std::filesystem::path& path() const noexcept { return path_; }
+  // Writes `text` to the file at `relative` (folders made as needed); answers its path.
+  std::string write(const std::string& relative, const std::string& text) const {
+    const auto file = path_ / relative;
+    std::filesystem::create_directories(file.parent_path());
+    std::ofstream out(file, std::ios::binary | std::ios::trunc);
+    out << text;
+    if (!out)
+      throw std::runtime_error("cannot write " + file.string());
+    return file.string();
+  }
+
+ private:
+  std::filesystem::path path_;
+};
 
 }  // namespace ko::test

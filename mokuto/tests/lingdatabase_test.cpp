@@ -228,7 +228,7 @@ TEST_F(LingDatabaseTest, TruncatedAndOutOfDateFilesAreRefused) {
   EXPECT_TRUE(capture->contains(
       kCategory, ko::log::Warning,
       "Linguistic database \"" + path + "\" is out of date. So, the database is not loaded."));
-  const std::string missing = (folder_.dir / "missing.bdb").string();
+  const std::string missing = (folder_.path() / "missing.bdb").string();
   EXPECT_FALSE(db.load(missing));
   EXPECT_TRUE(capture->contains(kCategory, ko::log::Warning,
                                 "Linguistic database \"" + missing + "\" not found."));
@@ -281,7 +281,7 @@ TEST(LingLexiconTest, MalformedLinesAreRefusedWithTheirLine) {
 
 TEST_F(LingDatabaseTest, SetLanguageSharesReloadsAndDrops) {
   const std::string french = write("french.bdb", build(kLexicon));
-  const std::string missing = (folder_.dir / "nothing.bdb").string();
+  const std::string missing = (folder_.path() / "nothing.bdb").string();
   auto languages = std::make_shared<const ZU::ZULingLanguageMap>(
       ZU::ZULingLanguageMap{{"French", french}, {"fr_FR", french}, {"Missing", missing}});
   ZU::ZULingDatabaseUser analyzer(languages);

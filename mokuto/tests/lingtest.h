@@ -2,15 +2,11 @@
 // Linguistic databases for the tests: small lexicons built by mkbdb into files of a folder
 // of their own, which goes with the object. One thread.
 
-#include <unistd.h>
-
-#include <atomic>
 #include <cstdint>
-#include <filesystem>
-#include <fstream>
 #include <sstream>
 #include <string>
 
+#include "ko_test_helpers.hpp"
 #include "mkbdb/writer.h"
 
 namespace lingtest {
@@ -25,24 +21,9 @@ inline std::string build(const std::string& lexiconText, const mkbdb::Options& o
   return mkbdb::build(lexicon, options, report ? *report : local);
 }
 
-class Folder {
+// A scratch folder that also writes databases.
+class Folder : public ko::test::ScratchFolder {
  public:
-  Folder() {
-    static std::atomic<int> counter{0};
-    dir = std::filesystem::temp_directory_path() /
-          ("lingtest-" + std::to_string(::getpid()) + "-" + std::to_string(counter++));
-    std::filesystem::create_directories(dir);
-  }
-  ~Folder() { std::filesystem::remove_all(dir); }
-  Folder(const Folder&) = delete;
-  Folder& operator=(const Folder&) = delete;
-
-  // Writes these bytes under that name; answers the file's path.
-  std::string write(const std::string& name, const std::string& bytes) const {
-    const std::string path = (dir / name).string();
-    std::ofstream(path, std::ios::binary | std::ios::trunc) << bytes;
-    return path;
-  }
   // Writes the database of a lexicon text with that flag; answers its path.
   std::string database(const std::string& name, const std::string& lexiconText,
                        std::uint8_t flag) const {
@@ -50,8 +31,6 @@ class Folder {
     options.flag = flag;
     return write(name, build(lexiconText, options));
   }
-
-  std::filesystem::path dir;
 };
 
 }  // namespace lingtest

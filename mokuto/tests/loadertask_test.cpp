@@ -25,7 +25,6 @@
 #include "robotbodytalk/zurobotbodytalk.h"
 #include "robotsim/robot.h"
 #include "support/fake_robot.h"
-#include "support/scratch_folder.h"
 #include "support/timeline_waiter.h"
 #include "zu/zubroker.h"
 #include "zu/zumodule.h"
@@ -166,7 +165,7 @@ class LoaderOnRobot : public testing::Test {
     return count;
   }
 
-  robotsim::simtest::ScratchFolder library;
+  ko::test::ScratchFolder library;
   std::optional<robotsim::Robot> robot;
   std::shared_ptr<ZU::ZURobotBodyTalkInstance> bodyTalk;
   std::shared_ptr<LoaderTask> loader;

@@ -14,9 +14,9 @@
 #include <sndfile.h>
 
 #include "ko/path.hpp"
+#include "ko_test_helpers.hpp"
 #include "robotsim/robot.h"
 #include "robotsim/soundlibrary.h"
-#include "support/scratch_folder.h"
 #include "support/timeline_waiter.h"
 #include "zu/zuerror.h"
 #include "zu/zuproxy.h"
@@ -26,7 +26,7 @@ namespace robotsim {
 namespace {
 
 namespace fs = std::filesystem;
-using simtest::ScratchFolder;
+using ko::test::ScratchFolder;
 using testing::ElementsAre;
 using testing::HasSubstr;
 

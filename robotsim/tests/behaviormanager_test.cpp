@@ -27,7 +27,6 @@
 #include "robotsim/jointmodel.h"
 #include "robotsim/robot.h"
 #include "robotsim/zubehaviormanager.h"
-#include "support/scratch_folder.h"
 #include "support/timeline_waiter.h"
 #include "zu/zubroker.h"
 #include "zu/zuerror.h"
@@ -38,7 +37,7 @@ namespace robotsim {
 namespace {
 
 namespace fs = std::filesystem;
-using simtest::ScratchFolder;
+using ko::test::ScratchFolder;
 using testing::ElementsAre;
 using testing::HasSubstr;
 using Behaviors = std::vector<std::pair<std::string, std::string>>;  // path, descriptor

@@ -13,14 +13,14 @@
 
 #include <gtest/gtest.h>
 
+#include "ko_test_helpers.hpp"
 #include "robotsim/performanceaudio.h"
-#include "support/scratch_folder.h"
 
 namespace robotsim {
 namespace {
 
 namespace fs = std::filesystem;
-using simtest::ScratchFolder;
+using ko::test::ScratchFolder;
 
 constexpr double kPi = 3.14159265358979;
 constexpr int kSoundRate = 16000;  // as the sound library's files

@@ -2,7 +2,6 @@
 // spoken end to end across three processes (and from a Python script), and the processes
 // that die: the robot's mid-text, a caller's mid-say, the listening one restarted.
 #include <gtest/gtest.h>
-#include <unistd.h>
 
 #include <filesystem>
 #include <fstream>
@@ -34,15 +33,6 @@ const std::string kText =
 
 class RemoteProcesses : public ::testing::Test {
  protected:
-  void SetUp() override {
-    folder = std::filesystem::temp_directory_path() /
-             ("zefoko_remote_" + std::to_string(::getpid()) + "_" +
-              ::testing::UnitTest::GetInstance()->current_test_info()->name());
-    std::filesystem::create_directories(folder);
-    endpoint = "ipc://" + (folder / "robot").string();
-  }
-  void TearDown() override { std::filesystem::remove_all(folder); }
-
   std::unique_ptr<ChildProcess> startRobot(bool fast) {
     std::vector<std::string> argv{ZEFOKO_EXECUTABLE, "serve",  "--listen",    endpoint,
                                   "--speech",        "timing", "--heartbeat", "200"};
@@ -79,8 +69,9 @@ class RemoteProcesses : public ::testing::Test {
     return actions;
   }
 
-  std::filesystem::path folder;
-  std::string endpoint;
+  ko::test::ScratchFolder scratch;
+  const std::filesystem::path& folder = scratch.path();
+  const std::string endpoint = "ipc://" + (folder / "robot").string();
 };
 
 TEST_F(RemoteProcesses, ATextGivesTheSameActionsAndEndAcrossThreeProcessesAsInOne) {

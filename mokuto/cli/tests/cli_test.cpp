@@ -2,7 +2,6 @@
 // arguments, its status, its output and the files it writes.
 #include <gtest/gtest.h>
 #include <sndfile.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <cmath>
@@ -17,6 +16,7 @@
 
 #include <nlohmann/json.hpp>
 
+#include "ko_test_helpers.hpp"
 #include "ko_test_process.hpp"
 
 namespace {
@@ -62,14 +62,6 @@ std::string commandLine(const std::string& arguments) {
 
 class MokutoCommand : public ::testing::Test {
  protected:
-  void SetUp() override {
-    folder = std::filesystem::temp_directory_path() /
-             ("mokuto_cli_" + std::to_string(::getpid()) + "_" +
-              ::testing::UnitTest::GetInstance()->current_test_info()->name());
-    std::filesystem::create_directories(folder);
-  }
-  void TearDown() override { std::filesystem::remove_all(folder); }
-
   Ran run(const std::string& arguments, const std::string& input = {}) const {
     std::string command = commandLine(arguments);
     command += input.empty() ? " </dev/null" : " <" + quoted((folder / "in.txt").string());
@@ -93,7 +85,8 @@ class MokutoCommand : public ::testing::Test {
     return lines;
   }
 
-  std::filesystem::path folder;
+  ko::test::ScratchFolder scratch;
+  const std::filesystem::path& folder = scratch.path();
 };
 
 // Index of the first entry that `match` accepts at or after `from`, or -1.

@@ -1,14 +1,11 @@
 #include "director_rig.h"
 
-#include <atomic>
 #include <chrono>
 #include <condition_variable>
 #include <fstream>
 #include <mutex>
 #include <sstream>
 #include <utility>
-
-#include <unistd.h>
 
 #include "ko/reaper.hpp"
 #include "ko/session.hpp"
@@ -64,14 +61,10 @@ std::string firstArgument(const robotsim::TimelineEntry& entry) {
 
 }  // namespace
 
-fs::path makeGestureLibrary() {
-  static std::atomic<int> serial{0};
-  const fs::path root =
-      fs::temp_directory_path() /
-      ("mokuto-director-" + std::to_string(::getpid()) + "-" + std::to_string(serial.fetch_add(1)));
+const std::string& writeGestureLibrary(const ko::test::ScratchFolder& folder) {
   for (const auto& gesture : kGestures)
-    writeGesture(root, gesture);
-  return root;
+    writeGesture(folder.path(), gesture);
+  return folder.path().native();
 }
 
 // Wakes the waiters at each timeline entry; lives as long as the timeline.
@@ -80,12 +73,12 @@ struct DirectorRig::Waiter {
   std::condition_variable recorded;
 };
 
-DirectorRig::DirectorRig(Speech kind, bool director)
-    : fLibrary(makeGestureLibrary()), fWaiter(std::make_shared<Waiter>()) {
+DirectorRig::DirectorRig(Speech kind, bool director) : fWaiter(std::make_shared<Waiter>()) {
   using ZU::ZUModule;
+  const std::string& library = writeGestureLibrary(fLibrary);
   if (kind == Speech::Espeak) {
     robotsim::RobotOptions options;
-    options.behaviorsRoot = fLibrary.string();
+    options.behaviorsRoot = library;
     fRobot = std::make_unique<robotsim::Robot>(options);
     broker = fRobot->broker();
     timeline = fRobot->timeline();
@@ -97,7 +90,7 @@ DirectorRig::DirectorRig(Speech kind, bool director)
     fServices.push_back(ZUModule::createModule<robotsim::ZUMemory>(broker, "ZUMemory", memory));
     fServices.push_back(ZUModule::createModule<robotsim::ZUMotion>(broker, "ZUMotion", timeline));
     fServices.push_back(ZUModule::createModule<robotsim::ZUBehaviorManager>(
-        broker, "ZUBehaviorManager", timeline, fLibrary.string()));
+        broker, "ZUBehaviorManager", timeline, library));
     fServices.push_back(
         ZUModule::createModule<robotsim::ZUAudioPlayer>(broker, "ZUAudioPlayer", timeline));
     fServices.push_back(
@@ -132,8 +125,6 @@ DirectorRig::~DirectorRig() {
   speech.reset();
   broker.reset();
   ko::waitForReaper();
-  std::error_code ec;
-  fs::remove_all(fLibrary, ec);
 }
 
 std::shared_ptr<robotsim::ZUTextToSpeech> DirectorRig::espeak() const {

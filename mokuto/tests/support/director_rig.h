@@ -17,6 +17,7 @@
 #include <vector>
 
 #include "director_host.h"
+#include "ko_test_helpers.hpp"
 #include "mokuto/mktaskinstruction.h"
 #include "mokuto/mokutoconfig.h"
 #include "robotsim/timeline.h"
@@ -39,9 +40,8 @@ inline constexpr const char* kLongB = "animations/Stand/Gestures/Long_2";   // 3
 inline constexpr const char* kLongC = "animations/Stand/Gestures/Long_3";   // 30 s
 inline constexpr const char* kEnd = "animations/Stand/Gestures/End_1";      // 0.2 s
 
-// Writes the gestures above, each on joints of its own, into a new temporary folder, and
-// answers it.
-std::filesystem::path makeGestureLibrary();
+// Writes the gestures above, each on joints of its own, into the folder; answers its path.
+const std::string& writeGestureLibrary(const ko::test::ScratchFolder& folder);
 
 class DirectorRig {
  public:
@@ -78,7 +78,7 @@ class DirectorRig {
  private:
   struct Waiter;
 
-  std::filesystem::path fLibrary;
+  ko::test::ScratchFolder fLibrary;
   std::unique_ptr<robotsim::Robot> fRobot;                   // Speech::Espeak
   std::vector<std::shared_ptr<ZU::ZUModuleCore>> fServices;  // in start order
   std::shared_ptr<Waiter> fWaiter;

@@ -33,13 +33,12 @@ struct ServiceRig::Waiter {
 ServiceRig::ServiceRig(double scale)
     : clock(std::make_shared<DrivenClock>(scale)),
       faults(std::make_shared<robotsim::FaultPlan>(std::vector<robotsim::Fault>{}, scale)),
-      fLibrary(makeGestureLibrary()),
       fWaiter(std::make_shared<Waiter>()) {
   robotsim::RobotOptions options;
   options.speech.backend = robotsim::ZUTextToSpeechOptions::Backend::Timing;
   options.speech.playbackRate = robotsim::kSpeechAsFastAsPossible;
   options.speech.recordAudio = false;
-  options.behaviorsRoot = fLibrary.string();
+  options.behaviorsRoot = writeGestureLibrary(fLibrary);
   options.faults = faults;
   robot = std::make_unique<robotsim::Robot>(options);
   robot->timeline()->addListener([waiter = fWaiter](const robotsim::TimelineEntry&) {
@@ -72,8 +71,6 @@ ServiceRig::~ServiceRig() {
   mokuto.reset();
   robot.reset();
   ko::waitForReaper();
-  std::error_code ec;
-  std::filesystem::remove_all(fLibrary, ec);
 }
 
 std::future<void> ServiceRig::sayAsync(const std::string& text, const ZU::ZUValue& configuration) {

@@ -10,7 +10,6 @@
 
 #include <chrono>
 #include <cstddef>
-#include <filesystem>
 #include <functional>
 #include <future>
 #include <memory>
@@ -18,6 +17,7 @@
 #include <string>
 
 #include "driven_clock.h"
+#include "ko_test_helpers.hpp"
 #include "mokuto/zumokuto.h"
 #include "robotsim/faults.h"
 #include "robotsim/robot.h"
@@ -58,7 +58,7 @@ class ServiceRig {
   };
   struct Waiter;
 
-  std::filesystem::path fLibrary;
+  ko::test::ScratchFolder fLibrary;
   std::shared_ptr<Hook> fHook = std::make_shared<Hook>();
   std::shared_ptr<Waiter> fWaiter;
 };

@@ -194,7 +194,8 @@ void FakeRobotPosture::setFamily(const std::string& family) {
 
 FakeMemory::FakeMemory(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
     : ZU::ZUModule(broker, name) {
-  bindMethods("FakeMemory", {{"subscribeToEvent", &FakeMemory::subscribeToEvent},
+  bindMethods("FakeMemory", {{"declareEvent", &FakeMemory::declareEvent},
+                             {"subscribeToEvent", &FakeMemory::subscribeToEvent},
                              {"unsubscribeToEvent", &FakeMemory::unsubscribeToEvent}});
 }
 

@@ -137,6 +137,9 @@ class FakeRobotPosture : public ZU::ZUModule {
 class FakeMemory : public ZU::ZUModule {
  public:
   FakeMemory(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name);
+  void declareEvent(const std::string& key, const std::string& module) {
+    log.add("declareEvent", {key, module});
+  }
   void subscribeToEvent(const std::string& name, const std::string& callbackModule,
                         const std::string& callbackMethod);
   void unsubscribeToEvent(const std::string& name, const std::string& callbackModule);

@@ -1,6 +1,7 @@
 // The calls that a module's page may ask for: one call with literal arguments, parsed
 // strictly; everything else refused with the reason and where. And the addresses that the
-// pages are served at.
+// pages are served at. The viewer's page of a recorded performance: everything inside it,
+// nothing that the performance's own texts could close or run.
 #include <gtest/gtest.h>
 
 #include <string>
@@ -9,6 +10,7 @@
 #include "evalcall.h"
 #include "httpserver.h"
 #include "ko/json.hpp"
+#include "zefoko/viewer.h"
 
 namespace zefoko {
 namespace {
@@ -91,12 +93,18 @@ TEST(HttpAddress, ReadsAddressAndPortAndTellsLoopback) {
     bool loopback;
   };
   const std::vector<Case> cases = {
-      {"127.0.0.1:8080", "127.0.0.1", 8080, true}, {"localhost:0", "localhost", 0, true},
-      {"[::1]:65535", "::1", 65535, true},         {"127.1.2.3:80", "127.1.2.3", 80, true},
-      {"0.0.0.0:8080", "0.0.0.0", 8080, false},    {"[::]:8080", "::", 8080, false},
-      {"192.168.1.2:1", "192.168.1.2", 1, false},  {"8080", "", 0, false},
-      {"127.0.0.1:", "", 0, false},                {":8080", "", 0, false},
-      {"127.0.0.1:65536", "", 0, false},           {"127.0.0.1:80a", "", 0, false},
+      {"127.0.0.1:8080", "127.0.0.1", 8080, true},
+      {"localhost:0", "localhost", 0, true},
+      {"[::1]:65535", "::1", 65535, true},
+      {"127.1.2.3:80", "127.1.2.3", 80, true},
+      {"0.0.0.0:8080", "0.0.0.0", 8080, false},
+      {"[::]:8080", "::", 8080, false},
+      {"192.168.1.2:1", "192.168.1.2", 1, false},
+      {"8080", "", 0, false},
+      {"127.0.0.1:", "", 0, false},
+      {":8080", "", 0, false},
+      {"127.0.0.1:65536", "", 0, false},
+      {"127.0.0.1:80a", "", 0, false},
       {"[::1:80", "", 0, false},
   };
   for (const auto& c : cases) {
@@ -109,6 +117,43 @@ TEST(HttpAddress, ReadsAddressAndPortAndTellsLoopback) {
     EXPECT_EQ(options.address, c.address);
     EXPECT_EQ(options.port, c.port);
     EXPECT_EQ(isLoopbackAddress(options.address), c.loopback);
+  }
+}
+
+std::size_t count(const std::string& text, const std::string& part) {
+  std::size_t n = 0;
+  for (auto at = text.find(part); at != std::string::npos; at = text.find(part, at + 1))
+    ++n;
+  return n;
+}
+
+TEST(ViewerPage, HoldsTheAudioAndTheTimelineAndEscapesTheTexts) {
+  struct Case {
+    std::string wav;
+    std::string audio;  // as the page holds it
+  };
+  const std::vector<Case> cases = {{"abc", "YWJj"}, {"ab", "YWI="}, {"a", "YQ=="}, {"", ""}};
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.wav);
+    viewer::RecordedPerformance performance;
+    performance.title = "say <b>";
+    performance.text = "Hi </script><script>alert('x')</script> & bye";
+    performance.entries.push_back({{"us", 5},
+                                   {"service", "ZUMemory"},
+                                   {"operation", "raiseEvent"},
+                                   {"arguments", {"</script><!--", 1}}});
+    performance.wav = c.wav;
+    const std::string page = viewer::performancePage(performance);
+    EXPECT_NE(page.find("src=\"data:audio/wav;base64," + c.audio + "\""), std::string::npos);
+    EXPECT_NE(page.find("<h1>say &lt;b&gt;</h1>"), std::string::npos);
+    EXPECT_NE(
+        page.find("Hi &lt;/script&gt;&lt;script&gt;alert(&#39;x&#39;)&lt;/script&gt; &amp; bye"),
+        std::string::npos);
+    EXPECT_NE(page.find(R"(["\u003c/script>\u003c!--",1])"), std::string::npos);
+    // The page's own two scripts, and no other.
+    EXPECT_EQ(count(page, "<script"), 2u);
+    EXPECT_EQ(count(page, "</script>"), 2u);
+    EXPECT_EQ(page.find("{{"), std::string::npos);
   }
 }
 
