@@ -37,7 +37,8 @@ void writeTone(const fs::path& file, double silence, double seconds, double ampl
   const auto quiet = static_cast<std::size_t>(silence * kSoundRate);
   std::vector<float> samples(quiet + static_cast<std::size_t>(seconds * kSoundRate), 0.0F);
   for (std::size_t i = quiet; i < samples.size(); ++i)
-    samples[i] = static_cast<float>(amplitude * std::sin(2 * kPi * 440.0 * static_cast<double>(i) / kSoundRate));
+    samples[i] = static_cast<float>(
+        amplitude * std::sin(2 * kPi * 440.0 * static_cast<double>(i) / kSoundRate));
   sf_write_float(sound, samples.data(), static_cast<sf_count_t>(samples.size()));
   sf_close(sound);
 }
@@ -84,28 +85,76 @@ TEST(PerformanceAudio, MixesEverySoundAtItsTime) {
   const double tone = 0.5 / std::sqrt(2.0);  // the RMS of the tone at full volume
   const auto none = std::nullopt;
   const std::vector<MixCase> cases = {
-      {"a sound at its time, at its volume", {{"tone.wav", 0.2, none, 0.5, false, 0}}, none, 0.6,
-       0.6, {{0.0, 0.19, 0}, {0.21, 0.49, tone / 2}, {0.51, 0.6, 0}}, -1},
-      {"a stopped sound cut at its stop", {{"tone.wav", 0.1, 0.25, 1, false, 0}}, none, 0.4, 0.4,
-       {{0.11, 0.24, tone}, {0.26, 0.4, 0}}, -1},
-      {"a sound past the end lengthens the mix", {{"tone.wav", 0.2, none, 1, false, 0}}, none, 0.1,
-       0.5, {{0.21, 0.49, tone}}, -1},
-      {"a loop until the end", {{"short.wav", 0, none, 1, true, 0}}, none, 0.5, 0.5,
-       {{0.01, 0.49, tone}}, -1},
-      {"played from a position", {{"late.wav", 0.0, none, 1, false, 0.2}}, none, 0.3, 0.3,
-       {{0.01, 0.19, tone}, {0.21, 0.3, 0}}, -1},
-      {"a sound begun before the start is heard from the start",
-       {{"tone.wav", -0.2, none, 1, false, 0}}, none, 0.2, 0.2, {{0.01, 0.09, tone}, {0.11, 0.2, 0}},
+      {"a sound at its time, at its volume",
+       {{"tone.wav", 0.2, none, 0.5, false, 0}},
+       none,
+       0.6,
+       0.6,
+       {{0.0, 0.19, 0}, {0.21, 0.49, tone / 2}, {0.51, 0.6, 0}},
        -1},
-      {"the speech at its time", {}, 0.05, 0.2, 0.2,
-       {{0, 0.049, 0}, {0.05, 0.15, 0.5}, {0.151, 0.2, 0}}, -1},
-      {"the speech and a sound add up", {{"tone.wav", 0.0, none, 1, false, 0}}, 0.0, 0.1, 0.3,
-       {{0.0, 0.1, std::sqrt(0.25 + tone * tone)}}, -1},
+      {"a stopped sound cut at its stop",
+       {{"tone.wav", 0.1, 0.25, 1, false, 0}},
+       none,
+       0.4,
+       0.4,
+       {{0.11, 0.24, tone}, {0.26, 0.4, 0}},
+       -1},
+      {"a sound past the end lengthens the mix",
+       {{"tone.wav", 0.2, none, 1, false, 0}},
+       none,
+       0.1,
+       0.5,
+       {{0.21, 0.49, tone}},
+       -1},
+      {"a loop until the end",
+       {{"short.wav", 0, none, 1, true, 0}},
+       none,
+       0.5,
+       0.5,
+       {{0.01, 0.49, tone}},
+       -1},
+      {"played from a position",
+       {{"late.wav", 0.0, none, 1, false, 0.2}},
+       none,
+       0.3,
+       0.3,
+       {{0.01, 0.19, tone}, {0.21, 0.3, 0}},
+       -1},
+      {"a sound begun before the start is heard from the start",
+       {{"tone.wav", -0.2, none, 1, false, 0}},
+       none,
+       0.2,
+       0.2,
+       {{0.01, 0.09, tone}, {0.11, 0.2, 0}},
+       -1},
+      {"the speech at its time",
+       {},
+       0.05,
+       0.2,
+       0.2,
+       {{0, 0.049, 0}, {0.05, 0.15, 0.5}, {0.151, 0.2, 0}},
+       -1},
+      {"the speech and a sound add up",
+       {{"tone.wav", 0.0, none, 1, false, 0}},
+       0.0,
+       0.1,
+       0.3,
+       {{0.0, 0.1, std::sqrt(0.25 + tone * tone)}},
+       -1},
       {"a sum beyond full scale is clipped",
-       {{"loud.wav", 0, none, 1, false, 0}, {"loud.wav", 0, none, 1, false, 0}}, none, 0.2, 0.2, {},
+       {{"loud.wav", 0, none, 1, false, 0}, {"loud.wav", 0, none, 1, false, 0}},
+       none,
+       0.2,
+       0.2,
+       {},
        32767},
-      {"an unreadable file is left out", {{"broken.wav", 0, none, 1, false, 0}}, none, 0.1, 0.1,
-       {{0, 0.1, 0}}, -1},
+      {"an unreadable file is left out",
+       {{"broken.wav", 0, none, 1, false, 0}},
+       none,
+       0.1,
+       0.1,
+       {{0, 0.1, 0}},
+       -1},
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(c.name);
@@ -128,11 +177,12 @@ TEST(PerformanceAudio, MixesEverySoundAtItsTime) {
       sounds.push_back(sound);
     }
     std::vector<std::string> skipped;
-    const PerformanceAudio audio = mixPerformanceAudio(
-        speech, sounds, 0, static_cast<std::int64_t>(c.toS * 1e6), &skipped);
+    const PerformanceAudio audio =
+        mixPerformanceAudio(speech, sounds, 0, static_cast<std::int64_t>(c.toS * 1e6), &skipped);
     EXPECT_EQ(audio.sampleRate, kSpeechRate);
     EXPECT_NEAR(audio.seconds(), c.seconds, 0.002);
-    EXPECT_EQ(skipped.size(), std::string(c.name).find("unreadable") != std::string::npos ? 1u : 0u);
+    EXPECT_EQ(skipped.size(),
+              std::string(c.name).find("unreadable") != std::string::npos ? 1u : 0u);
     for (const auto& l : c.loudness) {
       SCOPED_TRACE(std::to_string(l.from) + " s to " + std::to_string(l.to) + " s");
       EXPECT_NEAR(rms(audio, l.from, l.to), l.rms, 0.02 + l.rms * 0.05);
