@@ -578,6 +578,7 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"English", "It does more and comes with examples.", false},
       {"English", "Follow the guide provided by the team and sent to the list.", false},
       {"English", "Copy the files somewhere else and run the tool.", false},
+      {"English", "Tools aid developers and free their time.", false},
       {"English", "Build the package with dpkg-buildpackage and run lintian on it.", false},
       {"English", "Set the version with dch and then insert the comments.", false},
       {"English", "The cat and the dog are asleep.", true},

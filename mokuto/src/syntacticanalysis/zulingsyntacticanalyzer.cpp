@@ -942,8 +942,9 @@ class StructureBuilder {
   //   second action ("type your name and press the Enter key", "put in the archive and
   //   run by dpkg", "provided by the team and sent to the list", "it does more and comes
   //   with examples", "unpack it and repack it", "book a holiday and check if");
-  // - begins with a verb that is first a verb, when the first item follows a verb ("copy
-  //   the files and run the tool");
+  // - begins with a verb that is first a verb, or a word that can be one before a
+  //   determiner, when the first item follows a verb ("copy the files and run the tool",
+  //   "aid developers and free their time");
   // - or is a subject, followed by a verb (after a comma, past its prepositional
   //   groups) and without a preposition before it, while the first item does not begin a
   //   clause ("the skeleton of our package and it uses debhelper", "in the patches
@@ -960,6 +961,12 @@ class StructureBuilder {
       return true;
     const std::size_t next = group.lastToken + 1;
     const std::size_t previous = firstLeft.firstToken;
+    const bool afterVerb = previous > 0 && fGroupOfToken[previous - 1] != kNone &&
+                           fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB;
+    const bool single = group.firstToken == group.lastToken;
+    // A word that can be a verb, before its object.
+    if (!single && afterVerb && lone.infinitive && xObjectAt(group.firstToken + 1))
+      return true;
     // The last verb group before the first item: whether it has a verb of a tense ("n'est
     // pas une personne", not "se servant de gettext"), and ends in an infinitive after it
     // ("vous devriez envoyer").
@@ -971,13 +978,10 @@ class StructureBuilder {
         (fTokens[next].type != Token::Word && !(leftVerb && xInWordMark(next))))
       return false;
     const bool beginsClause = previous == 0 || xBeginsClause(previous - 1);
-    const bool afterVerb = previous > 0 && fGroupOfToken[previous - 1] != kNone &&
-                           fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB;
     const Role after = fTokens[next].type == Token::Word ? fTokens[next].role : Role::Interjection;
-    const bool single = group.firstToken == group.lastToken;
     const bool canBeVerb = lone.has(WORD_CLASS_VERB) || lone.has(WORD_CLASS_AUXILIARY);
     const bool objectAfter = after == Role::Pronoun || after == Role::Clitic;
-    // "copy the files and run the tool": a verb first, before its object.
+    // A verb first.
     if (!single && afterVerb && lone.firstClass == WORD_CLASS_VERB && lone.infinitive)
       return true;
     if (single && ((canBeVerb && (objectAfter || after == Role::Determiner || after == Role::Noun ||
