@@ -945,13 +945,14 @@ class StructureBuilder {
   // - begins with a verb that is first a verb, or a word that can be one before a
   //   determiner, when the first item follows a verb ("copy the files and run the tool",
   //   "aid developers and free their time");
-  // - or is a subject, followed by a verb (after a comma, past its prepositional
-  //   groups) and without a preposition before it, while the first item does not begin a
-  //   clause ("the skeleton of our package and it uses debhelper", "in the patches
-  //   directory and the source tree is untouched"), or the first item follows a verb or
-  //   a preposition ("I like tea and he likes coffee", "I was born in
-  //   Paris and I was happy", "it has packages for most programs, and the number of
-  //   packages is larger"), or stands alone before a comma ("there is one disk, and
+  // - or is a subject, followed by a verb (past a participle that qualifies it, with its
+  //   preposition; after a comma, past its prepositional groups) and without a
+  //   preposition before it, while the first item does not begin a clause ("the skeleton
+  //   of our package and it uses debhelper", "in the patches directory and the source
+  //   tree is untouched"), or the first item follows a verb or a preposition ("I like tea
+  //   and he likes coffee", "I was born in Paris and I was happy", "it has packages for
+  //   most programs, and the number of packages is larger", "there were problems and a
+  //   few of them were hard"), or stands alone before a comma ("there is one disk, and
   //   everything is there"; but "apples, pears, and plums are ripe" stays a list).
   bool xStartsClause(const Item& right, const Item& firstLeft, bool commaBefore,
                      std::size_t leftItems) const {
@@ -1001,23 +1002,42 @@ class StructureBuilder {
     // first item has a verb of its own: then a verb of a tense there begins the second
     // clause ("n'est pas une personne et les écrans de debconf ne parlent pas").
     std::size_t k = next;
-    while ((commaBefore || leftVerb) && k < fTokens.size() &&
-           (fGroupOfToken[k] == kNone || fGroups[fGroupOfToken[k]].kind != STRUCTURE_VERB) &&
-           ((fTokens[k].type == Token::Word &&
-             (fTokens[k].role == Role::Preposition || fTokens[k].role == Role::Adverb ||
-              ((fTokens[k].role == Role::Noun || fTokens[k].role == Role::Determiner ||
-                fTokens[k].role == Role::Adjective) &&
-               !isOneOf(fTokens[k].lower, kRelativeWords)))) ||
-            xInWordMark(k)))
+    while (k < fTokens.size()) {
+      if (fGroupOfToken[k] != kNone && fGroups[fGroupOfToken[k]].kind == STRUCTURE_VERB) {
+        // A participle that qualifies the item, before its preposition ("the pears picked
+        // in May", "all of the packages listed in this field must be"), unless the item is
+        // a lone word that can be a verb ("and get used to").
+        const std::size_t end = xParticipleGroupEnd(fGroupOfToken[k]);
+        if ((single && canBeVerb) || end == kNone || !xIsWord(end) ||
+            fTokens[end].role != Role::Preposition)
+          break;
+        k = end;
+        continue;
+      }
+      if (!commaBefore && !leftVerb)
+        break;
+      const Token& token = fTokens[k];
+      const bool skipped = token.type == Token::Word
+                               ? token.role == Role::Preposition || token.role == Role::Adverb ||
+                                     ((token.role == Role::Noun || token.role == Role::Determiner ||
+                                       token.role == Role::Adjective) &&
+                                      !isOneOf(token.lower, kRelativeWords))
+                               : xInWordMark(k);
+      if (!skipped)
+        break;
       ++k;
+    }
     if (k >= fTokens.size() || fGroupOfToken[k] == kNone ||
         fGroups[fGroupOfToken[k]].kind != STRUCTURE_VERB)
       return false;
     // Not the verb of a preposition or of a determiner ("in order to ease", "this install
-    // file").
+    // file"); but the pronoun of a preposition may come before the verb ("a few of them
+    // were").
     if (leftVerb && k != next &&
         (!xFiniteGroup(fGroupOfToken[k]) || fTokens[k - 1].type != Token::Word ||
-         fTokens[k - 1].role == Role::Preposition || fTokens[k - 1].role == Role::Determiner))
+         (fTokens[k - 1].role == Role::Preposition && fTokens[k].role != Role::Pronoun &&
+          fTokens[k].role != Role::Clitic) ||
+         fTokens[k - 1].role == Role::Determiner))
       return false;
     // A verb right after an item with a preposition, where the items before have none:
     // the item is a complement of the verb ("edit those files and in those lines replace
@@ -1045,6 +1065,18 @@ class StructureBuilder {
     const std::size_t c = fTokens[t].chunk;
     return c + 1 < fChunks.size() && fChunks[c + 1].wordClass() >= WORD_CLASS_UNKNOWN &&
            fChunks[c].text.find_first_not_of("/._~:-") == std::string::npos;
+  }
+
+  // The token after verb group g when its verbs are all participles of no tense, kNone
+  // otherwise.
+  std::size_t xParticipleGroupEnd(std::size_t g) const {
+    for (std::size_t t = fGroups[g].firstToken; t <= fGroups[g].lastToken; ++t) {
+      const Token& token = fTokens[t];
+      if ((token.role == Role::Verb || token.role == Role::Auxiliary) &&
+          (token.finite || !token.participle))
+        return kNone;
+    }
+    return fGroups[g].lastToken + 1;
   }
 
   // Whether group g has a verb of a tense.
