@@ -434,7 +434,8 @@ struct Token {
   bool infinitive = false;                          // a verb record of the infinitive
   bool participle = false;                          // a verb record of a participle
   bool negativeDeterminer = false;                  // a determiner record of negation ("no")
-  bool finite = false;  // a verb or auxiliary record of a tense, none of a participle
+  bool finite = false;         // a verb or auxiliary record of a tense, none of a participle
+  bool thirdSingular = false;  // a verb record of a tense in the third person singular
 
   bool has(ZULingWordClass wordClass) const noexcept { return (records >> wordClass) & 1u; }
 };
@@ -518,6 +519,11 @@ class StructureBuilder {
         if ((record.wordClass == WORD_CLASS_VERB || record.wordClass == WORD_CLASS_AUXILIARY) &&
             record.features.find_first_of("PIJFCST") != std::string::npos)
           token.finite = true;
+        if (record.wordClass == WORD_CLASS_VERB &&
+            record.features.find_first_of("PIJFCST") != std::string::npos &&
+            record.features.find('3') != std::string::npos &&
+            record.features.find('s') != std::string::npos)
+          token.thirdSingular = true;
         if (record.wordClass == WORD_CLASS_DETERMINANT &&
             record.features.find('n') != std::string::npos)
           token.negativeDeterminer = true;
@@ -968,6 +974,12 @@ class StructureBuilder {
     // A word that can be a verb, before its object.
     if (!single && afterVerb && lone.infinitive && xObjectAt(group.firstToken + 1))
       return true;
+    // A verb of the third person before its object, after a clause whose verb is one too
+    // ("it loads the image to the memory and hands control over").
+    if (!single && lone.thirdSingular &&
+        (xObjectAt(group.firstToken + 1) || fTokens[group.firstToken + 1].role == Role::Noun) &&
+        xThirdSingularVerbBefore(previous))
+      return true;
     // The last verb group before the first item: whether it has a verb of a tense ("n'est
     // pas une personne", not "se servant de gettext"), and ends in an infinitive after it
     // ("vous devriez envoyer").
@@ -1107,6 +1119,30 @@ class StructureBuilder {
         return fGroupOfToken[t];
     }
     return kNone;
+  }
+
+  // Whether the clause before token t, past the coordinating words of its things, has a
+  // verb of the third person singular as its last verb ("it loads the image and the data
+  // to the memory").
+  bool xThirdSingularVerbBefore(std::size_t t) const {
+    while (t > 0) {
+      --t;
+      const Token& token = fTokens[t];
+      if (token.type != Token::Word) {
+        if (xInWordMark(t))
+          continue;
+        return false;
+      }
+      if (token.coordination != Coordination::None)
+        continue;
+      if (token.role == Role::Subordinator || isOneOf(token.lower, kRelativeWords) ||
+          isOneOf(token.lower, kQuestionWords))
+        return false;
+      if (token.role == Role::Verb || token.role == Role::Auxiliary)
+        return token.thirdSingular && fGroupOfToken[t] != kNone &&
+               fGroups[fGroupOfToken[t]].kind == STRUCTURE_VERB;
+    }
+    return false;
   }
 
   // Whether a clause may begin after token t: a comma, a mark other than a slash
