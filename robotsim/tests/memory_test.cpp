@@ -131,12 +131,8 @@ TEST_F(MemoryTest, GetDataAnswersTheLastValueOrAClearError) {
   EXPECT_EQ(memoryModule->getData("quiet").asInt(), 5);
   memory.declareEvent("declaredOnly", "First");
   for (const std::string key : {"unknown", "declaredOnly"}) {
-    try {
-      memoryModule->getData(key);
-      ADD_FAILURE() << "no error for " << key;
-    } catch (const ZU::ZUError& e) {
-      EXPECT_EQ(e.description(), "There is no data for the key '" + key + "'");
-    }
+    EXPECT_THAT(ko::test::errorOf([&] { memoryModule->getData(key); }),
+                ::testing::EndsWith("\n\tThere is no data for the key '" + key + "'"));
   }
   EXPECT_THAT(memoryModule->getEventList(), ::testing::ElementsAre("declaredOnly", "key", "quiet"));
 }
