@@ -128,13 +128,8 @@ TEST_F(RobotFaults, CallsFailHangUntilLiftedOrStoppedAndAnswerLate) {
       "ZUBehaviorManager.getInstalledBehaviors:throw; ZURobotModel._getRobotType:hang;"
       "ZUAudioPlayer.playSoundSetFile:hang; ZURobotPosture.getPostureFamily:delay=20ms"));
   const auto broker = robot_->broker();
-  try {
-    ZU::ZUBehaviorManagerProxy(broker).getInstalledBehaviors();
-    ADD_FAILURE() << "no error";
-  } catch (const ZU::ZUError& e) {
-    EXPECT_EQ(e.description(), "injected fault");
-    EXPECT_EQ(e.methodName(), "getInstalledBehaviors");
-  }
+  EXPECT_EQ(ko::test::errorOf([&] { ZU::ZUBehaviorManagerProxy(broker).getInstalledBehaviors(); }),
+            "\tZUBehaviorManager::getInstalledBehaviors\n\tinjected fault");
   EXPECT_TRUE(log_->contains(kFaults, ko::log::Warning,
                              "ZUBehaviorManager.getInstalledBehaviors: fails (injected fault)"));
 

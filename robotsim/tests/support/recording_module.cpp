@@ -1,5 +1,6 @@
 #include "support/recording_module.h"
 
+#include <algorithm>
 #include <string>
 
 #include "zu/zuerror.h"
@@ -96,11 +97,8 @@ std::vector<std::string> statusesOf(const std::vector<ReceivedEvent>& events, in
 }
 
 bool hasStatus(const std::vector<ReceivedEvent>& events, int id, const std::string& word) {
-  for (const auto& s : statusesOf(events, id)) {
-    if (s == word)
-      return true;
-  }
-  return false;
+  const auto statuses = statusesOf(events, id);
+  return std::find(statuses.begin(), statuses.end(), word) != statuses.end();
 }
 
 }  // namespace robotsim::testing
