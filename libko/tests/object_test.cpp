@@ -75,10 +75,8 @@ TEST_F(ObjectTest, OverloadsResolveExactThenByAcceptance) {
       {"float and int only fit doubles", {1.5, 2}, 3.5},
       {"dynamic string fits strings", {AnyValue::dynamic("x"), "y"}, "xy"},
   };
-  for (const auto& c : cases) {
-    SCOPED_TRACE(c.label);
-    EXPECT_EQ(obj_->call(std::string_view("add"), c.args), c.expected);
-  }
+  for (const auto& c : cases)
+    EXPECT_EQ(obj_->call(std::string_view("add"), c.args), c.expected) << c.label;
   EXPECT_EQ(obj_->call<std::string>("say", "hello"), "said hello");
   EXPECT_EQ(obj_->call<std::string>("say", "hello", "{}"), "said hello with {}");
   EXPECT_EQ(obj_->callById<std::string>(obj_->findMethod("add").at(1).id, {"k", "o"}), "ko");
