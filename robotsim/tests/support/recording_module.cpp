@@ -40,22 +40,12 @@ void RecordingModule::_mrkpauseCallback(int bookmark) {
   fChanged.wait(lock, [this] { return !fHold; });
 }
 
-void RecordingModule::holdBlockingBookmarks() {
-  std::lock_guard lock(fMutex);
-  fHold = true;
-}
-
 void RecordingModule::releaseBlockingBookmarks() {
   {
     std::lock_guard lock(fMutex);
     fHold = false;
   }
   fChanged.notify_all();
-}
-
-std::vector<ReceivedEvent> RecordingModule::events() const {
-  std::lock_guard lock(fMutex);
-  return fEvents;
 }
 
 std::vector<ReceivedEvent> RecordingModule::events(const std::string& key) const {
@@ -66,11 +56,6 @@ std::vector<ReceivedEvent> RecordingModule::events(const std::string& key) const
       out.push_back(e);
   }
   return out;
-}
-
-std::vector<int> RecordingModule::blockingBookmarks() const {
-  std::lock_guard lock(fMutex);
-  return fBlocking;
 }
 
 bool RecordingModule::waitForEvents(
