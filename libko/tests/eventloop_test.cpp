@@ -219,18 +219,14 @@ TEST(EventLoop, DefaultLoopIsSharedAndSizedFromTheEnvironment) {
   // Each child process runs the test from the start: nothing may create the default loop
   // before the death tests.
   GTEST_FLAG_SET(death_test_style, "threadsafe");
-  EXPECT_EXIT(
-      {
-        setenv("ZEFOKO_EVENTLOOP_THREADS", "3", 1);
-        std::exit(ko::getEventLoop()->threadCount() == 3 ? 0 : 1);
-      },
-      ::testing::ExitedWithCode(0), "");
-  EXPECT_EXIT(
-      {
-        setenv("ZEFOKO_EVENTLOOP_THREADS", "many", 1);
-        std::exit(ko::getEventLoop()->threadCount() == 4 ? 0 : 1);
-      },
-      ::testing::ExitedWithCode(0), "");
+  for (const auto& [variable, threads] : {std::pair{"3", 3U}, std::pair{"many", 4U}}) {
+    EXPECT_EXIT(
+        {
+          setenv("ZEFOKO_EVENTLOOP_THREADS", variable, 1);
+          std::exit(ko::getEventLoop()->threadCount() == threads ? 0 : 1);
+        },
+        ::testing::ExitedWithCode(0), "");
+  }
   EXPECT_EQ(ko::getEventLoop(), ko::getEventLoop());
 }
 

@@ -40,21 +40,12 @@ TEST(Future, ErrorAndTimeOutAreRaisedWithTheirText) {
   Promise<std::string> promise;
   auto future = promise.future();
   EXPECT_EQ(future.wait(std::chrono::milliseconds(20)), FutureState::Timeout);
-  try {
-    future.value(5);
-    FAIL() << "value() did not time out";
-  } catch (const ko::FutureError& e) {
-    EXPECT_STREQ(e.what(), "Future timeout");
-  }
+  EXPECT_EQ(ko::test::errorOf<ko::FutureError>([&] { future.value(5); }), "Future timeout");
   promise.setError("the speech engine is gone");
   EXPECT_TRUE(future.hasError());
   EXPECT_EQ(future.wait(), FutureState::FinishedWithError);
-  try {
-    future.value();
-    FAIL() << "value() did not throw";
-  } catch (const ko::FutureError& e) {
-    EXPECT_STREQ(e.what(), "the speech engine is gone");
-  }
+  EXPECT_EQ(ko::test::errorOf<ko::FutureError>([&] { future.value(); }),
+            "the speech engine is gone");
   // A second result is refused.
   EXPECT_THROW(promise.setValue("late"), ko::FutureError);
   EXPECT_THROW(promise.setError("late"), ko::FutureError);
@@ -96,7 +87,6 @@ TEST(Future, BrokenPromiseOnlyWhenTheLastCopyGoes) {
     }
     EXPECT_TRUE(future.isRunning());
   }
-  EXPECT_EQ(future.error(0), ko::kPromiseBrokenText);
   EXPECT_EQ(future.error(0), "Promise broken");
 }
 

@@ -1,5 +1,6 @@
 #pragma once
-// Helpers of the tests: synchronisation (every wait is bounded) and scratch folders.
+// Helpers of the tests: synchronisation (every wait is bounded), the text of an expected
+// exception and scratch folders.
 
 #include <stdlib.h>
 
@@ -74,6 +75,17 @@ inline bool eventually(const std::function<bool()>& pred) {
     std::this_thread::yield();
   }
   return true;
+}
+
+// The what() of the exception of type E that `call` raises; "<none>" when it raises none.
+template <class E = std::exception>
+std::string errorOf(const std::function<void()>& call) {
+  try {
+    call();
+  } catch (const E& e) {
+    return e.what();
+  }
+  return "<none>";
 }
 
 // A temporary folder for one test, deleted with everything in it at the end of its scope.

@@ -75,10 +75,8 @@ TEST_F(ObjectTest, OverloadsResolveExactThenByAcceptance) {
       {"float and int only fit doubles", {1.5, 2}, 3.5},
       {"dynamic string fits strings", {AnyValue::dynamic("x"), "y"}, "xy"},
   };
-  for (const auto& c : cases) {
-    SCOPED_TRACE(c.label);
-    EXPECT_EQ(obj_->call(std::string_view("add"), c.args), c.expected);
-  }
+  for (const auto& c : cases)
+    EXPECT_EQ(obj_->call(std::string_view("add"), c.args), c.expected) << c.label;
   EXPECT_EQ(obj_->call<std::string>("say", "hello"), "said hello");
   EXPECT_EQ(obj_->call<std::string>("say", "hello", "{}"), "said hello with {}");
   EXPECT_EQ(obj_->callById<std::string>(obj_->findMethod("add").at(1).id, {"k", "o"}), "ko");
@@ -103,12 +101,8 @@ TEST_F(ObjectTest, NoSingleMatchListsTheCandidates) {
   EXPECT_THROW(obj_->call("add", std::int64_t{2}, std::int64_t{3}), ko::OverloadError);
   EXPECT_THROW(obj_->call("add", 1), ko::OverloadError);
   EXPECT_THROW(obj_->call("volume", 1), ko::OverloadError);
-  try {
-    obj_->call("missing");
-    FAIL();
-  } catch (const ko::Error& e) {
-    EXPECT_STREQ(e.what(), "Cannot find method 'missing' on calculator");
-  }
+  EXPECT_EQ(ko::test::errorOf([&] { obj_->call("missing"); }),
+            "Cannot find method 'missing' on calculator");
 }
 
 TEST_F(ObjectTest, FailuresCarryTheirText) {
@@ -129,15 +123,8 @@ TEST_F(ObjectTest, FailuresCarryTheirText) {
       {"list result does not convert", [&] { obj_->call<std::vector<int>>("say", "x"); },
        "Unable to convert call result to target type: from s to [i]"},
   };
-  for (const auto& c : cases) {
-    SCOPED_TRACE(c.label);
-    try {
-      c.call();
-      ADD_FAILURE() << "no error";
-    } catch (const ko::Error& e) {
-      EXPECT_THAT(e.what(), HasSubstr(c.text));
-    }
-  }
+  for (const auto& c : cases)
+    EXPECT_THAT(ko::test::errorOf<ko::Error>(c.call), HasSubstr(c.text)) << c.label;
   try {
     obj_->call<std::string>("add", 1, 2);
   } catch (const ko::ResultConversionError& e) {
@@ -236,12 +223,8 @@ TEST(WeakObject, CallsOnAGoneObjectFailClearly) {
   holder.reset();
   EXPECT_FALSE(weak->isValid());
   EXPECT_EQ(weak->dynamicObject(), nullptr);
-  try {
-    weak->call<bool>("ping");
-    FAIL();
-  } catch (const ko::Error& e) {
-    EXPECT_STREQ(e.what(), "Object is gone: ZUMokuto");
-  }
+  EXPECT_EQ(ko::test::errorOf<ko::Error>([&] { weak->call<bool>("ping"); }),
+            "Object is gone: ZUMokuto");
   EXPECT_THROW(weak->callById(100, {}), ko::Error);
   EXPECT_THROW(weak->metaObject(), ko::Error);
   EXPECT_THROW(weak->post("x"), ko::Error);

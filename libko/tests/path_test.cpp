@@ -6,9 +6,10 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <optional>
 #include <set>
 
-#include "ko/os.hpp"
+#include "ko_test_helpers.hpp"
 #include "path_roots.hpp"
 
 namespace {
@@ -20,30 +21,21 @@ using ::testing::ElementsAre;
 class FindDataTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    base_ = fs::temp_directory_path() / ("ko_path_test_" + std::to_string(ko::os::gettid()));
-    fs::remove_all(base_);
-    first_ = base_ / "first";
-    second_ = base_ / "second";
     fs::create_directories(first_ / "zefoko" / "db");
     fs::create_directories(second_ / "zefoko" / "db");
-    const char* old = std::getenv("ZEFOKO_DATA_PATH");
-    if (old)
+    if (const char* old = std::getenv("ZEFOKO_DATA_PATH"))
       saved_ = old;
-    hadOld_ = old != nullptr;
     setenv("ZEFOKO_DATA_PATH", (first_.string() + "::" + second_.string()).c_str(), 1);
   }
   void TearDown() override {
-    if (hadOld_)
-      setenv("ZEFOKO_DATA_PATH", saved_.c_str(), 1);
-    else
-      unsetenv("ZEFOKO_DATA_PATH");
-    fs::remove_all(base_);
+    saved_ ? setenv("ZEFOKO_DATA_PATH", saved_->c_str(), 1) : unsetenv("ZEFOKO_DATA_PATH");
   }
   static void touch(const fs::path& p) { std::ofstream(p) << "x"; }
 
-  fs::path base_, first_, second_;
-  std::string saved_;
-  bool hadOld_ = false;
+  ko::test::ScratchFolder scratch_;
+  fs::path first_ = scratch_.path() / "first";
+  fs::path second_ = scratch_.path() / "second";
+  std::optional<std::string> saved_;
 };
 
 TEST_F(FindDataTest, FirstDirectoryOfTheVariableWins) {
@@ -97,10 +89,8 @@ TEST(DataRoots, InstalledOrBuildTreeByWhereTheLibraryLies) {
 TEST_F(FindDataTest, PathsLeavingTheDataDirectoryAreRefused) {
   touch(first_ / "secret.txt");
   touch(first_ / "zefoko" / "db" / "ok.bdb");
-  for (const char* bad : {"", "../secret.txt", "db/../../secret.txt", "/etc/hostname"}) {
-    SCOPED_TRACE(bad);
-    EXPECT_EQ(ko::path::findData("zefoko", bad), "");
-  }
+  for (const char* bad : {"", "../secret.txt", "db/../../secret.txt", "/etc/hostname"})
+    EXPECT_EQ(ko::path::findData("zefoko", bad), "") << bad;
   EXPECT_EQ(ko::path::findData("zefoko", "db/./ok.bdb"), (first_ / "zefoko/db/ok.bdb").string());
   EXPECT_EQ(ko::path::findData("..", "secret.txt"), "");
 }

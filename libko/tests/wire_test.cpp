@@ -1,5 +1,6 @@
 // The wire format: every kind of value comes back exactly (kind, signature, content), and
 // bytes that are no value or no header are refused with a reason.
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <limits>
@@ -7,6 +8,7 @@
 #include <vector>
 
 #include "ko/wire.hpp"
+#include "ko_test_helpers.hpp"
 
 namespace ko::wire {
 namespace {
@@ -71,10 +73,6 @@ TEST(Wire, AnIntegerIsTypedByItsValueNotByItsFormat) {
   EXPECT_EQ(decodeValue(std::string("\xcf\x00\x00\x00\x00\x00\x00\x00\x05", 9)).signature(), "i");
 }
 
-TEST(Wire, ObjectsDoNotTravel) {
-  EXPECT_THROW(encodeValue(AnyValue::pointerTo(AnyValue(1))), Error);
-}
-
 TEST(Wire, MalformedValuesAreRefused) {
   std::string deep(kMaxDepth + 1, '\x91');
   deep += '\xc0';
@@ -100,10 +98,8 @@ TEST(Wire, MalformedValuesAreRefused) {
       {"tuple that is no triple", "\xd4\x03\xc0"},
       {"opaque of a kind with content", "\xd4\x06\x01"},
   };
-  for (const auto& c : cases) {
-    SCOPED_TRACE(c.name);
-    EXPECT_THROW(decodeValue(c.bytes), DecodeError);
-  }
+  for (const auto& c : cases)
+    EXPECT_THROW(decodeValue(c.bytes), DecodeError) << c.name;
 }
 
 TEST(Wire, HeadersCarryTheirKindsFields) {
@@ -135,13 +131,9 @@ TEST(Wire, HeadersCarryTheirKindsFields) {
       {"field of the wrong type", header({"lookup", 1, 0, 0, 5}), "is not a string"},
   };
   for (const auto& c : bad) {
-    SCOPED_TRACE(c.name);
-    try {
-      decodeHeader(c.bytes);
-      ADD_FAILURE() << "decoded";
-    } catch (const DecodeError& e) {
-      EXPECT_NE(std::string(e.what()).find(c.reason), std::string::npos) << e.what();
-    }
+    EXPECT_THAT(test::errorOf<DecodeError>([&] { decodeHeader(c.bytes); }),
+                ::testing::HasSubstr(c.reason))
+        << c.name;
   }
 }
 

@@ -56,12 +56,10 @@ TEST(BrokerTest, RegistersFindsAndUnregistersAModule) {
     EXPECT_EQ(object->dynamicObject(), greeter);
     EXPECT_EQ(greeter->getParentBroker(), process.broker);
   }
-  try {
-    process.broker->registerModule(std::make_shared<Greeter>(process.broker, "Greeter"));
-    FAIL() << "no error";
-  } catch (const ZU::ZUError& e) {
-    EXPECT_STREQ(e.what(), "\tZUBroker::registerModule\n\tmodule 'Greeter'already exists");
-  }
+  EXPECT_EQ(ko::test::errorOf([&] {
+              process.broker->registerModule(std::make_shared<Greeter>(process.broker, "Greeter"));
+            }),
+            "\tZUBroker::registerModule\n\tmodule 'Greeter'already exists");
   EXPECT_EQ(zutest::errorOf([&] {
               process.broker->registerModule(std::make_shared<Greeter>(process.broker, ""));
             }),

@@ -10,23 +10,15 @@
 #include <utility>
 #include <vector>
 
+#include "ko_test_helpers.hpp"
 #include "zu/zuerror.h"
 
 namespace {
 
+using ko::test::errorOf;
 using ::testing::StartsWith;
 using ZU::ZUError;
 using ZU::ZUValue;
-
-// The text of the ZUError that f raises; "<none>" when it raises none.
-std::string errorOf(const std::function<void()>& f) {
-  try {
-    f();
-  } catch (const ZUError& e) {
-    return e.what();
-  }
-  return "<none>";
-}
 
 ZUValue binary(std::vector<unsigned char> bytes) {
   ZUValue v;
@@ -242,7 +234,7 @@ TEST(ZUErrorTest, ThrowMacroRecordsFileAndLine) {
   const int line = __LINE__ + 2;
   try {
     ZU_THROW_ERROR("ZUMokuto", "say", std::string("failed"));
-  } catch (const ZU::ZUError& error) {
+  } catch (const ZUError& error) {
     EXPECT_EQ(error.sourceLine(), line);
     EXPECT_EQ(error.sourceFile(), __FILE__);
     EXPECT_STREQ(error.what(), "\tZUMokuto::say\n\tfailed");

@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "ko/json.hpp"
+#include "ko_test_helpers.hpp"
 #include "zu/zuerror.h"
 
 namespace {
@@ -73,12 +74,8 @@ TEST(FromAnyReferenceTest, KindsThatDoNotConvertRaiseTheConversionError) {
       {AnyValue::list({1, AnyValue::none()}), "NULL type"},
   };
   for (const auto& [any, description] : cases) {
-    try {
-      (void)ZU::fromAnyReference(any);
-      ADD_FAILURE() << "nothing thrown for " << description;
-    } catch (const ZU::ZUError& e) {
-      EXPECT_EQ(std::string(e.what()), std::string("\tZUValue::conversion\n\t") + description);
-    }
+    EXPECT_EQ(ko::test::errorOf([&] { (void)ZU::fromAnyReference(any); }),
+              std::string("\tZUValue::conversion\n\t") + description);
   }
 }
 

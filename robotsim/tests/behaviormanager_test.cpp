@@ -37,6 +37,7 @@ namespace robotsim {
 namespace {
 
 namespace fs = std::filesystem;
+using ko::test::errorOf;
 using ko::test::ScratchFolder;
 using testing::ElementsAre;
 using testing::HasSubstr;
@@ -73,16 +74,6 @@ RobotOptions robotOn(const ScratchFolder& folder, const Behaviors& behaviors) {
   options.behaviorsRoot = folder.path().string();
   options.speech.backend = ZUTextToSpeechOptions::Backend::Timing;
   return options;
-}
-
-// The description of the ZUError that `call` raises; empty when it raises none.
-std::string errorOf(const std::function<void()>& call) {
-  try {
-    call();
-  } catch (const ZU::ZUError& e) {
-    return e.description();
-  }
-  return {};
 }
 
 // Records the "behaviorStopped" signal; shared with the subscription, which may outlive

@@ -9,6 +9,7 @@
 
 #include "ko/log.hpp"
 #include "ko/session.hpp"
+#include "ko_test_helpers.hpp"
 #include "robotsim/speechscript.h"
 #include "robotsim/zutexttospeech.h"
 #include "speechjapanese.h"
@@ -65,12 +66,10 @@ TEST(JapaneseReadings, ReadingProblemsAreNamed) {
   for (const auto& record : cap->records())
     lines += record.message.find("No reading for the kanji 𠮷 (U+20BB7)") != std::string::npos;
   EXPECT_EQ(lines, 1U);
-  try {
-    JapaneseReadings missing("/nonexistent/ipadic-utf8");
-    ADD_FAILURE() << "no error";
-  } catch (const std::runtime_error& e) {
-    EXPECT_NE(std::string(e.what()).find("mecab-ipadic-utf8"), std::string::npos) << e.what();
-  }
+  EXPECT_NE(ko::test::errorOf<std::runtime_error>([] {
+              JapaneseReadings missing("/nonexistent/ipadic-utf8");
+            }).find("mecab-ipadic-utf8"),
+            std::string::npos);
 }
 
 // ---- spoken by espeak-ng --------------------------------------------------------------

@@ -37,13 +37,9 @@ bool waitFor(const RecordingModule& module, const std::string& key, std::size_t 
       10s);
 }
 
-std::shared_ptr<ZU::ZUBroker> newBroker() {
-  return ZU::ZUBroker::create(std::make_shared<ko::Session>());
-}
-
 class MemoryTest : public ::testing::Test {
  protected:
-  std::shared_ptr<ZU::ZUBroker> broker = newBroker();
+  std::shared_ptr<ZU::ZUBroker> broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
   std::shared_ptr<ZUMemory> memoryModule = ZU::ZUModule::createModule<ZUMemory>(broker, "ZUMemory");
   std::shared_ptr<RecordingModule> first =
       ZU::ZUModule::createModule<RecordingModule>(broker, "First");
@@ -131,12 +127,8 @@ TEST_F(MemoryTest, GetDataAnswersTheLastValueOrAClearError) {
   EXPECT_EQ(memoryModule->getData("quiet").asInt(), 5);
   memory.declareEvent("declaredOnly", "First");
   for (const std::string key : {"unknown", "declaredOnly"}) {
-    try {
-      memoryModule->getData(key);
-      ADD_FAILURE() << "no error for " << key;
-    } catch (const ZU::ZUError& e) {
-      EXPECT_EQ(e.description(), "There is no data for the key '" + key + "'");
-    }
+    EXPECT_THAT(ko::test::errorOf([&] { memoryModule->getData(key); }),
+                ::testing::EndsWith("\n\tThere is no data for the key '" + key + "'"));
   }
   EXPECT_THAT(memoryModule->getEventList(), ::testing::ElementsAre("declaredOnly", "key", "quiet"));
 }
@@ -177,7 +169,7 @@ TEST_F(MemoryTest, FailingOrMissingSubscribersAreLoggedAndSkipped) {
 TEST(MemoryLifetime, ACallbackHoldingTheServiceMayOutliveItsOwners) {
   ko::test::Gate entered, ownersGone, released;
   {
-    auto broker = newBroker();
+    auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
     ZU::ZUModule::createModule<ZUMemory>(broker, "ZUMemory");
     ZU::ZUModule::createModule<RecordingModule>(broker, "Holder")
         ->setHook([&](const RecordingModule& self, const std::string&) {
@@ -199,7 +191,7 @@ TEST(MemoryLifetime, ACallbackHoldingTheServiceMayOutliveItsOwners) {
 
 // Once unsubscribeToEvent returns, no callback of that subscription runs or begins.
 TEST(MemoryLifetime, NoCallbackRunsOnceTheUnsubscribeHasReturned) {
-  auto broker = newBroker();
+  auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
   auto memoryModule = ZU::ZUModule::createModule<ZUMemory>(broker, "ZUMemory");
   std::atomic<bool> unsubscribed{false};
   std::atomic<int> late{0};
@@ -239,7 +231,7 @@ TEST(MemoryLifetime, NoCallbackRunsOnceTheUnsubscribeHasReturned) {
 }
 
 TEST(MemoryLifetime, ACallbackMayEndItsOwnSubscription) {
-  auto broker = newBroker();
+  auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
   auto memoryModule = ZU::ZUModule::createModule<ZUMemory>(broker, "ZUMemory");
   ZU::ZUMemoryProxy memory(broker);
   std::atomic<int> ticks{0};

@@ -11,6 +11,7 @@
 
 #include "ko/log.hpp"
 #include "ko/session.hpp"
+#include "ko_test_helpers.hpp"
 #include "robotsim/bezier.h"
 #include "robotsim/jointmodel.h"
 #include "robotsim/timeline.h"
@@ -132,12 +133,10 @@ TEST(BezierTracks, RefusesMalformedMoves) {
       {"times not a list", "HeadYaw", 0.5, good, "times must be a list"},
   };
   for (const auto& c : cases) {
-    try {
-      parseBezierTracks(c.names, c.times, c.keys);
-      ADD_FAILURE() << c.name << ": accepted";
-    } catch (const KeyframeError& e) {
-      EXPECT_THAT(e.what(), testing::HasSubstr(c.reason)) << c.name;
-    }
+    EXPECT_THAT(
+        ko::test::errorOf<KeyframeError>([&] { parseBezierTracks(c.names, c.times, c.keys); }),
+        testing::HasSubstr(c.reason))
+        << c.name;
   }
 }
 
@@ -145,16 +144,7 @@ TEST(BezierTracks, RefusesMalformedMoves) {
 
 class MotionService : public testing::Test {
  protected:
-  void SetUp() override {
-    session_ = std::make_shared<ko::Session>();
-    broker_ = ZU::ZUBroker::create(session_);
-    timeline_ = std::make_shared<Timeline>();
-    waiter_ = std::make_unique<simtest::TimelineWaiter>(*timeline_);
-    motion_ = ZU::ZUModule::createModule<ZUMotion>(broker_, "ZUMotion", timeline_);
-    proxy_ = std::make_unique<ZU::ZUMotionProxy>(broker_);
-  }
-
-  float angle(const std::string& joint) { return proxy_->getAngles(ZUValue(joint), false).at(0); }
+  float angle(const std::string& joint) { return proxy_.getAngles(ZUValue(joint), false).at(0); }
 
   // A Bezier move of one joint to `target` at `seconds`, in the layout the head part uses.
   static ZUValue names(const std::string& joint) { return ZUValue::makeArray({joint}); }
@@ -167,23 +157,23 @@ class MotionService : public testing::Test {
     return ZUValue::makeArray({ZUValue::makeArray({ZUValue::makeArray({target, before, after})})});
   }
 
-  std::shared_ptr<ko::Session> session_;
-  std::shared_ptr<ZU::ZUBroker> broker_;
-  std::shared_ptr<Timeline> timeline_;
-  std::unique_ptr<simtest::TimelineWaiter> waiter_;
-  std::shared_ptr<ZUMotion> motion_;
-  std::unique_ptr<ZU::ZUMotionProxy> proxy_;
+  std::shared_ptr<ZU::ZUBroker> broker_ = ZU::ZUBroker::create(std::make_shared<ko::Session>());
+  std::shared_ptr<Timeline> timeline_ = std::make_shared<Timeline>();
+  simtest::TimelineWaiter waiter_{*timeline_};
+  std::shared_ptr<ZUMotion> motion_ =
+      ZU::ZUModule::createModule<ZUMotion>(broker_, "ZUMotion", timeline_);
+  ZU::ZUMotionProxy proxy_{broker_};
 };
 
 TEST_F(MotionService, GetAnglesOfJointsChainsAndLists) {
-  EXPECT_EQ(proxy_->getAngles(ZUValue("Head"), false).size(), 2u);
-  EXPECT_EQ(proxy_->getAngles(ZUValue("LArm"), true).size(), 6u);
-  EXPECT_EQ(proxy_->getAngles(ZUValue("Arms"), false).size(), 12u);
-  EXPECT_EQ(proxy_->getAngles(ZUValue("Body"), false).size(), bodyJoints().size());
-  const auto pair = proxy_->getAngles(ZUValue::makeArray({"RElbowRoll", "LElbowRoll"}), false);
+  EXPECT_EQ(proxy_.getAngles(ZUValue("Head"), false).size(), 2u);
+  EXPECT_EQ(proxy_.getAngles(ZUValue("LArm"), true).size(), 6u);
+  EXPECT_EQ(proxy_.getAngles(ZUValue("Arms"), false).size(), 12u);
+  EXPECT_EQ(proxy_.getAngles(ZUValue("Body"), false).size(), bodyJoints().size());
+  const auto pair = proxy_.getAngles(ZUValue::makeArray({"RElbowRoll", "LElbowRoll"}), false);
   ASSERT_EQ(pair.size(), 2u);
   EXPECT_FLOAT_EQ(pair[0], -pair[1]);  // the rest pose is symmetric
-  EXPECT_THROW(proxy_->getAngles(ZUValue("Tail"), false), ZU::ZUError);
+  EXPECT_THROW(proxy_.getAngles(ZUValue("Tail"), false), ZU::ZUError);
 }
 
 TEST_F(MotionService, AnglesAreSampledWhileJointsMoveAndOnlyThoseThatMove) {
@@ -194,12 +184,12 @@ TEST_F(MotionService, AnglesAreSampledWhileJointsMoveAndOnlyThoseThatMove) {
 
   // A blocking move returns on its last key, its chain free.
   motion_->sampleAngles(50);
-  proxy_->angleInterpolationBezier(names("HeadYaw"), times(0.2), keys(0.5, 0.2));
+  proxy_.angleInterpolationBezier(names("HeadYaw"), times(0.2), keys(0.5, 0.2));
   EXPECT_NEAR(angle("HeadYaw"), 0.5, 1e-5);
-  EXPECT_TRUE(proxy_->areResourcesAvailable({"Head"}));
-  ASSERT_TRUE(waiter_->waitFor("ZUMotion", "moveEnded"));
+  EXPECT_TRUE(proxy_.areResourcesAvailable({"Head"}));
+  ASSERT_TRUE(waiter_.waitFor("ZUMotion", "moveEnded"));
   // The motion thread tells where the move left the joint before it sleeps.
-  ASSERT_TRUE(waiter_->waitUntil([&] {
+  ASSERT_TRUE(waiter_.waitUntil([&] {
     const auto all = sampled();
     return all.back().arguments.asMap().at(0).second.to<double>() == 0.5;
   }));
@@ -222,23 +212,23 @@ TEST_F(MotionService, AnglesAreSampledWhileJointsMoveAndOnlyThoseThatMove) {
 
   motion_->sampleAngles(0);
   const std::size_t before = sampled().size();
-  proxy_->angleInterpolationBezier(names("HeadYaw"), times(0.1), keys(0.0, 0.1));
+  proxy_.angleInterpolationBezier(names("HeadYaw"), times(0.1), keys(0.0, 0.1));
   EXPECT_EQ(sampled().size(), before);
 }
 
 TEST_F(MotionService, AnglesClampToTheLimitsWithOneWarningPerJoint) {
   ko::log::ScopedCapture capture(ko::log::Warning);
-  proxy_->angleInterpolationBezier(ZUValue::makeArray({"HeadPitch"}),
-                                   ZUValue::makeArray({ZUValue::makeArray({0.05, 0.1})}),
-                                   ZUValue::makeArray({ZUValue::makeArray({2.0f, 3.0f})}));
+  proxy_.angleInterpolationBezier(ZUValue::makeArray({"HeadPitch"}),
+                                  ZUValue::makeArray({ZUValue::makeArray({0.05, 0.1})}),
+                                  ZUValue::makeArray({ZUValue::makeArray({2.0f, 3.0f})}));
   EXPECT_FLOAT_EQ(angle("HeadPitch"), 0.5f);
   std::size_t warnings = 0;
   for (const auto& r : capture->records())
     warnings += r.category == "robotsim.motion" && r.message.find("HeadPitch") != std::string::npos;
   EXPECT_EQ(warnings, 1u);
 
-  proxy_->setAngles(ZUValue("LHand"), ZUValue(-1.0f), 1.0f);
-  ASSERT_TRUE(waiter_->waitFor("ZUMotion", "moveEnded", 2));
+  proxy_.setAngles(ZUValue("LHand"), ZUValue(-1.0f), 1.0f);
+  ASSERT_TRUE(waiter_.waitFor("ZUMotion", "moveEnded", 2));
   EXPECT_FLOAT_EQ(angle("LHand"), 0.0f);
   EXPECT_TRUE(capture->containsPart("robotsim.motion", ko::log::Warning, "LHand asked for -1"));
 }
@@ -246,72 +236,69 @@ TEST_F(MotionService, AnglesClampToTheLimitsWithOneWarningPerJoint) {
 TEST_F(MotionService, PostedMoveHoldsItsChainUntilStopped) {
   const float start = angle("HeadYaw");
   const int id =
-      proxy_->post_angleInterpolationBezier(names("HeadYaw"), times(30.0), keys(1.5, 30.0));
-  ASSERT_TRUE(waiter_->waitFor("ZUMotion", "angleInterpolationBezier"));
-  EXPECT_FALSE(proxy_->areResourcesAvailable({"Head"}));
-  EXPECT_FALSE(proxy_->areResourcesAvailable({"HeadYaw"}));
-  EXPECT_TRUE(proxy_->areResourcesAvailable({"LArm", "RArm"}));
-  EXPECT_TRUE(proxy_->wait(id, 1));  // still running: the time ran out
+      proxy_.post_angleInterpolationBezier(names("HeadYaw"), times(30.0), keys(1.5, 30.0));
+  ASSERT_TRUE(waiter_.waitFor("ZUMotion", "angleInterpolationBezier"));
+  EXPECT_FALSE(proxy_.areResourcesAvailable({"Head"}));
+  EXPECT_FALSE(proxy_.areResourcesAvailable({"HeadYaw"}));
+  EXPECT_TRUE(proxy_.areResourcesAvailable({"LArm", "RArm"}));
+  EXPECT_TRUE(proxy_.wait(id, 1));  // still running: the time ran out
 
-  proxy_->stop(id);
-  EXPECT_FALSE(proxy_->wait(id, kBoundMs));
-  EXPECT_TRUE(proxy_->areResourcesAvailable({"Head"}));
+  proxy_.stop(id);
+  EXPECT_FALSE(proxy_.wait(id, kBoundMs));
+  EXPECT_TRUE(proxy_.areResourcesAvailable({"Head"}));
   const float stoppedAt = angle("HeadYaw");
   EXPECT_GE(stoppedAt, start);
   EXPECT_LT(stoppedAt, 1.5f);
-}
 
-TEST_F(MotionService, StopBeforeThePostedMoveRunsEndsItAtOnce) {
-  // The stop may come before or after the task has started its move; either way it ends.
-  const int id =
-      proxy_->post_angleInterpolationBezier(names("HeadPitch"), times(30.0), keys(0.3, 30.0));
-  proxy_->stop(id);
-  EXPECT_FALSE(proxy_->wait(id, kBoundMs));
-  EXPECT_TRUE(proxy_->areResourcesAvailable({"Head"}));
+  // A stop that may come before the task has started its move ends it all the same.
+  const int early =
+      proxy_.post_angleInterpolationBezier(names("HeadPitch"), times(30.0), keys(0.3, 30.0));
+  proxy_.stop(early);
+  EXPECT_FALSE(proxy_.wait(early, kBoundMs));
+  EXPECT_TRUE(proxy_.areResourcesAvailable({"Head"}));
 }
 
 TEST_F(MotionService, ALaterMoveTakesTheJointOver) {
   const int id =
-      proxy_->post_angleInterpolationBezier(names("HeadYaw"), times(30.0), keys(1.5, 30.0));
-  ASSERT_TRUE(waiter_->waitFor("ZUMotion", "angleInterpolationBezier"));
-  proxy_->setAngles(ZUValue::makeArray({"HeadYaw", "HeadPitch"}), ZUValue::makeArray({-0.3, 0.2}),
-                    1.0f);
+      proxy_.post_angleInterpolationBezier(names("HeadYaw"), times(30.0), keys(1.5, 30.0));
+  ASSERT_TRUE(waiter_.waitFor("ZUMotion", "angleInterpolationBezier"));
+  proxy_.setAngles(ZUValue::makeArray({"HeadYaw", "HeadPitch"}), ZUValue::makeArray({-0.3, 0.2}),
+                   1.0f);
   // Left without joints, the posted move ends.
-  EXPECT_FALSE(proxy_->wait(id, kBoundMs));
-  ASSERT_TRUE(waiter_->waitFor("ZUMotion", "moveEnded", 2));
+  EXPECT_FALSE(proxy_.wait(id, kBoundMs));
+  ASSERT_TRUE(waiter_.waitFor("ZUMotion", "moveEnded", 2));
   EXPECT_FLOAT_EQ(angle("HeadYaw"), -0.3f);
   EXPECT_FLOAT_EQ(angle("HeadPitch"), 0.2f);
 }
 
 TEST_F(MotionService, BreathingPerChain) {
-  EXPECT_TRUE(proxy_->getBreathEnabled("Body"));
-  proxy_->setBreathEnabled("Arms", false);
-  EXPECT_FALSE(proxy_->getBreathEnabled("Arms"));
-  EXPECT_FALSE(proxy_->getBreathEnabled("LArm"));
-  EXPECT_FALSE(proxy_->getBreathEnabled("Body"));
-  EXPECT_TRUE(proxy_->getBreathEnabled("Head"));
-  proxy_->setBreathEnabled("RArm", true);
-  EXPECT_TRUE(proxy_->getBreathEnabled("RArm"));
-  EXPECT_FALSE(proxy_->getBreathEnabled("Arms"));
-  EXPECT_THROW(proxy_->getBreathEnabled("Legs"), ZU::ZUError);
-  EXPECT_THROW(proxy_->setBreathEnabled("", true), ZU::ZUError);
+  EXPECT_TRUE(proxy_.getBreathEnabled("Body"));
+  proxy_.setBreathEnabled("Arms", false);
+  EXPECT_FALSE(proxy_.getBreathEnabled("Arms"));
+  EXPECT_FALSE(proxy_.getBreathEnabled("LArm"));
+  EXPECT_FALSE(proxy_.getBreathEnabled("Body"));
+  EXPECT_TRUE(proxy_.getBreathEnabled("Head"));
+  proxy_.setBreathEnabled("RArm", true);
+  EXPECT_TRUE(proxy_.getBreathEnabled("RArm"));
+  EXPECT_FALSE(proxy_.getBreathEnabled("Arms"));
+  EXPECT_THROW(proxy_.getBreathEnabled("Legs"), ZU::ZUError);
+  EXPECT_THROW(proxy_.setBreathEnabled("", true), ZU::ZUError);
   EXPECT_EQ(timeline_->entries("ZUMotion", "setBreathEnabled").size(), 2u);
 }
 
 TEST_F(MotionService, BadArgumentsAreErrorsThatNameTheProblem) {
-  try {
-    proxy_->angleInterpolationBezier(names("HeadYaw"), times(0.5), ZUValue::makeArray({}));
-    ADD_FAILURE() << "accepted";
-  } catch (const ZU::ZUError& e) {
-    EXPECT_EQ(e.methodName(), "angleInterpolationBezier");
-    EXPECT_THAT(e.description(), testing::HasSubstr("1 joints but 1 time lists and 0 key lists"));
-  }
-  EXPECT_THROW(proxy_->setAngles(ZUValue("HeadYaw"), ZUValue(0.1f), 0.0f), ZU::ZUError);
-  EXPECT_THROW(proxy_->setAngles(ZUValue("Head"), ZUValue::makeArray({0.1, 0.2, 0.3}), 0.5f),
+  EXPECT_THAT(
+      ko::test::errorOf([&] {
+        proxy_.angleInterpolationBezier(names("HeadYaw"), times(0.5), ZUValue::makeArray({}));
+      }),
+      testing::HasSubstr("::angleInterpolationBezier\n\t1 joints but 1 time lists and 0 key "
+                         "lists"));
+  EXPECT_THROW(proxy_.setAngles(ZUValue("HeadYaw"), ZUValue(0.1f), 0.0f), ZU::ZUError);
+  EXPECT_THROW(proxy_.setAngles(ZUValue("Head"), ZUValue::makeArray({0.1, 0.2, 0.3}), 0.5f),
                ZU::ZUError);
-  EXPECT_THROW(proxy_->areResourcesAvailable({"Head", "Wings"}), ZU::ZUError);
+  EXPECT_THROW(proxy_.areResourcesAvailable({"Head", "Wings"}), ZU::ZUError);
   // The body is untouched by refused calls.
-  EXPECT_TRUE(proxy_->areResourcesAvailable({"Body"}));
+  EXPECT_TRUE(proxy_.areResourcesAvailable({"Body"}));
 }
 
 }  // namespace

@@ -68,11 +68,11 @@ struct Loudness {
 struct MixCase {
   const char* name;
   std::vector<Sound> sounds;
-  std::optional<double> speechStartS;  // 0.1 s of speech at half of full scale
+  std::optional<double> speechStartS = std::nullopt;  // 0.1 s of speech at half of full scale
   double toS;
   double seconds;  // of the mix
-  std::vector<Loudness> loudness;
-  int peak;  // the largest magnitude, when checked (-1: not)
+  std::vector<Loudness> loudness = {};
+  int peak = -1;  // the largest magnitude, when checked (-1: not)
 };
 
 TEST(PerformanceAudio, MixesEverySoundAtItsTime) {
@@ -85,76 +85,58 @@ TEST(PerformanceAudio, MixesEverySoundAtItsTime) {
   const double tone = 0.5 / std::sqrt(2.0);  // the RMS of the tone at full volume
   const auto none = std::nullopt;
   const std::vector<MixCase> cases = {
-      {"a sound at its time, at its volume",
-       {{"tone.wav", 0.2, none, 0.5, false, 0}},
-       none,
-       0.6,
-       0.6,
-       {{0.0, 0.19, 0}, {0.21, 0.49, tone / 2}, {0.51, 0.6, 0}},
-       -1},
-      {"a stopped sound cut at its stop",
-       {{"tone.wav", 0.1, 0.25, 1, false, 0}},
-       none,
-       0.4,
-       0.4,
-       {{0.11, 0.24, tone}, {0.26, 0.4, 0}},
-       -1},
-      {"a sound past the end lengthens the mix",
-       {{"tone.wav", 0.2, none, 1, false, 0}},
-       none,
-       0.1,
-       0.5,
-       {{0.21, 0.49, tone}},
-       -1},
-      {"a loop until the end",
-       {{"short.wav", 0, none, 1, true, 0}},
-       none,
-       0.5,
-       0.5,
-       {{0.01, 0.49, tone}},
-       -1},
-      {"played from a position",
-       {{"late.wav", 0.0, none, 1, false, 0.2}},
-       none,
-       0.3,
-       0.3,
-       {{0.01, 0.19, tone}, {0.21, 0.3, 0}},
-       -1},
-      {"a sound begun before the start is heard from the start",
-       {{"tone.wav", -0.2, none, 1, false, 0}},
-       none,
-       0.2,
-       0.2,
-       {{0.01, 0.09, tone}, {0.11, 0.2, 0}},
-       -1},
-      {"the speech at its time",
-       {},
-       0.05,
-       0.2,
-       0.2,
-       {{0, 0.049, 0}, {0.05, 0.15, 0.5}, {0.151, 0.2, 0}},
-       -1},
-      {"the speech and a sound add up",
-       {{"tone.wav", 0.0, none, 1, false, 0}},
-       0.0,
-       0.1,
-       0.3,
-       {{0.0, 0.1, std::sqrt(0.25 + tone * tone)}},
-       -1},
-      {"a sum beyond full scale is clipped",
-       {{"loud.wav", 0, none, 1, false, 0}, {"loud.wav", 0, none, 1, false, 0}},
-       none,
-       0.2,
-       0.2,
-       {},
-       32767},
-      {"an unreadable file is left out",
-       {{"broken.wav", 0, none, 1, false, 0}},
-       none,
-       0.1,
-       0.1,
-       {{0, 0.1, 0}},
-       -1},
+      {.name = "a sound at its time, at its volume",
+       .sounds = {{"tone.wav", 0.2, none, 0.5, false, 0}},
+       .toS = 0.6,
+       .seconds = 0.6,
+       .loudness = {{0.0, 0.19, 0}, {0.21, 0.49, tone / 2}, {0.51, 0.6, 0}}},
+      {.name = "a stopped sound cut at its stop",
+       .sounds = {{"tone.wav", 0.1, 0.25, 1, false, 0}},
+       .toS = 0.4,
+       .seconds = 0.4,
+       .loudness = {{0.11, 0.24, tone}, {0.26, 0.4, 0}}},
+      {.name = "a sound past the end lengthens the mix",
+       .sounds = {{"tone.wav", 0.2, none, 1, false, 0}},
+       .toS = 0.1,
+       .seconds = 0.5,
+       .loudness = {{0.21, 0.49, tone}}},
+      {.name = "a loop until the end",
+       .sounds = {{"short.wav", 0, none, 1, true, 0}},
+       .toS = 0.5,
+       .seconds = 0.5,
+       .loudness = {{0.01, 0.49, tone}}},
+      {.name = "played from a position",
+       .sounds = {{"late.wav", 0.0, none, 1, false, 0.2}},
+       .toS = 0.3,
+       .seconds = 0.3,
+       .loudness = {{0.01, 0.19, tone}, {0.21, 0.3, 0}}},
+      {.name = "a sound begun before the start is heard from the start",
+       .sounds = {{"tone.wav", -0.2, none, 1, false, 0}},
+       .toS = 0.2,
+       .seconds = 0.2,
+       .loudness = {{0.01, 0.09, tone}, {0.11, 0.2, 0}}},
+      {.name = "the speech at its time",
+       .sounds = {},
+       .speechStartS = 0.05,
+       .toS = 0.2,
+       .seconds = 0.2,
+       .loudness = {{0, 0.049, 0}, {0.05, 0.15, 0.5}, {0.151, 0.2, 0}}},
+      {.name = "the speech and a sound add up",
+       .sounds = {{"tone.wav", 0.0, none, 1, false, 0}},
+       .speechStartS = 0.0,
+       .toS = 0.1,
+       .seconds = 0.3,
+       .loudness = {{0.0, 0.1, std::sqrt(0.25 + tone * tone)}}},
+      {.name = "a sum beyond full scale is clipped",
+       .sounds = {{"loud.wav", 0, none, 1, false, 0}, {"loud.wav", 0, none, 1, false, 0}},
+       .toS = 0.2,
+       .seconds = 0.2,
+       .peak = 32767},
+      {.name = "an unreadable file is left out",
+       .sounds = {{"broken.wav", 0, none, 1, false, 0}},
+       .toS = 0.1,
+       .seconds = 0.1,
+       .loudness = {{0, 0.1, 0}}},
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(c.name);
@@ -183,10 +165,9 @@ TEST(PerformanceAudio, MixesEverySoundAtItsTime) {
     EXPECT_NEAR(audio.seconds(), c.seconds, 0.002);
     EXPECT_EQ(skipped.size(),
               std::string(c.name).find("unreadable") != std::string::npos ? 1u : 0u);
-    for (const auto& l : c.loudness) {
-      SCOPED_TRACE(std::to_string(l.from) + " s to " + std::to_string(l.to) + " s");
-      EXPECT_NEAR(rms(audio, l.from, l.to), l.rms, 0.02 + l.rms * 0.05);
-    }
+    for (const auto& l : c.loudness)
+      EXPECT_NEAR(rms(audio, l.from, l.to), l.rms, 0.02 + l.rms * 0.05)
+          << l.from << " s to " << l.to << " s";
     if (c.peak >= 0) {
       int peak = 0;
       for (const auto s : audio.samples)

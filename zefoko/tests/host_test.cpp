@@ -2,15 +2,15 @@
 // `zefoko serve` process stopped by a signal.
 #include <gtest/gtest.h>
 #include <signal.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
-#include <cstdio>
+#include <chrono>
 #include <cstdlib>
 #include <string>
 #include <vector>
 
 #include "ko/log.hpp"
+#include "ko_test_helpers.hpp"
+#include "ko_test_process.hpp"
 #include "zefoko/host.h"
 #include "zu/zuproxy.h"
 
@@ -57,12 +57,8 @@ TEST(Host, ALibraryThatCannotServeIsAClearError) {
     if (c.failingCreate)
       setenv("ZUECHO_FAIL", "1", 1);
     Host host(quietRobot());
-    try {
-      host.loadModuleLibrary(c.path);
-      ADD_FAILURE() << "no error";
-    } catch (const HostError& e) {
-      EXPECT_NE(std::string(e.what()).find(c.expected), std::string::npos) << e.what();
-    }
+    const std::string error = ko::test::errorOf<HostError>([&] { host.loadModuleLibrary(c.path); });
+    EXPECT_NE(error.find(c.expected), std::string::npos) << error;
     unsetenv("ZUECHO_FAIL");
     EXPECT_FALSE(hasService(host, "ZUEcho"));
   }
@@ -73,36 +69,14 @@ TEST(Host, ALibraryThatCannotServeIsAClearError) {
 
 // `zefoko serve` loads the library, serves until SIGTERM, then ends the modules.
 TEST(ZefokoServe, ServesUntilSigtermThenStops) {
-  int out[2];
-  ASSERT_EQ(pipe(out), 0);
-  const pid_t child = fork();
-  ASSERT_GE(child, 0);
-  if (child == 0) {
-    dup2(out[1], STDOUT_FILENO);
-    close(out[0]);
-    execl(ZEFOKO_EXECUTABLE, ZEFOKO_EXECUTABLE, "serve", "--speech", "timing", ZEFOKO_TEST_PLUGIN,
-          static_cast<char*>(nullptr));
-    _exit(127);
-  }
-  close(out[1]);
-  FILE* lines = fdopen(out[0], "r");
-  std::string seen;
-  char line[512];
-  while (fgets(line, sizeof line, lines)) {
-    seen += line;
-    if (seen.find("serving") != std::string::npos)
-      break;
-  }
-  EXPECT_NE(seen.find("loaded " ZEFOKO_TEST_PLUGIN " ZUEcho"), std::string::npos) << seen;
-  kill(child, SIGTERM);
-  while (fgets(line, sizeof line, lines))
-    seen += line;
-  fclose(lines);
-  int status = 0;
-  ASSERT_EQ(waitpid(child, &status, 0), child);
-  EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << seen;
-  EXPECT_NE(seen.find("SIGTERM, stopping"), std::string::npos) << seen;
-  EXPECT_NE(seen.find("stopped"), std::string::npos) << seen;
+  ko::test::ChildProcess serve(
+      {ZEFOKO_EXECUTABLE, "serve", "--speech", "timing", ZEFOKO_TEST_PLUGIN});
+  EXPECT_TRUE(serve.waitForLine("loaded " ZEFOKO_TEST_PLUGIN " ZUEcho")) << serve.output();
+  ASSERT_TRUE(serve.waitForLine("serving")) << serve.output();
+  serve.kill(SIGTERM);
+  EXPECT_EQ(serve.wait(std::chrono::seconds(30)), 0) << serve.output();
+  EXPECT_NE(serve.output().find("SIGTERM, stopping"), std::string::npos) << serve.output();
+  EXPECT_NE(serve.output().find("stopped"), std::string::npos) << serve.output();
 }
 
 }  // namespace

@@ -6,11 +6,6 @@
 
 namespace bodytalktest {
 
-void CallLog::add(std::string method, std::vector<ZU::ZUValue> args) {
-  std::lock_guard lock(fMutex);
-  fCalls.push_back({std::move(method), std::move(args), std::chrono::steady_clock::now()});
-}
-
 std::vector<Call> CallLog::calls(const std::string& method) const {
   std::lock_guard lock(fMutex);
   std::vector<Call> out;
@@ -29,11 +24,6 @@ std::vector<ko::log::Record> linesOf(ko::log::ScopedCapture& log, std::string_vi
   return out;
 }
 
-bool waitForLines(ko::log::ScopedCapture& log, std::string_view category, ko::log::Level level,
-                  std::string_view part, std::size_t count) {
-  return ko::test::eventually([&] { return linesOf(log, category, level, part).size() >= count; });
-}
-
 // ---- motion ---------------------------------------------------------------------------------
 
 FakeMotion::FakeMotion(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
@@ -45,38 +35,11 @@ FakeMotion::FakeMotion(const std::shared_ptr<ZU::ZUBroker>& broker, const std::s
                              {"setAngles", &FakeMotion::setAngles}});
 }
 
-bool FakeMotion::areResourcesAvailable(const ZU::ZUValue& resourceNames) {
-  log.add("areResourcesAvailable", {resourceNames});
-  return available.load();
-}
-
 std::vector<float> FakeMotion::getAngles(const ZU::ZUValue& names, bool useSensors) {
   log.add("getAngles", {names, ZU::ZUValue::makeBool(useSensors)});
   if (failGetAngles.load())
     ZU_THROW_ERROR(getName(), "getAngles", "joints unplugged");
   return {angle.load()};
-}
-
-void FakeMotion::angleInterpolationBezier(const ZU::ZUValue& jointNames, const ZU::ZUValue& times,
-                                          const ZU::ZUValue& controlPoints) {
-  log.add("angleInterpolationBezier", {jointNames, times, controlPoints});
-  if (const auto task = currentTask())
-    task->waitForStopRequest(moveMs.load());
-}
-
-void FakeMotion::setAngles(const ZU::ZUValue& names, const ZU::ZUValue& angles,
-                           float fractionMaxSpeed) {
-  log.add("setAngles", {names, angles, fractionMaxSpeed});
-}
-
-bool FakeMotion::wait(int id, int timeoutPeriod) {
-  log.add("wait", {id, timeoutPeriod});
-  return ZU::ZUModule::wait(id, timeoutPeriod);
-}
-
-void FakeMotion::stop(int id) {
-  log.add("stop", {id});
-  ZU::ZUModule::stop(id);
 }
 
 // ---- behaviours -----------------------------------------------------------------------------
@@ -124,41 +87,6 @@ std::vector<std::string> FakeBehaviorManager::getBehaviorTags(const std::string&
   return found == fLibrary.end() ? std::vector<std::string>{} : found->second;
 }
 
-std::string FakeBehaviorManager::resolveBehaviorName(const std::string& name) {
-  std::lock_guard lock(fMutex);
-  return fLibrary.count(name) ? name : "";
-}
-
-bool FakeBehaviorManager::preloadBehavior(const std::string& behavior) {
-  log.add("preloadBehavior", {behavior});
-  xFailIfAsked("preloadBehavior", behavior);
-  return true;
-}
-
-void FakeBehaviorManager::startBehavior(const std::string& behavior) {
-  xFailIfAsked("startBehavior", behavior);
-  log.add("startBehavior", {behavior});
-}
-
-void FakeBehaviorManager::stopBehavior(const std::string& behavior) {
-  log.add("stopBehavior", {behavior});
-}
-
-void FakeBehaviorManager::setLibrary(std::map<std::string, std::vector<std::string>> library) {
-  std::lock_guard lock(fMutex);
-  fLibrary = std::move(library);
-}
-
-void FakeBehaviorManager::failOn(const std::string& method, const std::string& behavior) {
-  std::lock_guard lock(fMutex);
-  fFailing.insert({method, behavior});
-}
-
-void FakeBehaviorManager::setTagQueryHook(std::function<void(const std::string&)> hook) {
-  std::lock_guard lock(fMutex);
-  fTagQueryHook = std::move(hook);
-}
-
 std::vector<std::string> FakeBehaviorManager::behaviorsOf(const std::string& method) const {
   std::vector<std::string> out;
   for (const auto& call : log.calls(method))
@@ -185,11 +113,6 @@ std::string FakeRobotPosture::getPostureFamily() {
     ZU_THROW_ERROR(getName(), "getPostureFamily", "no posture sensor");
   std::lock_guard lock(fMutex);
   return fFamily;
-}
-
-void FakeRobotPosture::setFamily(const std::string& family) {
-  std::lock_guard lock(fMutex);
-  fFamily = family;
 }
 
 FakeMemory::FakeMemory(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)

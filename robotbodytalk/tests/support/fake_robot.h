@@ -38,7 +38,10 @@ struct Call {
 
 class CallLog {
  public:
-  void add(std::string method, std::vector<ZU::ZUValue> args);
+  void add(std::string method, std::vector<ZU::ZUValue> args) {
+    std::lock_guard lock(fMutex);
+    fCalls.push_back({std::move(method), std::move(args), std::chrono::steady_clock::now()});
+  }
   // Every call, or those of one method, in arrival order.
   std::vector<Call> calls(const std::string& method = "") const;
   std::size_t count(const std::string& method) const { return calls(method).size(); }
@@ -56,21 +59,38 @@ class CallLog {
 std::vector<ko::log::Record> linesOf(ko::log::ScopedCapture& log, std::string_view category,
                                      ko::log::Level level, std::string_view part = "");
 // Waits (bounded) until `count` such lines have come.
-bool waitForLines(ko::log::ScopedCapture& log, std::string_view category, ko::log::Level level,
-                  std::string_view part, std::size_t count = 1);
+inline bool waitForLines(ko::log::ScopedCapture& log, std::string_view category,
+                         ko::log::Level level, std::string_view part, std::size_t count = 1) {
+  return ko::test::eventually([&] { return linesOf(log, category, level, part).size() >= count; });
+}
 
 class FakeMotion : public ZU::ZUModule {
  public:
   FakeMotion(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name);
 
-  bool areResourcesAvailable(const ZU::ZUValue& resourceNames);
+  bool areResourcesAvailable(const ZU::ZUValue& resourceNames) {
+    log.add("areResourcesAvailable", {resourceNames});
+    return available.load();
+  }
   std::vector<float> getAngles(const ZU::ZUValue& names, bool useSensors);
   // Posted: lasts `moveMs` unless its task is asked to stop.
   void angleInterpolationBezier(const ZU::ZUValue& jointNames, const ZU::ZUValue& times,
-                                const ZU::ZUValue& controlPoints);
-  void setAngles(const ZU::ZUValue& names, const ZU::ZUValue& angles, float fractionMaxSpeed);
-  bool wait(int id, int timeoutPeriod) override;
-  void stop(int id) override;
+                                const ZU::ZUValue& controlPoints) {
+    log.add("angleInterpolationBezier", {jointNames, times, controlPoints});
+    if (const auto task = currentTask())
+      task->waitForStopRequest(moveMs.load());
+  }
+  void setAngles(const ZU::ZUValue& names, const ZU::ZUValue& angles, float fractionMaxSpeed) {
+    log.add("setAngles", {names, angles, fractionMaxSpeed});
+  }
+  bool wait(int id, int timeoutPeriod) override {
+    log.add("wait", {id, timeoutPeriod});
+    return ZU::ZUModule::wait(id, timeoutPeriod);
+  }
+  void stop(int id) override {
+    log.add("stop", {id});
+    ZU::ZUModule::stop(id);
+  }
 
   std::atomic<bool> available{true};
   std::atomic<float> angle{0.0f};
@@ -88,15 +108,34 @@ class FakeBehaviorManager : public ZU::ZUModule {
   // Runs `onTagQuery` first.
   std::vector<std::string> getBehaviorTags(const std::string& behavior);
   // The path itself when it is in the library; "" otherwise.
-  std::string resolveBehaviorName(const std::string& name);
-  bool preloadBehavior(const std::string& behavior);
-  void startBehavior(const std::string& behavior);
-  void stopBehavior(const std::string& behavior);
+  std::string resolveBehaviorName(const std::string& name) {
+    std::lock_guard lock(fMutex);
+    return fLibrary.count(name) ? name : "";
+  }
+  bool preloadBehavior(const std::string& behavior) {
+    log.add("preloadBehavior", {behavior});
+    xFailIfAsked("preloadBehavior", behavior);
+    return true;
+  }
+  void startBehavior(const std::string& behavior) {
+    xFailIfAsked("startBehavior", behavior);
+    log.add("startBehavior", {behavior});
+  }
+  void stopBehavior(const std::string& behavior) { log.add("stopBehavior", {behavior}); }
 
-  void setLibrary(std::map<std::string, std::vector<std::string>> library);
+  void setLibrary(std::map<std::string, std::vector<std::string>> library) {
+    std::lock_guard lock(fMutex);
+    fLibrary = std::move(library);
+  }
   // That method raises a ZUError for that behaviour ("" for getInstalledBehaviors).
-  void failOn(const std::string& method, const std::string& behavior);
-  void setTagQueryHook(std::function<void(const std::string&)> hook);
+  void failOn(const std::string& method, const std::string& behavior) {
+    std::lock_guard lock(fMutex);
+    fFailing.insert({method, behavior});
+  }
+  void setTagQueryHook(std::function<void(const std::string&)> hook) {
+    std::lock_guard lock(fMutex);
+    fTagQueryHook = std::move(hook);
+  }
   // The behaviours of that method's calls, in order (startBehavior: the starts that
   // succeeded).
   std::vector<std::string> behaviorsOf(const std::string& method) const;
@@ -126,7 +165,10 @@ class FakeRobotPosture : public ZU::ZUModule {
  public:
   FakeRobotPosture(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name);
   std::string getPostureFamily();
-  void setFamily(const std::string& family);
+  void setFamily(const std::string& family) {
+    std::lock_guard lock(fMutex);
+    fFamily = family;
+  }
   std::atomic<bool> fail{false};
 
  private:

@@ -1,5 +1,6 @@
 #include "support/recording_module.h"
 
+#include <algorithm>
 #include <string>
 
 #include "zu/zuerror.h"
@@ -39,22 +40,12 @@ void RecordingModule::_mrkpauseCallback(int bookmark) {
   fChanged.wait(lock, [this] { return !fHold; });
 }
 
-void RecordingModule::holdBlockingBookmarks() {
-  std::lock_guard lock(fMutex);
-  fHold = true;
-}
-
 void RecordingModule::releaseBlockingBookmarks() {
   {
     std::lock_guard lock(fMutex);
     fHold = false;
   }
   fChanged.notify_all();
-}
-
-std::vector<ReceivedEvent> RecordingModule::events() const {
-  std::lock_guard lock(fMutex);
-  return fEvents;
 }
 
 std::vector<ReceivedEvent> RecordingModule::events(const std::string& key) const {
@@ -65,11 +56,6 @@ std::vector<ReceivedEvent> RecordingModule::events(const std::string& key) const
       out.push_back(e);
   }
   return out;
-}
-
-std::vector<int> RecordingModule::blockingBookmarks() const {
-  std::lock_guard lock(fMutex);
-  return fBlocking;
 }
 
 bool RecordingModule::waitForEvents(
@@ -96,11 +82,8 @@ std::vector<std::string> statusesOf(const std::vector<ReceivedEvent>& events, in
 }
 
 bool hasStatus(const std::vector<ReceivedEvent>& events, int id, const std::string& word) {
-  for (const auto& s : statusesOf(events, id)) {
-    if (s == word)
-      return true;
-  }
-  return false;
+  const auto statuses = statusesOf(events, id);
+  return std::find(statuses.begin(), statuses.end(), word) != statuses.end();
 }
 
 }  // namespace robotsim::testing

@@ -51,12 +51,21 @@ class RecordingModule : public ZU::ZUModule {
   // module subscribes.
   using Hook = std::function<void(const RecordingModule& self, const std::string& key)>;
   void setHook(Hook hook) { fHook = std::move(hook); }
-  void holdBlockingBookmarks();
+  void holdBlockingBookmarks() {
+    std::lock_guard lock(fMutex);
+    fHold = true;
+  }
   void releaseBlockingBookmarks();
-  std::vector<ReceivedEvent> events() const;
+  std::vector<ReceivedEvent> events() const {
+    std::lock_guard lock(fMutex);
+    return fEvents;
+  }
   // The events of one key, in arrival order.
   std::vector<ReceivedEvent> events(const std::string& key) const;
-  std::vector<int> blockingBookmarks() const;
+  std::vector<int> blockingBookmarks() const {
+    std::lock_guard lock(fMutex);
+    return fBlocking;
+  }
   // Wait at most `bound` until the condition holds on the events received; answer it.
   bool waitForEvents(const std::function<bool(const std::vector<ReceivedEvent>&)>& condition,
                      std::chrono::milliseconds bound) const;
