@@ -75,8 +75,6 @@ TEST(MokutoConfigTest, ResetKeepsOnlyTheFirstPackageAndFourEmptyMaps) {
   EXPECT_EQ(c.animationsPackages, std::vector<std::string>{""});
 }
 
-// ---- names of the enumerations ----
-
 TEST(EnumNamesTest, LookupsMatchTheFirstThreeNamesExactly) {
   const std::map<std::string, ZU::BodyLanguageMode> modes{
       {"disabled", 0}, {"random", 1},  {"contextual", 2},   {"Random", 3}, {"endOfEnum", 3},
@@ -101,8 +99,6 @@ TEST(EnumNamesTest, LookupsMatchTheFirstThreeNamesExactly) {
   c.bodyLanguageMode = 7;
   EXPECT_THAT(printed(c), ::testing::StartsWith("config: bodyLanguageMode: endOfEnum\n"));
 }
-
-// ---- fromZUValue ----
 
 TEST(MokutoConfigFromZUValueTest, SetsEveryKeyAndLaterPairsOverrideEarlierOnes) {
   ko::log::ScopedCapture cap;
@@ -203,8 +199,6 @@ TEST(MokutoConfigFromZUValueTest, MalformedValuesAndElementsAreSkippedSilently) 
   EXPECT_EQ(c.bodyLanguageMode, ZU::BODY_LANGUAGE_MODE_RANDOM);
 }
 
-// ---- updateWordsToTags ----
-
 // Only pairs of a tag and an array count, and only the strings of the array.
 TEST(MokutoConfigWordsTest, AddsTheTagToEachWordKeepsDuplicatesAndSkipsOtherShapes) {
   ko::log::ScopedCapture cap;
@@ -240,8 +234,6 @@ TEST(MokutoConfigWordsTest, PrintedFormListsWordsByTag) {
   c.animationsPackages.clear();
   EXPECT_THAT(printed(c), ::testing::HasSubstr("True\n        tagsToWords: \n"));
 }
-
-// ---- updateTagsToAnimations ----
 
 // Non-strings and animations of unknown posture are logged and the walk goes on; the
 // first element of another shape ends it.
@@ -293,8 +285,6 @@ TEST(MokutoConfigAnimationsTest, NonArrayValueAndOtherPairShapesLogThePattern) {
   c.updateTagsToAnimations(json("[]"));
   EXPECT_EQ(cap->count(), 0u);
 }
-
-// ---- xPostureFamilyFormAnimPath ----
 
 struct PostureCase {
   std::vector<std::string> packages;
