@@ -175,12 +175,8 @@ TEST(MokutoConfigFromZUValueTest, GoesOnAfterARejectedPair) {
   EXPECT_EQ(c.msPauseBeforeSpeech, 20);
   EXPECT_EQ(c.bodyLanguageMode, ZU::BODY_LANGUAGE_MODE_RANDOM);
   EXPECT_FALSE(c.armsBreathingAllowed);
+  // One line for each refused pair: the lines themselves are in the table above.
   EXPECT_EQ(cap->count(), 4u);
-  EXPECT_TRUE(cap->contains("MokutoConfig", Error, "pause time can't be negative."));
-  EXPECT_TRUE(cap->containsPart("MokutoConfig", Error, "Invalid body language mode: \"Random\""));
-  EXPECT_TRUE(cap->contains("MokutoConfig", Error, "uknown key \"volume\" with the value: 1"));
-  EXPECT_TRUE(cap->contains("MokutoConfig", Error,
-                            "uknown key \"armsBreathingAllowed\" with the value: 1"));
 }
 
 TEST(MokutoConfigFromZUValueTest, MalformedValuesAndElementsAreSkippedSilently) {
