@@ -151,7 +151,7 @@ TEST_F(MokutoCommand, AnswersEachCaseWithItsStatusAndMessage) {
        "(the animation was not running)"},
       {"mokuto say --speech timing --fast --tags-to-words '[[\"nosuchtag\", [\"hello\"]]]' hello",
        0, Stream::Out, "AUTO_START_TAG(nosuchtag)  no animation"},
-      {fast + "'Hi ^foo(x) and ^start(no/such/animation) there'", 0, Stream::Out,
+      {fast + "'Hi ^foo(x) and ^start(no/such/animation) there $x=1'", 0, Stream::Out,
        "instruction errors: 2"},
       {fast + "Hi", 0, Stream::Out, "sync figures are meaningless with --fast"},
       {fast + "-", 0, Stream::Out, "say 1 (300 characters): " + std::string(200, 'a') + "\u2026",
