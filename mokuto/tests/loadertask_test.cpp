@@ -136,8 +136,6 @@ class ModuleStandIn : public ZU::ZUModule {
   std::weak_ptr<LoaderTask> fLoader;
 };
 
-// ---- on the simulated robot -----------------------------------------------------------
-
 class LoaderOnRobot : public testing::Test {
  protected:
   LoaderOnRobot() {
@@ -355,8 +353,6 @@ TEST_F(LoaderOnRobot, TheBehaviourAtTheEndIsPreloadedWhenThereIsOneAndNotCounted
   EXPECT_TRUE(
       log->containsPart(kCategory, ko::log::Error, "Could not preload behavior Nowhere_1: "));
 }
-
-// ---- against stand-in services ----------------------------------------------------------
 
 class LoaderOnStandIns : public testing::Test {
  protected:
