@@ -459,8 +459,6 @@ TEST_F(Director, CallsPassTheirJsonArgumentsAndAffectationsRaiseStrings) {
                                  "ZUMemory.noSuchMethod([]) with this error: "));
 }
 
-// ---- construction and subscriptions ------------------------------------------------------
-
 TEST(DirectorSetup, WithoutASpeechEngineTheDirectorCannotBeBuilt) {
   auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
   ZU::MKIDRegister texts;

@@ -136,8 +136,6 @@ class ModuleStandIn : public ZU::ZUModule {
   std::weak_ptr<LoaderTask> fLoader;
 };
 
-// ---- on the simulated robot -----------------------------------------------------------
-
 class LoaderOnRobot : public testing::Test {
  protected:
   LoaderOnRobot() {
@@ -149,11 +147,6 @@ class LoaderOnRobot : public testing::Test {
     robot.emplace(options);
     bodyTalk = std::make_shared<ZU::ZURobotBodyTalkInstance>(robot->broker());
     loader = std::make_shared<LoaderTask>(robot->broker(), bodyTalk);
-  }
-  ~LoaderOnRobot() override {
-    loader.reset();
-    bodyTalk.reset();
-    robot.reset();
   }
 
   ko::AnyObject service(const std::string& name) const { return robot->broker()->service(name); }
@@ -238,7 +231,7 @@ struct StageCase {
   TagMap configured;  // the job's table for its posture family
   std::string code;   // the error code put in front of the written text
   std::string animation;
-  Counts preloads;
+  Counts preloads = {};
   ko::log::Level level = ko::log::Silent;  // Silent: the stage logs nothing
   std::string line{};                      // the whole line, or a part of another service's error
 };
@@ -250,68 +243,37 @@ TEST_F(LoaderOnRobot, PreparesEachKindOfAction) {
   const std::string notFound = "NO_ANIMATION_FOR_CURRENT_POSTURE";
   const std::string unknownPosture =
       " action can't be done because the robot is in an unknown posture.";
+  const TagMap none;
+  const Counts noPreloads;
+  const TagMap heyWithout{{"hey", {}}};  // configured without animations
   const std::vector<StageCase> cases = {
-      {"^start(animations/Stand/Gestures/Hey_1)", Standing, {}, "", kHeyStand, {{kHeyStand, 0}}},
-      {"^start(Wave_1)",
-       Standing,
-       {},
-       "",
-       kWave,
-       {},
-       Warning,
+      {"^start(animations/Stand/Gestures/Hey_1)", Standing, none, "", kHeyStand, {{kHeyStand, 0}}},
+      {"^start(Wave_1)", Standing, none, "", kWave, noPreloads, Warning,
        "Animation name badly formatted given \"Wave_1\" instead of "
        "\"animations/Stand/Gestures/Wave_1\"."},
-      {"^run(animations/Stand/Gestures/Wave_1)", Standing, {}, "", kWave, {}},
-      {"^stop(Nowhere_1)",
-       Standing,
-       {},
-       "ANIMATION_NOT_FOUND",
-       "Nowhere_1",
-       {},
-       Error,
+      {"^run(animations/Stand/Gestures/Wave_1)", Standing, none, "", kWave},
+      {"^stop(Nowhere_1)", Standing, none, "ANIMATION_NOT_FOUND", "Nowhere_1", noPreloads, Error,
        "Animation \"Nowhere_1\" not found. Instruction skipped."},
-      {"^startTag(hey)", Standing, {}, "", kHeyStand, {{kHeyStand, 0}}},
-      {"^stopTag(yes)", SittingOnChair, {}, "", kYesChair, {{kYesChair, 0}}},
-      {"^waitTag(hey)",
-       Sitting,
-       {},
-       notFound,
-       "",
-       {},
-       Warning,
+      {"^startTag(hey)", Standing, none, "", kHeyStand, {{kHeyStand, 0}}},
+      {"^stopTag(yes)", SittingOnChair, none, "", kYesChair, {{kYesChair, 0}}},
+      {"^waitTag(hey)", Sitting, none, notFound, "", noPreloads, Warning,
        "Tag \"hey\" not found for the Sitting posture. Instruction skipped."},
-      {"^runTag(hello)", Unknown, {}, notFound, "", {}, Warning, "^runTag(hello)" + unknownPosture},
-      {"auto:hello",
-       Unknown,
-       {},
-       notFound,
-       "",
-       {},
-       Warning,
+      {"^runTag(hello)", Unknown, none, notFound, "", noPreloads, Warning,
+       "^runTag(hello)" + unknownPosture},
+      {"auto:hello", Unknown, none, notFound, "", noPreloads, Warning,
        "AUTO_START_TAG(hello)" + unknownPosture},
-      {"auto:nothing", Standing, {}, "", "", {}},
+      {"auto:nothing", Standing, none, "", ""},
       {"^startTag(hello)", Standing, {{"hello", {kWave}}}, "", kWave, {{kWave, 0}}},
-      {"^startTag(hey)",
-       Standing,
-       {{"hey", {}}},
-       notFound,
-       "",
-       {},
-       Warning,
+      {"^startTag(hey)", Standing, heyWithout, notFound, "", noPreloads, Warning,
        "Tag \"hey\" not found for the Standing posture. Instruction skipped."},
-      {"^startSound(bells/ding)", Standing, {}, "", "", {}},
-      {"^runSound(nosuch/ding)", Standing, {}, "SOUND_SET_NOT_FOUND", "", {}, Error, "nosuch"},
-      {"^stopSound(nosuch/ding)", Standing, {}, "", "", {}},
-      {"^call(NoSuchService.f())",
-       Standing,
-       {},
-       "MODULE_NOT_FOUND",
-       "",
-       {},
-       Error,
+      {"^startSound(bells/ding)", Standing, none, "", ""},
+      {"^runSound(nosuch/ding)", Standing, none, "SOUND_SET_NOT_FOUND", "", noPreloads, Error,
+       "nosuch"},
+      {"^stopSound(nosuch/ding)", Standing, none, "", ""},
+      {"^call(NoSuchService.f())", Standing, none, "MODULE_NOT_FOUND", "", noPreloads, Error,
        "NoSuchService"},
-      {"^pCall(ZUMemory.getData(\"k\"))", Standing, {}, "", "", {}},
-      {"^mode(random)", Standing, {}, "", "", {}},
+      {"^pCall(ZUMemory.getData(\"k\"))", Standing, none, "", ""},
+      {"^mode(random)", Standing, none, "", ""},
   };
   loader->updateRepresentations("animations/");
   for (const auto& c : cases) {
@@ -392,12 +354,9 @@ TEST_F(LoaderOnRobot, TheBehaviourAtTheEndIsPreloadedWhenThereIsOneAndNotCounted
       log->containsPart(kCategory, ko::log::Error, "Could not preload behavior Nowhere_1: "));
 }
 
-// ---- against stand-in services ----------------------------------------------------------
-
 class LoaderOnStandIns : public testing::Test {
  protected:
   LoaderOnStandIns() : loader(std::make_shared<LoaderTask>(robot.broker, nullptr)) {}
-  ~LoaderOnStandIns() override { loader.reset(); }
 
   bodytalktest::FakeRobot robot;
   bodytalktest::FakeBehaviorManager& manager = *robot.behaviors;

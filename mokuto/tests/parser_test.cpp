@@ -303,11 +303,9 @@ INSTANTIATE_TEST_SUITE_P(Cases, ParsedText,
                                           testing::ValuesIn(kTextCases)),
                          textParamName);
 
-TEST(ParsedJob, InputMode2SetsTheFlagOnly) {
-  auto job = parse("^inputMode2() hello");
-  EXPECT_TRUE(job->config.inputMode2);
-  EXPECT_TRUE(job->actions.empty());
-  EXPECT_TRUE(job->usedBookmarks.empty());
+// Its text, without action or bookmark, is in the table above.
+TEST(ParsedJob, InputMode2SetsTheFlag) {
+  EXPECT_TRUE(parse("^inputMode2() hello")->config.inputMode2);
   EXPECT_FALSE(parse("hello")->config.inputMode2);
 }
 
@@ -354,13 +352,14 @@ TEST(ParsedJob, ActionsOwnTheirConditionsAndOutliveTheJob) {
   sound->condition->notify_all();
 }
 
+// Most lines are the parser's errors, from the function that reads an instruction.
 struct LogCase {
   const char* name;
   std::string input;
-  const char* category;
-  ko::log::Level level;
-  const char* function;
   std::string message;
+  const char* function = "ZU::ZUMokutoParser::xActionContent";
+  const char* category = "mokuto.parser";
+  ko::log::Level level = ko::log::Error;
 };
 
 class ParserLog : public testing::TestWithParam<LogCase> {};
@@ -375,37 +374,33 @@ TEST_P(ParserLog, WritesOneLine) {
   EXPECT_EQ(records[0].function, c.function);
 }
 
+const char* const kSoundError = "ZU::ZUMokutoParser::xPrintSoundParsingError";
+
 INSTANTIATE_TEST_SUITE_P(
     Cases, ParserLog,
     testing::Values(
-        LogCase{"unknown", "^foo(bar)", "mokuto.parser", ko::log::Error,
-                "ZU::ZUMokutoParser::xActionContent",
+        LogCase{"unknown", "^foo(bar)",
                 R"~(Instruction "^foo(bar)" not recognized. Instruction skipped.)~"},
-        LogCase{"mode", "^mode( Random )", "mokuto.parser", ko::log::Error,
-                "ZU::ZUMokutoParser::xActionContent", R"("Random" body language mode is unknown.)"},
+        LogCase{"mode", "^mode( Random )", R"("Random" body language mode is unknown.)"},
         LogCase{
-            "soundName", "^startSound( ding )", "mokuto.parser", ko::log::Error,
-            "ZU::ZUMokutoParser::xPrintSoundParsingError",
-            R"(Bad sound file name in "ding". The sound files has to follow the pattern: "soundSet/soundName")"},
+            "soundName", "^startSound( ding )",
+            R"(Bad sound file name in "ding". The sound files has to follow the pattern: "soundSet/soundName")",
+            kSoundError},
         LogCase{
-            "soundParenthesis", "^runSound(a/b(c), 5)", "mokuto.parser", ko::log::Error,
-            "ZU::ZUMokutoParser::xPrintSoundParsingError",
-            R"(Bad sound file name in "a/b(c), 5". The sound files has to follow the pattern: "soundSet/soundName")"},
-        LogCase{"volume", "^runSound(a/b/c, 101)", "mokuto.parser", ko::log::Error,
-                "ZU::ZUMokutoParser::xActionContent",
+            "soundParenthesis", "^runSound(a/b(c), 5)",
+            R"(Bad sound file name in "a/b(c), 5". The sound files has to follow the pattern: "soundSet/soundName")",
+            kSoundError},
+        LogCase{"volume", "^runSound(a/b/c, 101)",
                 "the second parameter of ^runSound(a/b/c, 101) has to be an integer between 0 "
                 "and 100 (sound volume)"},
-        LogCase{"volumeNotANumber", "^runSound(a/b, loud)", "mokuto.parser", ko::log::Error,
-                "ZU::ZUMokutoParser::xActionContent",
+        LogCase{"volumeNotANumber", "^runSound(a/b, loud)",
                 "the second parameter of ^runSound(a/b, loud) has to be an integer between 0 "
                 "and 100 (sound volume)"},
-        LogCase{"call", "^call(foo)", "mokuto.parser", ko::log::Error,
-                "ZU::ZUMokutoParser::xActionContent",
+        LogCase{"call", "^call(foo)",
                 "This instruction ^call(foo) is badly formated. Here is the pattern to follow: "
                 "ZUModule.method(args)"},
-        LogCase{"deprecatedTag", "^tag(hello)", "Mokuto", ko::log::Warning,
-                "ZU::MKTaskActionType_fromStr",
-                "^tag is deprecated please use ^startTag instead."}),
+        LogCase{"deprecatedTag", "^tag(hello)", "^tag is deprecated please use ^startTag instead.",
+                "ZU::MKTaskActionType_fromStr", "Mokuto", ko::log::Warning}),
     [](const testing::TestParamInfo<LogCase>& p) { return p.param.name; });
 
 TEST(ParserLogSilence, FailuresThatLeaveWordsLogNothing) {
@@ -495,7 +490,6 @@ TEST(BookmarkNumberingLater, ContinuesFromTheLastActionAndResetsTheCurrentAction
 
 TEST(ActionRecords, EachHasItsConditionCopiesShareItAndTheProxy) {
   MKSoundAction sound(START_SOUND);
-  EXPECT_EQ(sound.volume, 100);
   EXPECT_EQ(sound.id, 0u);
   ASSERT_NE(sound.condition, nullptr);
   EXPECT_NE(MKTaskAction(STOP).condition, sound.condition);
@@ -528,7 +522,6 @@ TEST(KeywordTable, EveryWrittenKeywordMapsBackToItsType) {
         << MKTaskActionType_toStr(type);
   }
   EXPECT_EQ(MKTaskActionType_fromStr("UNKNOWN"), UNKNOWN);
-  EXPECT_EQ(MKTaskActionType_fromStr("^Start"), UNKNOWN);
   EXPECT_EQ(MKTaskActionType_fromStr("^start "), UNKNOWN);
   EXPECT_EQ(MKTaskActionType_fromStr(""), UNKNOWN);
   EXPECT_EQ(MKTaskActionType_toStr(-1), "UNKNOWN");
@@ -539,8 +532,6 @@ TEST(KeywordTable, EveryWrittenKeywordMapsBackToItsType) {
 TEST(PrintedForm, MarksTheActionsBeforeTheCurrentOne) {
   const std::string text = R"(Hello \mrk=1\ world \mrkpause=2\)";
   MKTaskInstruction job(4, text, MokutoConfig(), Sitting);
-  EXPECT_EQ(job.id, 4);
-  EXPECT_EQ(job.postureFamily, Sitting);
   const auto printed = [&job] {
     std::ostringstream out;
     out << job;

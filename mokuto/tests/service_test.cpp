@@ -452,8 +452,6 @@ TEST_F(ServiceIndex, TagPageListsTheVisibleTags) {
   EXPECT_EQ(mokuto_->tagPage(), head + table + rows + "</table>" + tail);
 }
 
-// ---- on the whole simulated robot --------------------------------------------------------
-
 TEST(ServiceOnTheRobot, TheTimingCheckerFramesTheEndEventAndComesBackWhenSwitchedOnAgain) {
   mokutotest::ServiceRig rig;
   ko::log::ScopedCapture log(ko::log::Info);
@@ -477,8 +475,6 @@ TEST(ServiceOnTheRobot, TheTimingCheckerFramesTheEndEventAndComesBackWhenSwitche
   }
 }
 
-// ---- the module library -------------------------------------------------------------------
-
 TEST(ServiceLibrary, TheHostLoadsItAndItsEntryPointsAnswerZero) {
   // The texts spoken through the library loaded by a host are the remote processes' tests'.
   zefoko::HostOptions options;
@@ -491,7 +487,6 @@ TEST(ServiceLibrary, TheHostLoadsItAndItsEntryPointsAnswerZero) {
   const auto close =
       reinterpret_cast<ZU::ZUCloseModuleFunction>(::dlsym(library, ZU::kCloseModuleSymbol));
   ASSERT_NE(close, nullptr);
-  EXPECT_NE(::dlsym(library, ZU::kCreateModuleSymbol), nullptr);
   EXPECT_EQ(close(host.broker()), 0);
   EXPECT_EQ(mokuto.call<bool>("_isRunning"), false);  // still serving
   ::dlclose(library);

@@ -133,11 +133,6 @@ void ScriptedSpeech::finish(int id) {
   fChanged.notify_all();
 }
 
-bool ScriptedSpeech::waitForEnd(int id, std::chrono::milliseconds bound) const {
-  std::unique_lock lock(fMutex);
-  return fChanged.wait_for(lock, bound, [&] { return fEnded.count(id) != 0; });
-}
-
 bool ScriptedSpeech::hasEnded(int id) const {
   std::lock_guard lock(fMutex);
   return fEnded.count(id) != 0;

@@ -60,8 +60,6 @@ class ScriptedSpeech : public ZU::ZUModule {
   ko::Future<void> mrkpause(int bookmark);
   // Ends the say `id` as spoken to its end.
   void finish(int id);
-  // Whether the say `id` has returned, after waiting at most `bound`.
-  bool waitForEnd(int id, std::chrono::milliseconds bound = kBound) const;
   bool hasEnded(int id) const;
   std::size_t sayCount() const;
 
