@@ -190,9 +190,7 @@ TEST(MemoryLifetime, ACallbackHoldingTheServiceMayOutliveItsOwners) {
 }
 
 // Once unsubscribeToEvent returns, no callback of that subscription runs or begins.
-TEST(MemoryLifetime, NoCallbackRunsOnceTheUnsubscribeHasReturned) {
-  auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
-  auto memoryModule = ZU::ZUModule::createModule<ZUMemory>(broker, "ZUMemory");
+TEST_F(MemoryTest, NoCallbackRunsOnceTheUnsubscribeHasReturned) {
   std::atomic<bool> unsubscribed{false};
   std::atomic<int> late{0};
   ko::test::Counter ticks;
@@ -207,7 +205,6 @@ TEST(MemoryLifetime, NoCallbackRunsOnceTheUnsubscribeHasReturned) {
       ++late;
     ticks.increment();
   });
-  ZU::ZUMemoryProxy memory(broker);
   for (int round = 0; round < 100; ++round) {
     unsubscribed = false;
     memory.subscribeToEvent("tick", "Late", "onEvent");
@@ -230,10 +227,7 @@ TEST(MemoryLifetime, NoCallbackRunsOnceTheUnsubscribeHasReturned) {
   }
 }
 
-TEST(MemoryLifetime, ACallbackMayEndItsOwnSubscription) {
-  auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
-  auto memoryModule = ZU::ZUModule::createModule<ZUMemory>(broker, "ZUMemory");
-  ZU::ZUMemoryProxy memory(broker);
+TEST_F(MemoryTest, ACallbackMayEndItsOwnSubscription) {
   std::atomic<int> ticks{0};
   ko::test::Counter flushes;
   auto subscriber = ZU::ZUModule::createModule<RecordingModule>(broker, "Self");

@@ -229,18 +229,6 @@ TEST(TextToSpeechEspeak, BlockingBookmarkHoldsTheSpeechUntilItsCallbackReturns) 
   expectReachedOnTime(marks[2]);
 }
 
-TEST(TextToSpeechEspeak, StopDuringAHeldBlockingBookmarkDoesNotWaitForTheCallback) {
-  Robot robot(espeak());
-  robot.mokuto->holdBlockingBookmarks();
-  const int id = robot.tts.post_say("Run \\mrkpause=1\\ then \\mrk=2\\ talk.");
-  ASSERT_TRUE(robot.mokuto->waitForBlockingBookmarks(1, kBound));
-  robot.tts.stop(id);
-  EXPECT_FALSE(robot.tts.wait(id, 10'000));
-  EXPECT_TRUE(robot.waitForStatus(id, "stopped"));
-  robot.mokuto->releaseBlockingBookmarks();
-  EXPECT_EQ(robot.bookmarks(), std::vector<int>{});
-}
-
 // ---- both backends -------------------------------------------------------------------
 
 struct BackendCase {
