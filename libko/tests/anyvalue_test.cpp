@@ -134,15 +134,12 @@ TEST(Json, DecodesEveryKind) {
   EXPECT_EQ(l[7].asInt().size, 4);
 }
 
+// Deep nesting is refused too, not a crash.
 TEST(Json, MalformedTextIsAClearError) {
-  EXPECT_THROW(ko::fromJson("[1, "), ko::JsonError);
-  EXPECT_THROW(ko::fromJson(""), ko::JsonError);
-  EXPECT_THROW(ko::fromJson("[\"a\"] trailing"), ko::JsonError);
-}
-
-TEST(Json, DeepNestingIsRefusedNotACrash) {
-  const std::string deep(100000, '[');
-  EXPECT_THROW(ko::fromJson(deep + std::string(100000, ']')), ko::JsonError);
+  for (const std::string& text :
+       {std::string("[1, "), std::string(), std::string("[\"a\"] trailing"),
+        std::string(100000, '[') + std::string(100000, ']')})
+    EXPECT_THROW(ko::fromJson(text), ko::JsonError) << text.substr(0, 20);
   const int ok = ko::kMaxJsonDepth - 1;
   EXPECT_NO_THROW(ko::fromJson(std::string(ok, '[') + std::string(ok, ']')));
 }

@@ -126,15 +126,13 @@ TEST(ModuleCoreTest, BindingMistakesRaise) {
 
 using ProxyTest = ModuleTest;
 
-TEST_F(ProxyTest, ConstructionErrors) {
+// A proxy on an object takes its label as service name.
+TEST_F(ProxyTest, ConstructionByNameOrOnAnObject) {
   EXPECT_EQ(ko::test::errorOf([] { ZU::ZUProxy("Greeter", nullptr); }),
             "\tZUProxy::ZUProxy\n\tBroker is invalid");
   EXPECT_EQ(zutest::errorOf([&] { ZU::ZUProxy("Nobody", process_.broker); }),
             "Can't find service: Nobody");
   EXPECT_EQ(zutest::errorOf([] { ZU::ZUProxy(ko::AnyObject()); }), "Object is invalid");
-}
-
-TEST_F(ProxyTest, ProxyOnAnObjectTakesItsLabelAsServiceName) {
   const ZU::ZUProxy proxy(ko::GenericObject::makeWeak(greeter_, "Greeter"));
   EXPECT_EQ(proxy.getServiceName(), "Greeter");
   EXPECT_EQ(proxy.call<int>("add", 2, 3), 5);

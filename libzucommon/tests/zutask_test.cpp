@@ -46,9 +46,7 @@ TEST_F(TaskTest, WaitWithoutLimitBlocksUntilTheCallEnds) {
   EXPECT_TRUE(released);
   EXPECT_FALSE(greeter_->isRunning(id));
   releaser.join();
-}
-
-TEST_F(TaskTest, AnIdThatNeverExistedAnswersAtOnce) {
+  // An id that never existed answers at once.
   EXPECT_FALSE(greeter_->wait(4242, 0));
   EXPECT_FALSE(greeter_->isRunning(4242));
   greeter_->stop(4242);

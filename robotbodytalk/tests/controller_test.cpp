@@ -172,19 +172,12 @@ INSTANTIATE_TEST_SUITE_P(
                   [](auto& b) { b.start(kSpeaking, {}, false); }, true, false}),
     [](const auto& p) { return std::string(p.param.name); });
 
-TEST(BodyTalkStartDelay, TheSpeakingHeadMovesAtOnceTheListeningOneAfterOneToFiveSeconds) {
-  {
-    BodyTalkOnFakeRobot t(kFrozen);  // any rest would last 1000 s or more
-    t.bodyTalk->start(kSpeaking, {false, true}, true);
-    EXPECT_TRUE(t.robot.motion->log.waitFor("setAngles", 1));
-  }
-  constexpr double kScale = 0.05;
-  BodyTalkOnFakeRobot t(kScale);
-  const auto start = std::chrono::steady_clock::now();
-  t.bodyTalk->start(kListening, {false, true}, true);
-  ASSERT_TRUE(t.robot.motion->log.waitFor("areResourcesAvailable", 1));
-  const auto first = t.robot.motion->log.calls("areResourcesAvailable").front().time;
-  EXPECT_GE(first - start, std::chrono::milliseconds(static_cast<int>(1000 * kScale)));
+// The listening head's delay of 1 to 5 s is drawn by the head and kept by the worker: their
+// own tests see to it.
+TEST(BodyTalkStartDelay, TheSpeakingHeadMovesAtOnce) {
+  BodyTalkOnFakeRobot t(kFrozen);  // any rest would last 1000 s or more
+  t.bodyTalk->start(kSpeaking, {false, true}, true);
+  EXPECT_TRUE(t.robot.motion->log.waitFor("setAngles", 1));
 }
 
 // ---- the worker's loop ----------------------------------------------------------------------

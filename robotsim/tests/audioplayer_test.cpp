@@ -3,7 +3,6 @@
 // stopped and waited for.
 
 #include <chrono>
-#include <cmath>
 #include <future>
 #include <memory>
 #include <string>
@@ -11,12 +10,12 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sndfile.h>
 
 #include "ko/path.hpp"
 #include "ko_test_helpers.hpp"
 #include "robotsim/robot.h"
 #include "robotsim/soundlibrary.h"
+#include "support/sound_files.h"
 #include "support/timeline_waiter.h"
 #include "zu/zuerror.h"
 #include "zu/zuproxy.h"
@@ -27,43 +26,27 @@ namespace {
 
 namespace fs = std::filesystem;
 using ko::test::ScratchFolder;
+using simtest::writeTone;
 using testing::ElementsAre;
 using testing::HasSubstr;
 
 constexpr int kBoundMs = 10000;
-
-// A WAV file of `frames` frames of a quiet tone.
-void writeWav(const fs::path& file, int rate, int channels, sf_count_t frames) {
-  fs::create_directories(file.parent_path());
-  SF_INFO info{};
-  info.samplerate = rate;
-  info.channels = channels;
-  info.format = SF_FORMAT_WAV | SF_FORMAT_PCM_16;
-  SNDFILE* sound = sf_open(file.c_str(), SFM_WRITE, &info);
-  ASSERT_NE(sound, nullptr) << sf_strerror(nullptr);
-  std::vector<short> samples(static_cast<std::size_t>(frames * channels));
-  for (std::size_t i = 0; i < samples.size(); ++i)
-    samples[i] = static_cast<short>(1000.0 * std::sin(static_cast<double>(i) * 0.05));
-  EXPECT_EQ(sf_writef_short(sound, samples.data(), frames), frames);
-  sf_close(sound);
-}
 
 TEST(SoundFiles, DurationsComeFromTheFiles) {
   const struct {
     const char* name;
     int rate;
     int channels;
-    sf_count_t frames;
     double seconds;
   } cases[] = {
-      {"short.wav", 8000, 1, 2000, 0.25},
-      {"stereo.wav", 16000, 2, 4000, 0.25},
-      {"odd.wav", 44100, 1, 22050, 0.5},
-      {"empty.wav", 8000, 1, 0, 0.0},
+      {"short.wav", 8000, 1, 0.25},
+      {"stereo.wav", 16000, 2, 0.25},
+      {"odd.wav", 44100, 1, 0.5},
+      {"empty.wav", 8000, 1, 0.0},
   };
   ScratchFolder folder;
   for (const auto& c : cases) {
-    writeWav(folder.path() / "set" / c.name, c.rate, c.channels, c.frames);
+    writeTone(folder.path() / "set" / c.name, c.seconds, c.rate, c.channels);
     EXPECT_DOUBLE_EQ(soundFileDuration(folder.path() / "set" / c.name), c.seconds) << c.name;
   }
   folder.write("set/broken.wav", "not a sound");
@@ -88,8 +71,8 @@ TEST(SoundFiles, DurationsComeFromTheFiles) {
 // The simulated robot with the sound sets written in `folder`: "tones" with a 0.2 s "beep"
 // and a 10 s "Long".
 RobotOptions robotWithTones(const ScratchFolder& folder) {
-  writeWav(folder.path() / "tones" / "beep.wav", 8000, 1, 1600);
-  writeWav(folder.path() / "tones" / "Long.WAV", 8000, 1, 80000);
+  writeTone(folder.path() / "tones" / "beep.wav", 0.2, 8000);
+  writeTone(folder.path() / "tones" / "Long.WAV", 10, 8000);
   RobotOptions options;
   options.soundsRoot = options.behaviorsRoot = folder.path().string();
   options.speech.backend = ZUTextToSpeechOptions::Backend::Timing;

@@ -81,11 +81,9 @@ struct Spoken {
   double durationUs = 0;
 };
 
-Spoken speak(const std::string& text,
-             ZUTextToSpeechOptions::Backend backend = ZUTextToSpeechOptions::Backend::Espeak) {
+Spoken speak(const std::string& text) {
   const auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
   ZUTextToSpeechOptions options;
-  options.backend = backend;
   options.language = "Japanese";
   options.playbackRate = kSpeechAsFastAsPossible;
   options.recordAudio = false;

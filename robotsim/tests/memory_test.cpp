@@ -3,7 +3,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <memory>
@@ -24,18 +23,6 @@ namespace robotsim {
 namespace {
 
 using testing::RecordingModule;
-using namespace std::chrono_literals;
-
-// Waits until `module` got `count` events of `key`.
-bool waitFor(const RecordingModule& module, const std::string& key, std::size_t count) {
-  return module.waitForEvents(
-      [&](const auto& events) {
-        return std::count_if(events.begin(), events.end(), [&](const auto& e) {
-                 return e.key == key;
-               }) >= static_cast<std::ptrdiff_t>(count);
-      },
-      10s);
-}
 
 class MemoryTest : public ::testing::Test {
  protected:
@@ -70,9 +57,9 @@ TEST_F(MemoryTest, EachSubscriberGetsEveryEventInEachRaisersOrder) {
   }
   for (auto& r : raisers)
     r.join();
-  ASSERT_TRUE(waitFor(*first, "counter", kThreads * kEach));
-  ASSERT_TRUE(waitFor(*first, "other", kThreads * kEach / 25));
-  ASSERT_TRUE(waitFor(*second, "counter", kThreads * kEach));
+  ASSERT_TRUE(first->waitForEvents("counter", kThreads * kEach));
+  ASSERT_TRUE(first->waitForEvents("other", kThreads * kEach / 25));
+  ASSERT_TRUE(second->waitForEvents("counter", kThreads * kEach));
   EXPECT_TRUE(second->events("other").empty());
   for (const auto* module : {first.get(), second.get()}) {
     std::vector<int> next(kThreads, 0);  // each raiser's next counter
@@ -91,15 +78,15 @@ TEST_F(MemoryTest, EachSubscriberGetsEveryEventInEachRaisersOrder) {
 TEST_F(MemoryTest, SubscriptionsAreReplacedEndedOrRefused) {
   memory.subscribeToMicroEvent("WordRecognized", "First", "_dialogMatchedInputCallback", "onEvent");
   memory.raiseEvent("WordRecognized", ZU::ZUValue::makeArray({"hello", 0.5F}));
-  ASSERT_TRUE(waitFor(*first, "WordRecognized", 1));
+  ASSERT_TRUE(first->waitForEvents("WordRecognized", 1));
   memory.subscribeToEvent("WordRecognized", "First", "onEvent");
   memory.subscribeToEvent("b", "First", "onEvent");
   memory.raiseEvent("WordRecognized", ZU::ZUValue(2));
-  ASSERT_TRUE(waitFor(*first, "WordRecognized", 2));
+  ASSERT_TRUE(first->waitForEvents("WordRecognized", 2));
   memory.unsubscribeToEvent("WordRecognized", "First");
   memory.raiseEvent("WordRecognized", ZU::ZUValue(3));
   memory.raiseEvent("b", ZU::ZUValue(4));  // delivered after anything raised before it
-  ASSERT_TRUE(waitFor(*first, "b", 1));
+  ASSERT_TRUE(first->waitForEvents("b", 1));
   const auto words = first->events("WordRecognized");
   ASSERT_EQ(words.size(), 2U);
   EXPECT_EQ(words[0].message, "_dialogMatchedInputCallback");
@@ -146,7 +133,7 @@ TEST_F(MemoryTest, FailingOrMissingSubscribersAreLoggedAndSkipped) {
   gone.reset();
 
   memory.raiseEvent("e", ZU::ZUValue(1));
-  ASSERT_TRUE(waitFor(*third, "e", 1));
+  ASSERT_TRUE(third->waitForEvents("e", 1));
   for (const char* line :
        {"First.failingCallback failed on event e", "Module Gone is gone: event e not delivered",
         "Module NeverThere is gone: event e not delivered",
@@ -158,7 +145,7 @@ TEST_F(MemoryTest, FailingOrMissingSubscribersAreLoggedAndSkipped) {
   // The failing subscribers' queues go on.
   memory.subscribeToEvent("f", "First", "onEvent");
   memory.raiseEvent("f", ZU::ZUValue(2));
-  EXPECT_TRUE(waitFor(*first, "f", 1));
+  EXPECT_TRUE(first->waitForEvents("f", 1));
 }
 
 // ---- lifetimes --------------------------------------------------------------------
@@ -190,9 +177,7 @@ TEST(MemoryLifetime, ACallbackHoldingTheServiceMayOutliveItsOwners) {
 }
 
 // Once unsubscribeToEvent returns, no callback of that subscription runs or begins.
-TEST(MemoryLifetime, NoCallbackRunsOnceTheUnsubscribeHasReturned) {
-  auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
-  auto memoryModule = ZU::ZUModule::createModule<ZUMemory>(broker, "ZUMemory");
+TEST_F(MemoryTest, NoCallbackRunsOnceTheUnsubscribeHasReturned) {
   std::atomic<bool> unsubscribed{false};
   std::atomic<int> late{0};
   ko::test::Counter ticks;
@@ -207,7 +192,6 @@ TEST(MemoryLifetime, NoCallbackRunsOnceTheUnsubscribeHasReturned) {
       ++late;
     ticks.increment();
   });
-  ZU::ZUMemoryProxy memory(broker);
   for (int round = 0; round < 100; ++round) {
     unsubscribed = false;
     memory.subscribeToEvent("tick", "Late", "onEvent");
@@ -230,10 +214,7 @@ TEST(MemoryLifetime, NoCallbackRunsOnceTheUnsubscribeHasReturned) {
   }
 }
 
-TEST(MemoryLifetime, ACallbackMayEndItsOwnSubscription) {
-  auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
-  auto memoryModule = ZU::ZUModule::createModule<ZUMemory>(broker, "ZUMemory");
-  ZU::ZUMemoryProxy memory(broker);
+TEST_F(MemoryTest, ACallbackMayEndItsOwnSubscription) {
   std::atomic<int> ticks{0};
   ko::test::Counter flushes;
   auto subscriber = ZU::ZUModule::createModule<RecordingModule>(broker, "Self");

@@ -2,8 +2,6 @@
 // resampled, cut where they were stopped, looped, clipped; measured as the loudness (RMS)
 // of stretches of the mix.
 
-#include <sndfile.h>
-
 #include <algorithm>
 #include <cmath>
 #include <cstdint>
@@ -15,33 +13,16 @@
 
 #include "ko_test_helpers.hpp"
 #include "robotsim/performanceaudio.h"
+#include "support/sound_files.h"
 
 namespace robotsim {
 namespace {
 
 namespace fs = std::filesystem;
 using ko::test::ScratchFolder;
+using simtest::writeTone;
 
-constexpr double kPi = 3.14159265358979;
-constexpr int kSoundRate = 16000;  // as the sound library's files
 constexpr int kSpeechRate = 22050;
-
-// `silence` seconds of silence, then `seconds` of a 440 Hz tone of that amplitude.
-void writeTone(const fs::path& file, double silence, double seconds, double amplitude) {
-  SF_INFO info{};
-  info.samplerate = kSoundRate;
-  info.channels = 1;
-  info.format = SF_FORMAT_WAV | SF_FORMAT_PCM_16;
-  SNDFILE* sound = sf_open(file.c_str(), SFM_WRITE, &info);
-  ASSERT_NE(sound, nullptr) << sf_strerror(nullptr);
-  const auto quiet = static_cast<std::size_t>(silence * kSoundRate);
-  std::vector<float> samples(quiet + static_cast<std::size_t>(seconds * kSoundRate), 0.0F);
-  for (std::size_t i = quiet; i < samples.size(); ++i)
-    samples[i] = static_cast<float>(
-        amplitude * std::sin(2 * kPi * 440.0 * static_cast<double>(i) / kSoundRate));
-  sf_write_float(sound, samples.data(), static_cast<sf_count_t>(samples.size()));
-  sf_close(sound);
-}
 
 double rms(const PerformanceAudio& audio, double from, double to) {
   const auto begin = static_cast<std::size_t>(from * audio.sampleRate);
@@ -77,10 +58,10 @@ struct MixCase {
 
 TEST(PerformanceAudio, MixesEverySoundAtItsTime) {
   const ScratchFolder folder;
-  writeTone(folder.path() / "tone.wav", 0, 0.3, 0.5);
-  writeTone(folder.path() / "short.wav", 0, 0.1, 0.5);
-  writeTone(folder.path() / "loud.wav", 0, 0.2, 0.9);
-  writeTone(folder.path() / "late.wav", 0.2, 0.2, 0.5);
+  writeTone(folder.path() / "tone.wav", 0.3);
+  writeTone(folder.path() / "short.wav", 0.1);
+  writeTone(folder.path() / "loud.wav", 0.2, 16000, 1, 0.9);
+  writeTone(folder.path() / "late.wav", 0.2, 16000, 1, 0.5, 0.2);
   folder.write("broken.wav", "not a sound");
   const double tone = 0.5 / std::sqrt(2.0);  // the RMS of the tone at full volume
   const auto none = std::nullopt;

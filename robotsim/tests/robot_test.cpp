@@ -14,8 +14,6 @@
 
 namespace {
 
-using namespace std::chrono_literals;
-
 robotsim::RobotOptions timingRobot() {
   robotsim::RobotOptions options;
   options.speech.backend = robotsim::ZUTextToSpeechOptions::Backend::Timing;
@@ -73,7 +71,7 @@ TEST(Robot, PostureFamilyChangesRaiseTheirEventOnce) {
   EXPECT_EQ(posture.getPostureFamily(), "Sitting");
   raw.call<void>("setPostureFamily", "SittingOnChair");
   EXPECT_EQ(posture.getPostureFamily(), "SittingOnChair");
-  ASSERT_TRUE(listener->waitForEvents([](const auto& e) { return e.size() >= 2; }, 10s));
+  ASSERT_TRUE(listener->waitForEvents("PostureFamilyChanged", 2));
   const auto events = listener->events("PostureFamilyChanged");
   ASSERT_EQ(events.size(), 2u);
   EXPECT_EQ(events[0].value.asString(), "Sitting");

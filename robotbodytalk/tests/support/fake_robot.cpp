@@ -96,9 +96,8 @@ std::vector<std::string> FakeBehaviorManager::behaviorsOf(const std::string& met
 
 // ---- posture, model, memory -------------------------------------------------------------------
 
-FakeRobotModel::FakeRobotModel(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name,
-                               int robotType)
-    : ZU::ZUModule(broker, name), fRobotType(robotType) {
+FakeRobotModel::FakeRobotModel(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name)
+    : ZU::ZUModule(broker, name) {
   bindMethods("FakeRobotModel", {{"_getRobotType", &FakeRobotModel::_getRobotType}});
 }
 
@@ -137,7 +136,7 @@ void FakeMemory::unsubscribeToEvent(const std::string& name, const std::string& 
 
 // ---- the process ------------------------------------------------------------------------------
 
-FakeRobot::FakeRobot(int robotType)
+FakeRobot::FakeRobot()
     : session(std::make_shared<ko::Session>()),
       broker(ZU::ZUBroker::create(session, "BodyTalkTestBroker",
                                   std::make_shared<ZU::ZUBrokerManager>())) {
@@ -146,7 +145,7 @@ FakeRobot::FakeRobot(int robotType)
   motion = ZUModule::createModule<FakeMotion>(broker, "ZUMotion");
   behaviors = ZUModule::createModule<FakeBehaviorManager>(broker, "ZUBehaviorManager");
   posture = ZUModule::createModule<FakeRobotPosture>(broker, "ZURobotPosture");
-  model = ZUModule::createModule<FakeRobotModel>(broker, "ZURobotModel", robotType);
+  model = ZUModule::createModule<FakeRobotModel>(broker, "ZURobotModel");
 }
 
 FakeRobot::~FakeRobot() {

@@ -151,14 +151,11 @@ class FakeBehaviorManager : public ZU::ZUModule {
   std::function<void(const std::string&)> fTagQueryHook;
 };
 
+// A robot of type 1.
 class FakeRobotModel : public ZU::ZUModule {
  public:
-  FakeRobotModel(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name,
-                 int robotType);
-  int _getRobotType() { return fRobotType; }
-
- private:
-  const int fRobotType;
+  FakeRobotModel(const std::shared_ptr<ZU::ZUBroker>& broker, const std::string& name);
+  int _getRobotType() { return 1; }
 };
 
 class FakeRobotPosture : public ZU::ZUModule {
@@ -191,7 +188,7 @@ class FakeMemory : public ZU::ZUModule {
 
 // A process with these services under their robot names.
 struct FakeRobot {
-  explicit FakeRobot(int robotType = 1);
+  FakeRobot();
   ~FakeRobot();
   FakeRobot(const FakeRobot&) = delete;
   FakeRobot& operator=(const FakeRobot&) = delete;
@@ -224,8 +221,7 @@ class BodyTalkHandle {
 // The fake robot, a capture of every log line and the body talk on that robot, its posture
 // watcher started: what most body talk tests begin with.
 struct BodyTalkOnFakeRobot {
-  explicit BodyTalkOnFakeRobot(double timeScale, int robotType = 1)
-      : robot(robotType), bodyTalk(robot.broker, timeScale) {
+  explicit BodyTalkOnFakeRobot(double timeScale) : bodyTalk(robot.broker, timeScale) {
     bodyTalk->getPosture()->init();
   }
   FakeRobot robot;

@@ -65,6 +65,16 @@ bool RecordingModule::waitForEvents(
   return fChanged.wait_for(lock, bound, [&] { return condition(fEvents); });
 }
 
+bool RecordingModule::waitForEvents(const std::string& key, std::size_t count,
+                                    std::chrono::milliseconds bound) const {
+  return waitForEvents(
+      [&](const auto& all) {
+        return std::count_if(all.begin(), all.end(), [&](const auto& e) { return e.key == key; }) >=
+               static_cast<std::ptrdiff_t>(count);
+      },
+      bound);
+}
+
 bool RecordingModule::waitForBlockingBookmarks(std::size_t count,
                                                std::chrono::milliseconds bound) const {
   std::unique_lock lock(fMutex);

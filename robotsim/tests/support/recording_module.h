@@ -69,6 +69,9 @@ class RecordingModule : public ZU::ZUModule {
   // Wait at most `bound` until the condition holds on the events received; answer it.
   bool waitForEvents(const std::function<bool(const std::vector<ReceivedEvent>&)>& condition,
                      std::chrono::milliseconds bound) const;
+  // Wait at most `bound` until `count` events of `key` have come; answer whether they have.
+  bool waitForEvents(const std::string& key, std::size_t count,
+                     std::chrono::milliseconds bound = std::chrono::seconds(10)) const;
   bool waitForBlockingBookmarks(std::size_t count, std::chrono::milliseconds bound) const;
 
  private:
