@@ -328,8 +328,10 @@ TEST_F(LoaderOnRobot, TwoStartsOfOneAnimationPreloadItOnceAndOtherStopsAreIgnore
   EXPECT_THAT(loader->getPreloadCounts(), IsEmpty());
 }
 
-TEST_F(LoaderOnRobot, TheBehaviourAtTheEndIsPreloadedAndNotCounted) {
+TEST_F(LoaderOnRobot, TheBehaviourAtTheEndIsPreloadedWhenThereIsOneAndNotCounted) {
   ZU::MokutoConfig config;
+  loader->process(*job("Hello.", ZU::Standing, config));
+  EXPECT_THAT(robot->timeline()->entries("ZUBehaviorManager", "preloadBehavior"), IsEmpty());
   config.behaviorAtEndOfMokuto = kWave;
   loader->process(*job("Hello.", ZU::Standing, config));
   EXPECT_EQ(preloadsOf(kWave), 1u);
