@@ -1,6 +1,5 @@
 #include <gtest/gtest.h>
 
-#include <algorithm>
 #include <condition_variable>
 #include <memory>
 #include <random>

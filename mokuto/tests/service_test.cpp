@@ -9,7 +9,6 @@
 #include <atomic>
 #include <chrono>
 #include <future>
-#include <map>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -20,12 +19,10 @@
 
 #include "director_rig.h"
 #include "ko/log.hpp"
-#include "ko/reaper.hpp"
 #include "ko/session.hpp"
 #include "ko_test_helpers.hpp"
 #include "mokuto/zumokuto.h"
 #include "robotsim/timeline.h"
-#include "robotsim/zumemory.h"
 #include "scripted_speech.h"
 #include "service_rig.h"
 #include "support/fake_robot.h"
