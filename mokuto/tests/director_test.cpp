@@ -97,11 +97,7 @@ class Director : public testing::Test {
               const std::string& first2) const {
     std::ptrdiff_t a = -1, b = -1, index = 0;
     for (const auto& entry : rig_.timeline->entries()) {
-      std::string argument;
-      try {
-        argument = entry.arguments.to<std::vector<ko::AnyValue>>().at(0).to<std::string>();
-      } catch (const std::exception&) {
-      }
+      const std::string argument = mokutotest::firstArgument(entry);
       if (a < 0 && entry.operation == operation && argument == first)
         a = index;
       if (b < 0 && entry.operation == operation2 && argument == first2)
@@ -119,14 +115,6 @@ class Director : public testing::Test {
 };
 
 // ---- speech and bookmarks ----------------------------------------------------------------
-
-TEST_F(Director, ATextWithoutInstructionsEndsWithItsSpeech) {
-  Run run = begin(rig_.job("Hello there"), false);
-  EXPECT_EQ(run.say.text, "Hello there");
-  EXPECT_EQ(run.done.wait_for(100ms), std::future_status::timeout);
-  ASSERT_TRUE(end(run));
-  EXPECT_TRUE(recorder_->reports().empty());
-}
 
 TEST_F(Director, EarlyBookmarksWaitForTheActionsBeforeThem) {
   Run run = begin(rig_.job("One $a=1 two $b=1"));
@@ -442,10 +430,9 @@ TEST_F(Director, CallsPassTheirJsonArgumentsAndAffectationsRaiseStrings) {
   ASSERT_TRUE(rig_.waitFor("ZUMemory", "raiseEvent", "x"));
   EXPECT_TRUE(end(run));
   const auto valueOf = [this](const std::string& key) {
-    for (const auto& e : rig_.timeline->entries("ZUMemory", "raiseEvent")) {
-      const auto args = e.arguments.to<std::vector<ko::AnyValue>>();
-      if (args.at(0).to<std::string>() == key)
-        return args.at(1);
+    for (const auto& [raised, value] : mokutotest::raisedEvents(*rig_.timeline)) {
+      if (raised == key)
+        return value;
     }
     return ko::AnyValue();
   };
@@ -462,16 +449,8 @@ TEST_F(Director, CallsPassTheirJsonArgumentsAndAffectationsRaiseStrings) {
 TEST(DirectorSetup, WithoutASpeechEngineTheDirectorCannotBeBuilt) {
   auto broker = ZU::ZUBroker::create(std::make_shared<ko::Session>());
   ZU::MKIDRegister texts;
-  try {
-    ZU::DirectorTask director(broker, nullptr, texts);
-    FAIL() << "built";
-  } catch (const ZU::ZUError& e) {
-    EXPECT_EQ(e.moduleName(), "ZUMokuto");
-    EXPECT_EQ(e.methodName(), "Constructor");
-    EXPECT_EQ(e.description(), "Module ZUTextToSpeech not found");
-    EXPECT_EQ(e.sourceFile(), "mokuto/src/directortask");
-    EXPECT_EQ(e.sourceLine(), 81);
-  }
+  EXPECT_EQ(ko::test::errorOf<ZU::ZUError>([&] { ZU::DirectorTask(broker, nullptr, texts); }),
+            "\tZUMokuto::Constructor\n\tModule ZUTextToSpeech not found");
 }
 
 TEST(DirectorSetup, SubscriptionFailuresAreLoggedOneByOne) {

@@ -9,7 +9,6 @@
 #include <atomic>
 #include <cstdlib>
 #include <future>
-#include <mutex>
 #include <string>
 #include <vector>
 

@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "ko/log.hpp"
+#include "ko_test_helpers.hpp"
 #include "lingtest.h"
 #include "mkbdb/writer.h"
 #include "mokuto/zulingsyntacticanalyzerbinarydatabase.h"
@@ -258,16 +259,9 @@ TEST(LingLexiconTest, MalformedLinesAreRefusedWithTheirLine) {
     SCOPED_TRACE(line);
     mkbdb::Lexicon lexicon;
     std::istringstream in(std::string("ok\tnoun\n") + line + "\n");
-    EXPECT_THROW(
-        {
-          try {
-            mkbdb::readLexicon(in, "lex", lexicon);
-          } catch (const std::runtime_error& e) {
-            EXPECT_THAT(e.what(), ::testing::StartsWith("lex:2: "));
-            throw;
-          }
-        },
-        std::runtime_error);
+    EXPECT_THAT(
+        ko::test::errorOf<std::runtime_error>([&] { mkbdb::readLexicon(in, "lex", lexicon); }),
+        ::testing::StartsWith("lex:2: "));
   }
 }
 

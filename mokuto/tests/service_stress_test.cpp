@@ -110,10 +110,9 @@ TEST(ServiceStress, EightCallersAndTheirStoppersEndEveryTextOnce) {
   EXPECT_FALSE(mokuto->_isRunning());
 
   std::map<int, int> ends;
-  for (const auto& entry : rig.robot->timeline()->entries("ZUMemory", "raiseEvent")) {
-    const auto arguments = entry.arguments.to<std::vector<ko::AnyValue>>();
-    if (arguments.at(0).to<std::string>() == ZU::ZUMokuto::kEndEvent)
-      ++ends[arguments.at(1).to<int>()];
+  for (const auto& [key, value] : mokutotest::raisedEvents(*rig.robot->timeline())) {
+    if (key == ZU::ZUMokuto::kEndEvent)
+      ++ends[value.to<int>()];
   }
   EXPECT_EQ(failures.load(), 0);
   EXPECT_EQ(static_cast<int>(ends.size()), kCallers * says);

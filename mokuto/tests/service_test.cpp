@@ -9,7 +9,6 @@
 #include <atomic>
 #include <chrono>
 #include <future>
-#include <map>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -20,12 +19,10 @@
 
 #include "director_rig.h"
 #include "ko/log.hpp"
-#include "ko/reaper.hpp"
 #include "ko/session.hpp"
 #include "ko_test_helpers.hpp"
 #include "mokuto/zumokuto.h"
 #include "robotsim/timeline.h"
-#include "robotsim/zumemory.h"
 #include "scripted_speech.h"
 #include "service_rig.h"
 #include "support/fake_robot.h"
@@ -110,10 +107,9 @@ class ServicePipeline : public testing::Test {
   // The values of the end events raised so far, in order.
   std::vector<int> endEvents() const {
     std::vector<int> values;
-    for (const auto& entry : timeline_->entries("ZUMemory", "raiseEvent")) {
-      const auto arguments = entry.arguments.to<std::vector<ko::AnyValue>>();
-      if (arguments.at(0).to<std::string>() == kEnd)
-        values.push_back(arguments.at(1).to<int>());
+    for (const auto& [key, value] : mokutotest::raisedEvents(*timeline_)) {
+      if (key == kEnd)
+        values.push_back(value.to<int>());
     }
     return values;
   }
@@ -349,15 +345,8 @@ TEST_F(ServicePipeline, ConfigurationMethodsRefuseBadValuesAndKeepTheConfigurati
       {"negative pause", [&] { mokuto_->_setMSPauseBeforeSpeech(-1); },
        "\tZUMokuto::setMSPauseBeforeSpeech\n\tpause time can't be negative."},
   };
-  for (const auto& c : cases) {
-    SCOPED_TRACE(c.name);
-    try {
-      c.call();
-      ADD_FAILURE() << "no error";
-    } catch (const ZU::ZUError& e) {
-      EXPECT_EQ(std::string(e.what()), c.text);
-    }
-  }
+  for (const auto& c : cases)
+    EXPECT_EQ(ko::test::errorOf<ZU::ZUError>(c.call), c.text) << c.name;
   EXPECT_EQ(mokuto_->getBodyLanguageModeToStr(), "disabled");
   EXPECT_EQ(mokuto_->_getMSPauseBeforeSpeech(), 500);
 
@@ -463,10 +452,9 @@ TEST(ServiceOnTheRobot, TheTimingCheckerFramesTheEndEventAndComesBackWhenSwitche
     log->clear();
     rig.mokuto->say("Hello $a=1");
     std::vector<std::string> events;
-    for (const auto& entry : rig.robot->timeline()->entries("ZUMemory", "raiseEvent")) {
-      const auto key = entry.arguments.to<std::vector<ko::AnyValue>>().at(0).to<std::string>();
-      if (key.rfind("ZUMokuto/", 0) == 0)
-        events.push_back(key);
+    for (const auto& event : mokutotest::raisedEvents(*rig.robot->timeline())) {
+      if (event.first.rfind("ZUMokuto/", 0) == 0)
+        events.push_back(event.first);
     }
     EXPECT_EQ(events, on ? framed : std::vector<std::string>{kEnd});
     EXPECT_EQ(log->containsPart("mokuto.times", ko::log::Info,

@@ -460,12 +460,8 @@ TEST_F(MokutoCommand, DryRunShowsWhatTheLoaderResolvedWithoutSpeaking) {
   EXPECT_EQ(find(lines, entry("ZUTextToSpeech", "say")), -1);
 }
 
-// A command started in a process group of its own (setsid), as `timeout` starts one, its
+// The command starts in a process group of its own (setsid), as `timeout` starts one, its
 // output in a file: a signal goes to it alone or to its whole group.
-void sendSignal(ko::test::ChildProcess& command, int number, bool group) {
-  ::kill(group ? -command.pid() : command.pid(), number);
-}
-
 TEST_F(MokutoCommand, SignalsStopTheTextAndTheSummaryStillComes) {
   struct SignalCase {
     int signal;
@@ -498,12 +494,13 @@ TEST_F(MokutoCommand, SignalsStopTheTextAndTheSummaryStillComes) {
                                     "exec " + say + (c.second ? endBehavior : "") +
                                         (c.quiet ? "--quiet " : "") + quoted(kText) +
                                         " </dev/null >" + quoted((folder / "out.txt").string())});
+    const auto sendSignal = [&] { ::kill(c.group ? -command.pid() : command.pid(), c.signal); };
     ASSERT_TRUE(command.waitForLine("Animated saying", 60s)) << command.output();
-    sendSignal(command, c.signal, c.group);
+    sendSignal();
     if (c.second) {
       ASSERT_TRUE(command.waitForLine("a second signal ends the command at once", 60s))
           << command.output();
-      sendSignal(command, c.signal, c.group);
+      sendSignal();
     }
     EXPECT_EQ(command.wait(60s), 130) << command.output();
     const std::string out = readFile(folder / "out.txt");

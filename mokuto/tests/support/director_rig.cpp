@@ -1,9 +1,7 @@
 #include "director_rig.h"
 
 #include <chrono>
-#include <condition_variable>
 #include <fstream>
-#include <mutex>
 #include <sstream>
 #include <utility>
 
@@ -50,6 +48,8 @@ void writeGesture(const fs::path& root, const Gesture& gesture) {
       << "], \"keys\": [[0.2, [3, " << -gesture.seconds / 3 << ", 0.0], [3, 0.0, 0.0]]]}}}";
 }
 
+}  // namespace
+
 std::string firstArgument(const robotsim::TimelineEntry& entry) {
   try {
     const auto list = entry.arguments.to<std::vector<ko::AnyValue>>();
@@ -59,7 +59,17 @@ std::string firstArgument(const robotsim::TimelineEntry& entry) {
   }
 }
 
-}  // namespace
+std::vector<std::pair<std::string, ko::AnyValue>> raisedEvents(const robotsim::Timeline& timeline) {
+  std::vector<std::pair<std::string, ko::AnyValue>> events;
+  for (const auto& entry : timeline.entries("ZUMemory", "raiseEvent")) {
+    try {
+      const auto arguments = entry.arguments.to<std::vector<ko::AnyValue>>();
+      events.emplace_back(arguments.at(0).to<std::string>(), arguments.at(1));
+    } catch (const std::exception&) {
+    }
+  }
+  return events;
+}
 
 const std::string& writeGestureLibrary(const ko::test::ScratchFolder& folder) {
   for (const auto& gesture : kGestures)
@@ -67,13 +77,7 @@ const std::string& writeGestureLibrary(const ko::test::ScratchFolder& folder) {
   return folder.path().native();
 }
 
-// Wakes the waiters at each timeline entry; lives as long as the timeline.
-struct DirectorRig::Waiter {
-  std::mutex mutex;
-  std::condition_variable recorded;
-};
-
-DirectorRig::DirectorRig(Speech kind, bool director) : fWaiter(std::make_shared<Waiter>()) {
+DirectorRig::DirectorRig(Speech kind, bool director) {
   using ZU::ZUModule;
   const std::string& library = writeGestureLibrary(fLibrary);
   if (kind == Speech::Espeak) {
@@ -101,10 +105,7 @@ DirectorRig::DirectorRig(Speech kind, bool director) : fWaiter(std::make_shared<
     speech = ZUModule::createModule<ScriptedSpeech>(broker, "ZUTextToSpeech");
     fServices.push_back(speech);
   }
-  timeline->addListener([waiter = fWaiter](const robotsim::TimelineEntry&) {
-    std::lock_guard lock(waiter->mutex);
-    waiter->recorded.notify_all();
-  });
+  fWaiter.emplace(*timeline);
   ZU::ZUAudioPlayerProxy(broker).loadSoundSet("bells");
   if (!director)
     return;
@@ -171,9 +172,7 @@ std::size_t DirectorRig::count(const std::string& service, const std::string& op
 
 bool DirectorRig::waitFor(const std::string& service, const std::string& operation,
                           const std::string& first, std::size_t wanted) const {
-  std::unique_lock lock(fWaiter->mutex);
-  return fWaiter->recorded.wait_for(lock, kBound,
-                                    [&] { return count(service, operation, first) >= wanted; });
+  return fWaiter->waitUntil([&] { return count(service, operation, first) >= wanted; }, kBound);
 }
 
 }  // namespace mokutotest

@@ -13,7 +13,9 @@
 #include <future>
 #include <map>
 #include <memory>
+#include <optional>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "director_host.h"
@@ -22,6 +24,7 @@
 #include "mokuto/mokutoconfig.h"
 #include "robotsim/timeline.h"
 #include "scripted_speech.h"
+#include "support/timeline_waiter.h"
 #include "zu/zubroker.h"
 #include "zu/zumodule.h"
 
@@ -42,6 +45,11 @@ inline constexpr const char* kEnd = "animations/Stand/Gestures/End_1";      // 0
 
 // Writes the gestures above, each on joints of its own, into the folder; answers its path.
 const std::string& writeGestureLibrary(const ko::test::ScratchFolder& folder);
+
+// The first argument of a timeline entry when it is a string; "" otherwise.
+std::string firstArgument(const robotsim::TimelineEntry& entry);
+// The key and the value of each ZUMemory.raiseEvent on the timeline, in order.
+std::vector<std::pair<std::string, ko::AnyValue>> raisedEvents(const robotsim::Timeline& timeline);
 
 class DirectorRig {
  public:
@@ -76,12 +84,10 @@ class DirectorRig {
   std::shared_ptr<DirectorHost> host;  // null without a director
 
  private:
-  struct Waiter;
-
   ko::test::ScratchFolder fLibrary;
   std::unique_ptr<robotsim::Robot> fRobot;                   // Speech::Espeak
   std::vector<std::shared_ptr<ZU::ZUModuleCore>> fServices;  // in start order
-  std::shared_ptr<Waiter> fWaiter;
+  std::optional<robotsim::simtest::TimelineWaiter> fWaiter;
 };
 
 }  // namespace mokutotest

@@ -1,5 +1,6 @@
 #include "scripted_speech.h"
 
+#include <algorithm>
 #include <sstream>
 #include <utility>
 
@@ -31,32 +32,28 @@ ScriptedSpeech::ScriptedSpeech(const std::shared_ptr<ZU::ZUBroker>& broker, cons
 }
 
 ScriptedSpeech::~ScriptedSpeech() {
-  {
-    std::lock_guard lock(fMutex);
-    fExiting = true;
-  }
-  fChanged.notify_all();
+  xEndSays();
   fHoldLoop->stop();
 }
 
 void ScriptedSpeech::exit() {
+  xEndSays();
+  ZU::ZUModule::exit();
+  fHoldLoop->stop();
+}
+
+void ScriptedSpeech::xEndSays() {
   {
     std::lock_guard lock(fMutex);
     fExiting = true;
   }
   fChanged.notify_all();
-  ZU::ZUModule::exit();
-  fHoldLoop->stop();
 }
 
 void ScriptedSpeech::stop(int id) {
   xRecord("stop(" + std::to_string(id) + ")");
   ZU::ZUModule::stop(id);
-  {
-    std::lock_guard lock(fMutex);
-    fFinished.insert(id);
-  }
-  fChanged.notify_all();
+  finish(id);
 }
 
 void ScriptedSpeech::say(const std::string& text) {
@@ -150,13 +147,8 @@ std::vector<std::string> ScriptedSpeech::calls() const {
 
 bool ScriptedSpeech::waitForCall(const std::string& call, std::chrono::milliseconds bound) const {
   std::unique_lock lock(fMutex);
-  return fChanged.wait_for(lock, bound, [&] {
-    for (const auto& c : fCalls) {
-      if (c == call)
-        return true;
-    }
-    return false;
-  });
+  return fChanged.wait_for(
+      lock, bound, [&] { return std::find(fCalls.begin(), fCalls.end(), call) != fCalls.end(); });
 }
 
 }  // namespace mokutotest

@@ -70,6 +70,7 @@ class ScriptedSpeech : public ZU::ZUModule {
 
  private:
   void xRecord(std::string call);
+  void xEndSays();
   void xRaise(const std::string& key, const ZU::ZUValue& value);
 
   std::shared_ptr<ko::EventLoop> fHoldLoop;

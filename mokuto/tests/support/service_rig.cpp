@@ -1,6 +1,5 @@
 #include "service_rig.h"
 
-#include <condition_variable>
 #include <utility>
 
 #include "director_rig.h"
@@ -10,30 +9,9 @@
 
 namespace mokutotest {
 
-namespace {
-
-// The key and the integer value of a ZUMemory.raiseEvent entry.
-std::pair<std::string, ko::AnyValue> raised(const robotsim::TimelineEntry& entry) {
-  try {
-    const auto arguments = entry.arguments.to<std::vector<ko::AnyValue>>();
-    return {arguments.at(0).to<std::string>(), arguments.at(1)};
-  } catch (const std::exception&) {
-    return {};
-  }
-}
-
-}  // namespace
-
-// Wakes the waiters at each timeline entry; lives as long as the timeline.
-struct ServiceRig::Waiter {
-  std::mutex mutex;
-  std::condition_variable recorded;
-};
-
 ServiceRig::ServiceRig(double scale)
     : clock(std::make_shared<DrivenClock>(scale)),
-      faults(std::make_shared<robotsim::FaultPlan>(std::vector<robotsim::Fault>{}, scale)),
-      fWaiter(std::make_shared<Waiter>()) {
+      faults(std::make_shared<robotsim::FaultPlan>(std::vector<robotsim::Fault>{}, scale)) {
   robotsim::RobotOptions options;
   options.speech.backend = robotsim::ZUTextToSpeechOptions::Backend::Timing;
   options.speech.playbackRate = robotsim::kSpeechAsFastAsPossible;
@@ -41,10 +19,7 @@ ServiceRig::ServiceRig(double scale)
   options.behaviorsRoot = writeGestureLibrary(fLibrary);
   options.faults = faults;
   robot = std::make_unique<robotsim::Robot>(options);
-  robot->timeline()->addListener([waiter = fWaiter](const robotsim::TimelineEntry&) {
-    std::lock_guard lock(waiter->mutex);
-    waiter->recorded.notify_all();
-  });
+  fWaiter.emplace(*robot->timeline());
   ZU::ZUAudioPlayerProxy(robot->broker()).loadSoundSet("bells");
 
   ZU::ZUMokutoOptions moduleOptions;
@@ -84,26 +59,22 @@ std::future<void> ServiceRig::sayAsync(const std::string& text, const ZU::ZUValu
 
 std::size_t ServiceRig::endEvents(ZU::MKID id) const {
   std::size_t n = 0;
-  for (const auto& entry : robot->timeline()->entries("ZUMemory", "raiseEvent")) {
-    const auto [key, value] = raised(entry);
-    if (key == ZU::ZUMokuto::kEndEvent && value.to<int>() == id)
-      ++n;
-  }
+  for (const auto& [key, value] : raisedEvents(*robot->timeline()))
+    n += key == ZU::ZUMokuto::kEndEvent && value.to<int>() == id ? 1U : 0U;
   return n;
 }
 
 std::size_t ServiceRig::events(const std::string& key) const {
   std::size_t n = 0;
-  for (const auto& entry : robot->timeline()->entries("ZUMemory", "raiseEvent"))
-    n += raised(entry).first == key ? 1U : 0U;
+  for (const auto& event : raisedEvents(*robot->timeline()))
+    n += event.first == key ? 1U : 0U;
   return n;
 }
 
 bool ServiceRig::waitForTimeline(const std::string& service, const std::string& operation,
                                  std::size_t count) const {
-  std::unique_lock lock(fWaiter->mutex);
-  return fWaiter->recorded.wait_for(
-      lock, kBound, [&] { return robot->timeline()->entries(service, operation).size() >= count; });
+  return fWaiter->waitUntil(
+      [&] { return robot->timeline()->entries(service, operation).size() >= count; }, kBound);
 }
 
 void ServiceRig::setStageHook(std::function<void(ZU::ZUMokutoStage, ZU::MKID)> hook) {

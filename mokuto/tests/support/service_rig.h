@@ -14,6 +14,7 @@
 #include <future>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <string>
 
 #include "driven_clock.h"
@@ -21,6 +22,7 @@
 #include "mokuto/zumokuto.h"
 #include "robotsim/faults.h"
 #include "robotsim/robot.h"
+#include "support/timeline_waiter.h"
 #include "zu/zuvalue.h"
 
 namespace mokutotest {
@@ -56,11 +58,9 @@ class ServiceRig {
     std::mutex mutex;
     std::function<void(ZU::ZUMokutoStage, ZU::MKID)> call;
   };
-  struct Waiter;
-
   ko::test::ScratchFolder fLibrary;
   std::shared_ptr<Hook> fHook = std::make_shared<Hook>();
-  std::shared_ptr<Waiter> fWaiter;
+  std::optional<robotsim::simtest::TimelineWaiter> fWaiter;
 };
 
 }  // namespace mokutotest
