@@ -13,8 +13,8 @@ namespace mokuto::cli {
 
 void writePerformanceFiles(const PerformanceFiles& files, robotsim::Robot& robot,
                            const SayTimeline& timeline, const std::string& text,
-                           const std::string& summary, std::int64_t originUs,
-                           std::int64_t endUs, std::ostream& out) {
+                           const std::string& summary, std::int64_t originUs, std::int64_t endUs,
+                           std::ostream& out) {
   if (files.wav.empty() && files.html.empty())
     return;
   std::vector<std::string> skipped;

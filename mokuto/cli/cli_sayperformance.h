@@ -26,7 +26,7 @@ struct PerformanceFiles {
 // file cannot be written.
 void writePerformanceFiles(const PerformanceFiles& files, robotsim::Robot& robot,
                            const SayTimeline& timeline, const std::string& text,
-                           const std::string& summary, std::int64_t originUs,
-                           std::int64_t endUs, std::ostream& out);
+                           const std::string& summary, std::int64_t originUs, std::int64_t endUs,
+                           std::ostream& out);
 
 }  // namespace mokuto::cli

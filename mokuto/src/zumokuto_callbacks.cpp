@@ -68,7 +68,8 @@ std::string scriptArgument(const std::string& name) {
   std::string out;
   for (const char c : name) {
     const auto byte = static_cast<unsigned char>(c);
-    if (byte < 0x20 || byte == 0x7f || std::string_view("\\'\"<>&%").find(c) != std::string_view::npos) {
+    if (byte < 0x20 || byte == 0x7f ||
+        std::string_view("\\'\"<>&%").find(c) != std::string_view::npos) {
       static constexpr char kHex[] = "0123456789abcdef";
       out += "\\x";
       out += kHex[byte >> 4];

@@ -17,8 +17,7 @@ namespace {
 using SoundFilePtr = std::unique_ptr<SNDFILE, int (*)(SNDFILE*)>;
 
 std::size_t samplesAt(std::int64_t us, int rate) {
-  return us <= 0 ? 0
-                 : static_cast<std::size_t>(static_cast<double>(us) * rate / 1e6 + 0.5);
+  return us <= 0 ? 0 : static_cast<std::size_t>(static_cast<double>(us) * rate / 1e6 + 0.5);
 }
 
 // A sound file's samples as mono floats at `rate`.
@@ -43,7 +42,8 @@ std::vector<float> readMono(const std::filesystem::path& path, int rate) {
   if (info.samplerate == rate || mono.empty())
     return mono;
   const double ratio = static_cast<double>(rate) / info.samplerate;
-  std::vector<float> out(static_cast<std::size_t>(std::ceil(static_cast<double>(mono.size()) * ratio)) + 1);
+  std::vector<float> out(
+      static_cast<std::size_t>(std::ceil(static_cast<double>(mono.size()) * ratio)) + 1);
   SRC_DATA data{};
   data.data_in = mono.data();
   data.input_frames = static_cast<long>(mono.size());
@@ -169,8 +169,7 @@ PerformanceAudio mixPerformanceAudio(const PerformanceSpeech& speech,
       count = std::min(count, samplesAt(*sound.endUs - sound.startUs, rate));
     const auto at = static_cast<std::int64_t>(samplesAt(sound.startUs - fromUs, rate)) -
                     static_cast<std::int64_t>(samplesAt(fromUs - sound.startUs, rate));
-    add(track, at, skip, count, sound.loop,
-        static_cast<float>(std::clamp(sound.volume, 0.0, 1.0)));
+    add(track, at, skip, count, sound.loop, static_cast<float>(std::clamp(sound.volume, 0.0, 1.0)));
   }
 
   out.samples.resize(mix.size());
