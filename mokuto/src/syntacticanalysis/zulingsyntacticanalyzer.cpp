@@ -32,6 +32,10 @@ constexpr std::array<std::string_view, 3> kParticles = {"と", "や", "か"};
 constexpr std::array<std::string_view, 2> kAgentWords = {"by", "par"};
 // Determiners that are also the preposition "de": they follow nouns as often as verbs.
 constexpr std::array<std::string_view, 4> kPartitives = {"d", "de", "du", "des"};
+// Prepositions whose complement is rather a list than a verb's: the complement of a noun
+// ("a review of the text and package name") or a pair ("between each directory or file").
+constexpr std::array<std::string_view, 7> kListPrepositions = {"of",  "de",      "d",    "du",
+                                                               "des", "between", "entre"};
 // Words that begin an indirect question or a relative clause.
 constexpr std::array<std::string_view, 10> kQuestionWords = {
     "how", "why", "what", "whether", "comment", "pourquoi", "combien", "quoi", "lorsque", "quand"};
@@ -980,6 +984,25 @@ class StructureBuilder {
         (xObjectAt(group.firstToken + 1) || fTokens[group.firstToken + 1].role == Role::Noun) &&
         xThirdSingularVerbBefore(previous))
       return true;
+    // A noun or verb that can be an infinitive, before its object or a preposition, after
+    // an item that is the complement of a verb of that form and its object: a second action
+    // of the same form ("to give privileges to users and log root activity", "provide
+    // information for maintainers or help with the work"; not "allow a review of the text
+    // and package name", "ship the documents in PDF and plain text").
+    if (lone.infinitive &&
+        (lone.firstClass == WORD_CLASS_NOUN || lone.firstClass == WORD_CLASS_VERB) &&
+        previous > 0 && xIsPreposition(previous - 1) &&
+        !isOneOf(fTokens[previous - 1].lower, kListPrepositions) &&
+        xBaseVerbAndObjectBefore(previous - 1) &&
+        (single
+             ? xIsPreposition(group.lastToken + 1)
+             : fTokens[group.firstToken + 1].role == Role::Noun || xObjectAt(group.firstToken + 1)))
+      return true;
+    // A lone verb of the third person after a pronoun, where the clause's verb is one too:
+    // no list joins a pronoun and such a word ("it returns the addresses for it and exits").
+    if (single && lone.thirdSingular && leftItems == 1 && xIsPronoun(firstLeft.group) &&
+        xThirdSingularVerbBefore(previous))
+      return true;
     // The last verb group before the first item: whether it has a verb of a tense ("n'est
     // pas une personne", not "se servant de gettext"), and ends in an infinitive after it
     // ("vous devriez envoyer").
@@ -1143,6 +1166,30 @@ class StructureBuilder {
                fGroups[fGroupOfToken[t]].kind == STRUCTURE_VERB;
     }
     return false;
+  }
+
+  // Whether the tokens before preposition p are a verb group with a verb of the base form
+  // and its object ("give limited root privileges to").
+  bool xBaseVerbAndObjectBefore(std::size_t p) const {
+    if (p == 0 || fGroupOfToken[p - 1] == kNone)
+      return false;
+    const Group& object = fGroups[fGroupOfToken[p - 1]];
+    if (object.kind != STRUCTURE_NOMINAL || object.lastToken != p - 1 || object.firstToken == 0 ||
+        fGroupOfToken[object.firstToken - 1] == kNone)
+      return false;
+    const Group& verb = fGroups[fGroupOfToken[object.firstToken - 1]];
+    if (verb.kind != STRUCTURE_VERB)
+      return false;
+    for (std::size_t t = verb.firstToken; t <= verb.lastToken; ++t) {
+      if (fTokens[t].role == Role::Verb && fTokens[t].infinitive)
+        return true;
+    }
+    return false;
+  }
+
+  // Whether group g is a lone pronoun.
+  bool xIsPronoun(std::size_t g) const {
+    return fGroups[g].firstToken == fGroups[g].lastToken && fGroups[g].lastRole == Role::Pronoun;
   }
 
   // Whether a clause may begin after token t: a comma, a mark other than a slash
