@@ -36,6 +36,9 @@ constexpr std::array<std::string_view, 4> kPartitives = {"d", "de", "du", "des"}
 // ("a review of the text and package name") or a pair ("between each directory or file").
 constexpr std::array<std::string_view, 7> kListPrepositions = {"of",  "de",      "d",    "du",
                                                                "des", "between", "entre"};
+// The preposition of an infinitive that complements a verb: "helps to identify", "aide à
+// identifier".
+constexpr std::array<std::string_view, 2> kInfinitiveWords = {"to", "à"};
 // Words that begin an indirect question or a relative clause.
 constexpr std::array<std::string_view, 10> kQuestionWords = {
     "how", "why", "what", "whether", "comment", "pourquoi", "combien", "quoi", "lorsque", "quand"};
@@ -558,7 +561,8 @@ class StructureBuilder {
   // apples"); after a determiner, an adjective or a preposition, a verb that can be a
   // noun is one ("les pommes", "the walk"), unless an infinitive follows a preposition
   // ("de manger"); a determiner that can be an object pronoun before a verb is one ("je
-  // le mange"). But after a comma or a coordinating word (adverbs between), a word that is
+  // le mange"), after a subject even before a word that can be a noun ("et je les range").
+  // But after a comma or a coordinating word (adverbs between), a word that is
   // first an auxiliary, or first a verb and takes an object (a determiner, a pronoun, a
   // name or a word the lexicon does not know), begins a second action ("and are not
   // requirements", "build it with dpkg-buildpackage and run lintian"), and so does any
@@ -635,7 +639,7 @@ class StructureBuilder {
       if (role == Role::Determiner && token.has(WORD_CLASS_PRONOUN_COMP) && xIsWord(t + 1)) {
         const Token& next = fTokens[t + 1];
         if ((next.has(WORD_CLASS_VERB) || next.has(WORD_CLASS_AUXILIARY)) &&
-            !next.has(WORD_CLASS_NOUN) && !next.has(WORD_CLASS_ADJECTIVE))
+            (subjectBefore || (!next.has(WORD_CLASS_NOUN) && !next.has(WORD_CLASS_ADJECTIVE))))
           role = Role::Clitic;
       }
       if (role == Role::Determiner && subjectBefore &&
@@ -1002,6 +1006,13 @@ class StructureBuilder {
     // no list joins a pronoun and such a word ("it returns the addresses for it and exits").
     if (single && lone.thirdSingular && leftItems == 1 && xIsPronoun(firstLeft.group) &&
         xThirdSingularVerbBefore(previous))
+      return true;
+    // A lone verb of the third person before the infinitive it governs, where the clause's
+    // verb is one too ("it has features and helps to identify", "il a des fonctionnalités et
+    // aide à identifier"; not "it should be on disks and machines to withstand").
+    if (single && lone.thirdSingular && xIsWord(group.lastToken + 2) &&
+        isOneOf(fTokens[group.lastToken + 1].lower, kInfinitiveWords) &&
+        fTokens[group.lastToken + 2].infinitive && xThirdSingularVerbBefore(previous))
       return true;
     // The last verb group before the first item: whether it has a verb of a tense ("n'est
     // pas une personne", not "se servant de gettext"), and ends in an infinitive after it
