@@ -570,6 +570,7 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"English", "Users reach the mirrors and get used to them.", false},
       {"English", "It loads the image to memory and passes control over.", false},
       {"French", "Il charge le noyau en mémoire et lance init.", false},
+      {"English", "This bypasses the communication channel and gains speed.", false},
       {"English", "It is run to give root privileges to users and log root activity.", false},
       {"English", "The packages provide information for maintainers or help with the work.", false},
       {"English", "This will allow a review of your text and package name.", true},

@@ -659,6 +659,13 @@ class StructureBuilder {
           token.has(WORD_CLASS_PRONOUN_COMP) && xIsWord(t + 1) &&
           (fTokens[t + 1].has(WORD_CLASS_VERB) || fTokens[t + 1].has(WORD_CLASS_AUXILIARY)))
         role = Role::Clitic;
+      // "This" before a word of the third person singular is the subject of that verb: as
+      // a determiner it would stand before a plural ("this bypasses the channel").
+      if (role == Role::Noun && token.thirdSingular && t > 0 && xIsWord(t - 1) &&
+          fTokens[t - 1].lower == "this" && fTokens[t - 1].has(WORD_CLASS_PRONOUN)) {
+        fTokens[t - 1].role = Role::Pronoun;
+        role = Role::Verb;
+      }
       // The answer "No." or "No, ..." rather than the determiner of "no file".
       if (role == Role::Determiner && token.negativeDeterminer &&
           token.has(WORD_CLASS_INTERJECTION) && !xIsWord(t + 1))
