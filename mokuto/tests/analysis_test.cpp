@@ -573,6 +573,7 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"English", "This bypasses the communication channel and gains speed.", false},
       {"English", "It is run to give root privileges to users and log root activity.", false},
       {"English", "The packages provide information for maintainers or help with the work.", false},
+      {"English", "I use disks, tapes or films from a good shop and store in a cool place.", false},
       {"English", "This will allow a review of your text and package name.", true},
       {"English", "We ship documents in PDF and plain text format.", true},
       {"English", "It returns the addresses for it and exits.", false},

@@ -1187,15 +1187,26 @@ class StructureBuilder {
   }
 
   // Whether the tokens before preposition p are a verb group with a verb of the base form
-  // and its object ("give limited root privileges to").
+  // and its object, or its objects joined by commas and coordinating words ("give limited
+  // root privileges to", "use CD-R and DVD-R by").
   bool xBaseVerbAndObjectBefore(std::size_t p) const {
-    if (p == 0 || fGroupOfToken[p - 1] == kNone)
+    std::size_t end = p;
+    std::size_t first = kNone;
+    while (end > 0 && fGroupOfToken[end - 1] != kNone) {
+      const Group& object = fGroups[fGroupOfToken[end - 1]];
+      if (object.kind != STRUCTURE_NOMINAL || object.lastToken != end - 1)
+        break;
+      first = object.firstToken;
+      if (first == 0)
+        break;
+      const Token& separator = fTokens[first - 1];
+      if (separator.type != Token::Comma && separator.coordination == Coordination::None)
+        break;
+      end = first - 1;
+    }
+    if (first == kNone || first == 0 || fGroupOfToken[first - 1] == kNone)
       return false;
-    const Group& object = fGroups[fGroupOfToken[p - 1]];
-    if (object.kind != STRUCTURE_NOMINAL || object.lastToken != p - 1 || object.firstToken == 0 ||
-        fGroupOfToken[object.firstToken - 1] == kNone)
-      return false;
-    const Group& verb = fGroups[fGroupOfToken[object.firstToken - 1]];
+    const Group& verb = fGroups[fGroupOfToken[first - 1]];
     if (verb.kind != STRUCTURE_VERB)
       return false;
     for (std::size_t t = verb.firstToken; t <= verb.lastToken; ++t) {
