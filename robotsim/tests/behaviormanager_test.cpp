@@ -133,7 +133,7 @@ TEST_F(BehaviorManagerService, ResolvesNamesAndListsTags) {
 // Every way a behaviour ends frees its joints and is told: to the subscribers of
 // "behaviorStopped" once, and on the timeline with how it ended.
 TEST_F(BehaviorManagerService, EveryEndFreesTheJointsAndIsTold) {
-  std::map<std::string, long> stops;  // told so far, by behaviour
+  std::map<std::string, std::size_t> stops;  // told so far, by behaviour
   const auto told = [&](std::initializer_list<std::pair<const char*, const char*>> behaviors) {
     for (const auto& [behavior, how] : behaviors) {
       EXPECT_TRUE(recorder->waitForValue(behavior, ++stops[behavior])) << behavior;
