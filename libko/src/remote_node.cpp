@@ -100,10 +100,38 @@ void settle(Promise<AnyValue> promise, ServingPool& pool, bool onIoThread, bool 
   }
 }
 
+// The ZeroMQ context of the process, shared by its links (one I/O thread carries them all),
+// made for the first and ended with the last.
+std::shared_ptr<zmq::context_t> makeContext() {
+  auto context = std::make_shared<zmq::context_t>(1);
+  // ZeroMQ's own I/O thread carries every message between the socket and the wire: it runs
+  // at the real-time priority of the link's threads. ZeroMQ aborts the process when it
+  // may not raise its threads, so it is asked only once this thread could be raised.
+  if (const os::RealtimeScope probe; probe.raised()) {
+    zmq_ctx_set(context->handle(), ZMQ_THREAD_SCHED_POLICY, SCHED_FIFO);
+    zmq_ctx_set(context->handle(), ZMQ_THREAD_PRIORITY, os::realtimePriority());
+  }
+  return context;
+}
+
+std::shared_ptr<zmq::context_t> processContext() {
+  static std::mutex mutex;
+  static std::weak_ptr<zmq::context_t> shared;
+  std::lock_guard lock(mutex);
+  auto context = shared.lock();
+  if (!context) {
+    context = makeContext();
+    shared = context;
+  }
+  return context;
+}
+
 }  // namespace
 
 struct RemoteNode::Sockets {
-  zmq::context_t context{1};
+  // A listening process with CURVE has a context of its own: the authentication handler is
+  // bound in the context, for each of its sockets.
+  std::shared_ptr<zmq::context_t> context;
   zmq::socket_t socket;
   std::optional<zmq::socket_t> zap;
   std::set<std::string> clientKeys;  // binary, 32 bytes each
@@ -141,18 +169,13 @@ RemoteNode::~RemoteNode() {
 }
 
 void RemoteNode::xOpen(const std::string& endpoint) {
+  const CurveKeys& curve = options_.curve;
   sockets_ = std::make_unique<Sockets>();
-  // ZeroMQ's own I/O thread carries every message between the socket and the wire: it runs
-  // at the real-time priority of the link's threads. ZeroMQ aborts the process when it
-  // may not raise its threads, so it is asked only once this thread could be raised.
-  if (const os::RealtimeScope probe; probe.raised()) {
-    zmq_ctx_set(sockets_->context.handle(), ZMQ_THREAD_SCHED_POLICY, SCHED_FIFO);
-    zmq_ctx_set(sockets_->context.handle(), ZMQ_THREAD_PRIORITY, os::realtimePriority());
-  }
+  sockets_->context =
+      role_ == Role::Listening && !curve.empty() ? makeContext() : processContext();
   wakeFd_ = ::eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC);
   if (wakeFd_ < 0)
     throw Error("Cannot make the wake-up descriptor of the remote link");
-  const CurveKeys& curve = options_.curve;
   try {
     if (role_ == Role::Connecting) {
       endpoint_ = endpoint;
@@ -169,11 +192,11 @@ void RemoteNode::xOpen(const std::string& endpoint) {
           throw Error("Not a CURVE public key: '" + key + "'");
         sockets_->clientKeys.insert(binary);
       }
-      sockets_->zap.emplace(sockets_->context, zmq::socket_type::rep);
+      sockets_->zap.emplace(*sockets_->context, zmq::socket_type::rep);
       sockets_->zap->set(zmq::sockopt::linger, 0);
       sockets_->zap->bind("inproc://zeromq.zap.01");
     }
-    s = zmq::socket_t(sockets_->context, zmq::socket_type::router);
+    s = zmq::socket_t(*sockets_->context, zmq::socket_type::router);
     s.set(zmq::sockopt::linger, 0);
     s.set(zmq::sockopt::router_mandatory, 1);
     s.set(zmq::sockopt::sndhwm, 0);
@@ -196,7 +219,7 @@ void RemoteNode::xOpen(const std::string& endpoint) {
 void RemoteNode::xOpenDealer() {
   const CurveKeys& curve = options_.curve;
   auto& s = sockets_->socket;
-  s = zmq::socket_t(sockets_->context, zmq::socket_type::dealer);
+  s = zmq::socket_t(*sockets_->context, zmq::socket_type::dealer);
   s.set(zmq::sockopt::linger, 0);
   s.set(zmq::sockopt::immediate, 1);
   s.set(zmq::sockopt::sndhwm, 0);
