@@ -171,8 +171,7 @@ RemoteNode::~RemoteNode() {
 void RemoteNode::xOpen(const std::string& endpoint) {
   const CurveKeys& curve = options_.curve;
   sockets_ = std::make_unique<Sockets>();
-  sockets_->context =
-      role_ == Role::Listening && !curve.empty() ? makeContext() : processContext();
+  sockets_->context = role_ == Role::Listening && !curve.empty() ? makeContext() : processContext();
   wakeFd_ = ::eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC);
   if (wakeFd_ < 0)
     throw Error("Cannot make the wake-up descriptor of the remote link");
