@@ -611,6 +611,12 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"French", "Vous devriez mettre les pommes et les poires dans le panier.", true},
       {"French", "Il dit que les pommes et les poires de Paris sont mûres.", true},
       {"French", "Le chat et le chien de Paul dorment.", true},
+      {"English", "Please send it along to debian-l10n@lists.example.org and request feedback.",
+       false},
+      {"English", "The field should better be version agnostic and point to the main branch.",
+       false},
+      {"English", "Creating \"/etc/truc.conf\" to set macros and editing \"/etc/truc.template\".",
+       false},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

@@ -440,6 +440,7 @@ struct Token {
   ZULingWordClass firstClass = WORD_CLASS_UNKNOWN;  // the class of its first record
   bool infinitive = false;                          // a verb record of the infinitive
   bool participle = false;                          // a verb record of a participle
+  bool gerund = false;                              // a verb record of a present participle
   bool negativeDeterminer = false;                  // a determiner record of negation ("no")
   bool finite = false;         // a verb or auxiliary record of a tense, none of a participle
   bool thirdSingular = false;  // a verb record of a tense in the third person singular
@@ -523,6 +524,8 @@ class StructureBuilder {
         if (record.wordClass == WORD_CLASS_VERB &&
             record.features.find_first_of("KG") != std::string::npos)
           token.participle = true;
+        if (record.wordClass == WORD_CLASS_VERB && record.features.find('G') != std::string::npos)
+          token.gerund = true;
         if ((record.wordClass == WORD_CLASS_VERB || record.wordClass == WORD_CLASS_AUXILIARY) &&
             record.features.find_first_of("PIJFCST") != std::string::npos)
           token.finite = true;
@@ -666,6 +669,11 @@ class StructureBuilder {
         fTokens[t - 1].role = Role::Pronoun;
         role = Role::Verb;
       }
+      // An adjective that can be an adverb, between an auxiliary and an infinitive, is the
+      // verb's adverb ("should better be version agnostic").
+      if (role == Role::Adjective && token.has(WORD_CLASS_ADVERB) && previous == Role::Auxiliary &&
+          t > 0 && xIsWord(t - 1) && xIsWord(t + 1) && fTokens[t + 1].infinitive)
+        role = Role::Adverb;
       // The answer "No." or "No, ..." rather than the determiner of "no file".
       if (role == Role::Determiner && token.negativeDeterminer &&
           token.has(WORD_CLASS_INTERJECTION) && !xIsWord(t + 1))
@@ -995,16 +1003,25 @@ class StructureBuilder {
         (xObjectAt(group.firstToken + 1) || fTokens[group.firstToken + 1].role == Role::Noun) &&
         xThirdSingularVerbBefore(previous))
       return true;
+    // A lone present participle after an item that follows a verb, in a sentence led by
+    // another: a second action of the same form ("creating the file to set MACROs and
+    // editing the template"; not "I like apples and swimming").
+    if (single && lone.gerund && afterVerb && xGerundBefore(previous))
+      return true;
     // A noun or verb that can be an infinitive, before its object or a preposition, after
     // an item that is the complement of a verb of that form and its object: a second action
     // of the same form ("to give privileges to users and log root activity", "provide
     // information for maintainers or help with the work"; not "allow a review of the text
-    // and package name", "ship the documents in PDF and plain text").
+    // and package name", "ship the documents in PDF and plain text"). The complement may be
+    // an address or a path ("send it to debian-l10n-english@lists.debian.org and request").
+    std::size_t complement = previous;
+    while (complement > 1 && xInWordMark(complement - 1) && fGroupOfToken[complement - 2] != kNone)
+      complement = fGroups[fGroupOfToken[complement - 2]].firstToken;
     if (lone.infinitive &&
         (lone.firstClass == WORD_CLASS_NOUN || lone.firstClass == WORD_CLASS_VERB) &&
-        previous > 0 && xIsPreposition(previous - 1) &&
-        !isOneOf(fTokens[previous - 1].lower, kListPrepositions) &&
-        xBaseVerbAndObjectBefore(previous - 1) &&
+        complement > 0 && xIsPreposition(complement - 1) &&
+        !isOneOf(fTokens[complement - 1].lower, kListPrepositions) &&
+        xBaseVerbAndObjectBefore(complement - 1) &&
         (single
              ? xIsPreposition(group.lastToken + 1)
              : fTokens[group.firstToken + 1].role == Role::Noun || xObjectAt(group.firstToken + 1)))
@@ -1023,11 +1040,15 @@ class StructureBuilder {
       return true;
     // The last verb group before the first item: whether it has a verb of a tense ("n'est
     // pas une personne", not "se servant de gettext"), and ends in an infinitive after it
-    // ("vous devriez envoyer").
+    // ("vous devriez envoyer", "should better be").
     const std::size_t leftGroup = commaBefore ? kNone : xVerbGroupBefore(previous);
     const bool leftVerb = leftGroup != kNone && xFiniteGroup(leftGroup);
-    const bool leftInfinitive = leftVerb && fTokens[fGroups[leftGroup].lastToken].infinitive &&
-                                !fTokens[fGroups[leftGroup].lastToken].finite;
+    const std::size_t leftLast = leftVerb ? fGroups[leftGroup].lastToken : 0;
+    const bool leftInfinitive =
+        leftVerb && fTokens[leftLast].infinitive &&
+        (!fTokens[leftLast].finite || xFiniteBetween(fGroups[leftGroup].firstToken, leftLast) ||
+         (fGroups[leftGroup].firstToken < leftLast &&
+          fTokens[fGroups[leftGroup].firstToken].role == Role::Auxiliary));
     if (next >= fTokens.size() ||
         (fTokens[next].type != Token::Word && !(leftVerb && xInWordMark(next))))
       return false;
@@ -1110,14 +1131,15 @@ class StructureBuilder {
     return afterVerb || (previous > 0 && xIsPreposition(previous - 1));
   }
 
-  // A mark inside a path or an option, right before the word it leads ("/usr/bin/truc",
-  // "libtruc.so", "--add-gnu-debuglink"): it parts no clause.
+  // A mark inside a path, an option or an address, right before the word it leads
+  // ("/usr/bin/truc", "libtruc.so", "--add-gnu-debuglink", "debian-l10n@lists.debian.org"):
+  // it parts no clause.
   bool xInWordMark(std::size_t t) const {
     if (t >= fTokens.size() || fTokens[t].type != Token::Break)
       return false;
     const std::size_t c = fTokens[t].chunk;
     return c + 1 < fChunks.size() && fChunks[c + 1].wordClass() >= WORD_CLASS_UNKNOWN &&
-           fChunks[c].text.find_first_not_of("/._~:-") == std::string::npos;
+           fChunks[c].text.find_first_not_of("/._~:-@") == std::string::npos;
   }
 
   // The token after verb group g when its verbs are all participles of no tense, kNone
@@ -1134,7 +1156,12 @@ class StructureBuilder {
 
   // Whether group g has a verb of a tense.
   bool xFiniteGroup(std::size_t g) const {
-    for (std::size_t t = fGroups[g].firstToken; t <= fGroups[g].lastToken; ++t) {
+    return xFiniteBetween(fGroups[g].firstToken, fGroups[g].lastToken + 1);
+  }
+
+  // Whether the tokens from first to end (excluded) hold a verb of a tense.
+  bool xFiniteBetween(std::size_t first, std::size_t end) const {
+    for (std::size_t t = first; t < end; ++t) {
       if (fTokens[t].finite &&
           (fTokens[t].role == Role::Verb || fTokens[t].role == Role::Auxiliary))
         return true;
@@ -1186,10 +1213,27 @@ class StructureBuilder {
     return false;
   }
 
+  // Whether the sentence before token t has a verb of the present participle.
+  bool xGerundBefore(std::size_t t) const {
+    while (t > 0) {
+      --t;
+      const Token& token = fTokens[t];
+      if (token.type == Token::Break && !xInWordMark(t) &&
+          fChunks[token.chunk].text.find_first_of(".!?;:") != std::string::npos)
+        return false;
+      if (token.type == Token::Word && token.role == Role::Verb && token.gerund)
+        return true;
+    }
+    return false;
+  }
+
   // Whether the tokens before preposition p are a verb group with a verb of the base form
   // and its object, or its objects joined by commas and coordinating words ("give limited
-  // root privileges to", "use CD-R and DVD-R by").
+  // root privileges to", "use CD-R and DVD-R by", "send it along to").
   bool xBaseVerbAndObjectBefore(std::size_t p) const {
+    // A particle between the object and the preposition ("send it along to").
+    if (xIsPreposition(p - 1))
+      --p;
     std::size_t end = p;
     std::size_t first = kNone;
     while (end > 0 && fGroupOfToken[end - 1] != kNone) {
