@@ -441,6 +441,7 @@ struct Token {
   bool infinitive = false;                          // a verb record of the infinitive
   bool participle = false;                          // a verb record of a participle
   bool gerund = false;                              // a verb record of a present participle
+  bool simplePast = false;                          // a verb record of the simple past
   bool negativeDeterminer = false;                  // a determiner record of negation ("no")
   bool finite = false;         // a verb or auxiliary record of a tense, none of a participle
   bool thirdSingular = false;  // a verb record of a tense in the third person singular
@@ -526,6 +527,8 @@ class StructureBuilder {
           token.participle = true;
         if (record.wordClass == WORD_CLASS_VERB && record.features.find('G') != std::string::npos)
           token.gerund = true;
+        if (record.wordClass == WORD_CLASS_VERB && record.features.find('J') != std::string::npos)
+          token.simplePast = true;
         if ((record.wordClass == WORD_CLASS_VERB || record.wordClass == WORD_CLASS_AUXILIARY) &&
             record.features.find_first_of("PIJFCST") != std::string::npos)
           token.finite = true;
@@ -994,14 +997,41 @@ class StructureBuilder {
     const bool afterVerb = previous > 0 && fGroupOfToken[previous - 1] != kNone &&
                            fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB;
     const bool single = group.firstToken == group.lastToken;
+    // A relative word before the rest of its clause, or before an auxiliary read as a noun
+    // ("and that for this purpose it can", "des paquets de base et dont l'intégration",
+    // "in Testing, or that can be moved"; but "this and that", "the name of the source and
+    // that of the binary").
+    if (isOneOf(lone.lower, kRelativeWords) &&
+        (single ? xIsWord(next) && !isOneOf(fTokens[next].lower, kListPrepositions)
+                : fTokens[group.firstToken + 1].firstClass == WORD_CLASS_AUXILIARY))
+      return true;
     // A word that can be a verb, before its object.
     if (!single && afterVerb && lone.infinitive && xObjectAt(group.firstToken + 1))
       return true;
-    // A verb of the third person before its object, after a clause whose verb is one too
-    // ("it loads the image to the memory and hands control over").
+    // A verb of the third person before its object (adverbs between), after a clause whose
+    // verb is one too or of the simple past ("it loads the image to the memory and hands
+    // control over", "détecte les systèmes installés sur l'ordinateur et ajoute
+    // automatiquement des choix").
+    std::size_t object = group.firstToken + 1;
+    while (object < group.lastToken && fTokens[object].role == Role::Adverb)
+      ++object;
     if (!single && lone.thirdSingular &&
-        (xObjectAt(group.firstToken + 1) || fTokens[group.firstToken + 1].role == Role::Noun) &&
+        (xObjectAt(object) || fTokens[object].role == Role::Noun) &&
         xThirdSingularVerbBefore(previous))
+      return true;
+    // After a comma and a lone item, a word that is first a verb of the third person: a
+    // second action ("it is smaller, with only 50 workers, and produces amplifiers").
+    if (commaBefore && leftItems == 1 && lone.firstClass == WORD_CLASS_VERB && lone.thirdSingular)
+      return true;
+    // A lone word that can be a verb of the same form as the verb whose preposition leads
+    // the first item, before a preposition of its own: a second action of that subject
+    // ("which they compile for the Unstable version and place on the server", "qu'il
+    // compile pour Unstable et place sur le serveur"; not "assist with the translation and
+    // review of documentation").
+    if (single && lone.has(WORD_CLASS_VERB) && xIsPreposition(next) &&
+        !isOneOf(fTokens[next].lower, kListPrepositions) && previous > 1 &&
+        xIsPreposition(previous - 1) && !isOneOf(fTokens[previous - 1].lower, kListPrepositions) &&
+        xSameVerbForm(lone, previous - 2))
       return true;
     // A lone present participle after an item that follows a verb, in a sentence led by
     // another: a second action of the same form ("creating the file to set MACROs and
@@ -1110,7 +1140,7 @@ class StructureBuilder {
     if (leftVerb && k != next &&
         (!xFiniteGroup(fGroupOfToken[k]) || fTokens[k - 1].type != Token::Word ||
          (fTokens[k - 1].role == Role::Preposition && fTokens[k].role != Role::Pronoun &&
-          fTokens[k].role != Role::Clitic) ||
+          fTokens[k].role != Role::Clitic && !xAdverbialPreposition(k - 1)) ||
          fTokens[k - 1].role == Role::Determiner))
       return false;
     // A verb right after an item with a preposition, where the items before have none:
@@ -1121,8 +1151,14 @@ class StructureBuilder {
         firstLeft.firstToken == fGroups[firstLeft.group].firstToken)
       return true;
     // A subject has no preposition before it ("of books and of documents are", "de
-    // livres et de documents sont").
-    if (rightPreposition || lone.lower == "de" || lone.lower == "d")
+    // livres et de documents sont"), but for a partitive before its verb after an item of
+    // another preposition ("à Debian LTS, et d'autres ont préféré").
+    const auto isDe = [&](std::size_t t) {
+      return fTokens[t].lower == "de" || fTokens[t].lower == "d";
+    };
+    const bool partitive = k == next && isDe(right.firstToken) &&
+                           xIsPreposition(firstLeft.firstToken) && !isDe(firstLeft.firstToken);
+    if (!partitive && (rightPreposition || isDe(group.firstToken)))
       return false;
     if (k == next && !beginsClause)
       return true;
@@ -1206,11 +1242,33 @@ class StructureBuilder {
       if (token.role == Role::Subordinator || isOneOf(token.lower, kRelativeWords) ||
           isOneOf(token.lower, kQuestionWords))
         return false;
+      // A participle that qualifies a noun is no verb of the clause ("les systèmes déjà
+      // installés").
+      if (token.role == Role::Verb && token.participle && !token.finite && !token.simplePast)
+        continue;
       if (token.role == Role::Verb || token.role == Role::Auxiliary)
-        return token.thirdSingular && fGroupOfToken[t] != kNone &&
+        return (token.thirdSingular || token.simplePast) && fGroupOfToken[t] != kNone &&
                fGroups[fGroupOfToken[t]].kind == STRUCTURE_VERB;
     }
     return false;
+  }
+
+  // Whether token t is the last of a verb group whose verb has a form of the word: both of
+  // the third person singular, or both of the base form.
+  bool xSameVerbForm(const Token& word, std::size_t t) const {
+    if (!xIsWord(t) || fTokens[t].role != Role::Verb || fGroupOfToken[t] == kNone ||
+        fGroups[fGroupOfToken[t]].lastToken != t)
+      return false;
+    const Token& verb = fTokens[t];
+    return word.thirdSingular ? verb.thirdSingular
+                              : word.infinitive && verb.infinitive && !verb.thirdSingular;
+  }
+
+  // Whether preposition p stands for an adverb, after one and before a verb of the third
+  // person singular ("the one even before becomes", "celle d'encore avant devient").
+  bool xAdverbialPreposition(std::size_t p) const {
+    return p > 0 && xIsWord(p - 1) && fTokens[p - 1].role == Role::Adverb && xIsWord(p + 1) &&
+           fTokens[p + 1].thirdSingular;
   }
 
   // Whether the sentence before token t has a verb of the present participle.
