@@ -635,6 +635,8 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"English",
        "The former release becomes Oldstable and the one even before becomes Oldoldstable.", false},
       {"French", "Certains ont contribué à Debian LTS, et d'autres ont préféré payer.", false},
+      {"French", "Il correspond aux erreurs sur le site de Debian et lists.example.org rassemble.",
+       false},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

@@ -1164,7 +1164,12 @@ class StructureBuilder {
       return true;
     if (commaBefore && leftItems == 1)
       return true;
-    return afterVerb || (previous > 0 && xIsPreposition(previous - 1));
+    // The first item follows a verb or a preposition, or is led by a preposition of its own
+    // in a clause with a verb of a tense ("correspond aux erreurs sur le site de Debian et
+    // lists.debian.org rassemble").
+    return afterVerb || (previous > 0 && xIsPreposition(previous - 1)) ||
+           (leftVerb && (previous != fGroups[firstLeft.group].firstToken ||
+                         isOneOf(fTokens[previous].lower, kPartitives)));
   }
 
   // A mark inside a path, an option or an address, right before the word it leads
