@@ -637,6 +637,11 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"French", "Certains ont contribué à Debian LTS, et d'autres ont préféré payer.", false},
       {"French", "Il correspond aux erreurs sur le site de Debian et lists.example.org rassemble.",
        false},
+      {"English", "Developers have many duties, and as official members, they have influence.",
+       false},
+      {"English",
+       "Tools include dch, which reads the file from the shell, and debuild, which is a wrapper.",
+       true},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

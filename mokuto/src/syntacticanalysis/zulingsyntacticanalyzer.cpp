@@ -1023,6 +1023,16 @@ class StructureBuilder {
     // second action ("it is smaller, with only 50 workers, and produces amplifiers").
     if (commaBefore && leftItems == 1 && lone.firstClass == WORD_CLASS_VERB && lone.thirdSingular)
       return true;
+    // After a comma and a lone item, an item between commas before a pronoun and its verb:
+    // the second clause and a phrase that leads it ("it has various responsibilities, and
+    // as official members, they have great influence"; not "and debuild, which is").
+    if (commaBefore && leftItems == 1 && next + 2 < fTokens.size() &&
+        fTokens[next].type == Token::Comma && xIsWord(next + 1) &&
+        fTokens[next + 1].role == Role::Pronoun &&
+        !isOneOf(fTokens[next + 1].lower, kRelativeWords) && fGroupOfToken[next + 2] != kNone &&
+        fGroups[fGroupOfToken[next + 2]].kind == STRUCTURE_VERB &&
+        xFiniteGroup(fGroupOfToken[next + 2]))
+      return true;
     // A lone word that can be a verb of the same form as the verb whose preposition leads
     // the first item, before a preposition of its own: a second action of that subject
     // ("which they compile for the Unstable version and place on the server", "qu'il
