@@ -992,7 +992,11 @@ class StructureBuilder {
     const Token& lone = fTokens[group.firstToken];
     if (isOneOf(lone.lower, kQuestionWords) || isOneOf(lone.lower, kThatWords))
       return true;
-    const std::size_t next = group.lastToken + 1;
+    // An aside in brackets after an item led by a determiner is read as if it were left out
+    // ("and the whole session (input and display) will be secure"); after a name it rather
+    // spells the name out, and the list goes on ("Reporting and Conformance (DMARC) are").
+    const std::size_t next =
+        lone.role == Role::Determiner ? xPastAside(group.lastToken + 1) : group.lastToken + 1;
     const std::size_t previous = firstLeft.firstToken;
     const bool afterVerb = previous > 0 && fGroupOfToken[previous - 1] != kNone &&
                            fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB;
@@ -1191,6 +1195,25 @@ class StructureBuilder {
     const std::size_t c = fTokens[t].chunk;
     return c + 1 < fChunks.size() && fChunks[c + 1].wordClass() >= WORD_CLASS_UNKNOWN &&
            fChunks[c].text.find_first_not_of("/._~:-@") == std::string::npos;
+  }
+
+  // The token after the closing bracket of an aside that opens at token t, in the same
+  // sentence; t when none opens there.
+  std::size_t xPastAside(std::size_t t) const {
+    if (t >= fTokens.size() || fTokens[t].type != Token::Break ||
+        fChunks[fTokens[t].chunk].text.find_first_of("([") == std::string::npos ||
+        fChunks[fTokens[t].chunk].text.find_first_of(")]") != std::string::npos)
+      return t;
+    for (std::size_t k = t + 1; k < fTokens.size(); ++k) {
+      if (fTokens[k].type != Token::Break)
+        continue;
+      const std::string& mark = fChunks[fTokens[k].chunk].text;
+      if (mark.find_first_of(")]") != std::string::npos)
+        return k + 1;
+      if (mark.find_first_of(".!?;:([") != std::string::npos && !xInWordMark(k))
+        return t;
+    }
+    return t;
   }
 
   // The token after verb group g when its verbs are all participles of no tense, kNone
