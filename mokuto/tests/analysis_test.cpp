@@ -647,6 +647,9 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"French", "Il s'assoit sur la chaise et le chien (un gros) dort.", false},
       {"English",
        "Filters such as Message Authentication, Reporting and Conformance (MARC) are used.", true},
+      {"French", "Le choix revêt donc une importance capitale et il est facile de se tromper.",
+       false},
+      {"French", "Il mange donc des pommes et des poires.", true},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

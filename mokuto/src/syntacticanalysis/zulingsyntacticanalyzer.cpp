@@ -681,6 +681,11 @@ class StructureBuilder {
       if (role == Role::Determiner && token.negativeDeterminer &&
           token.has(WORD_CLASS_INTERJECTION) && !xIsWord(t + 1))
         role = Role::Interjection;
+      // A conjunction that is no coordinating word and can be an adverb, right after a verb,
+      // is that verb's adverb ("revêt donc une importance").
+      if (role == Role::Conjunction && token.has(WORD_CLASS_ADVERB) && t > 0 && xIsWord(t - 1) &&
+          (previous == Role::Verb || previous == Role::Auxiliary))
+        role = Role::Adverb;
       token.role = role;
       subjectBefore = role == Role::Pronoun && beginsClause;
       clauseStart = clauseStart && role == Role::Adverb;
