@@ -650,6 +650,9 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"French", "Le choix revêt donc une importance capitale et il est facile de se tromper.",
        false},
       {"French", "Il mange donc des pommes et des poires.", true},
+      {"English",
+       "It requires that drivers know it, and that they properly reconfigure the devices.", false},
+      {"English", "I like this and that one.", true},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

@@ -1010,9 +1010,15 @@ class StructureBuilder {
     // ("and that for this purpose it can", "des paquets de base et dont l'intégration",
     // "in Testing, or that can be moved"; but "this and that", "the name of the source and
     // that of the binary").
+    // So does one before a subject pronoun and more words ("and that they properly
+    // reconfigure the devices"; not "this and that one").
     if (isOneOf(lone.lower, kRelativeWords) &&
         (single ? xIsWord(next) && !isOneOf(fTokens[next].lower, kListPrepositions)
-                : fTokens[group.firstToken + 1].firstClass == WORD_CLASS_AUXILIARY))
+                : fTokens[group.firstToken + 1].firstClass == WORD_CLASS_AUXILIARY ||
+                      (fTokens[group.firstToken + 1].role == Role::Pronoun &&
+                       (group.firstToken + 2 <= group.lastToken ||
+                        (xIsWord(next) && (fTokens[next].has(WORD_CLASS_VERB) ||
+                                           fTokens[next].has(WORD_CLASS_AUXILIARY)))))))
       return true;
     // A word that can be a verb, before its object.
     if (!single && afterVerb && lone.infinitive && xObjectAt(group.firstToken + 1))
