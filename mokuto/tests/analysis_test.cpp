@@ -642,6 +642,17 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"English",
        "Tools include dch, which reads the file from the shell, and debuild, which is a wrapper.",
        true},
+      {"English", "It is shown on the laptop, and the session (for each user) will be secure.",
+       false},
+      {"French", "Il s'assoit sur la chaise et le chien (un gros) dort.", false},
+      {"English",
+       "Filters such as Message Authentication, Reporting and Conformance (MARC) are used.", true},
+      {"French", "Le choix revêt donc une importance capitale et il est facile de se tromper.",
+       false},
+      {"French", "Il mange donc des pommes et des poires.", true},
+      {"English",
+       "It requires that drivers know it, and that they properly reconfigure the devices.", false},
+      {"English", "I like this and that one.", true},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

@@ -681,6 +681,11 @@ class StructureBuilder {
       if (role == Role::Determiner && token.negativeDeterminer &&
           token.has(WORD_CLASS_INTERJECTION) && !xIsWord(t + 1))
         role = Role::Interjection;
+      // A conjunction that is no coordinating word and can be an adverb, right after a verb,
+      // is that verb's adverb ("revêt donc une importance").
+      if (role == Role::Conjunction && token.has(WORD_CLASS_ADVERB) && t > 0 && xIsWord(t - 1) &&
+          (previous == Role::Verb || previous == Role::Auxiliary))
+        role = Role::Adverb;
       token.role = role;
       subjectBefore = role == Role::Pronoun && beginsClause;
       clauseStart = clauseStart && role == Role::Adverb;
@@ -992,7 +997,11 @@ class StructureBuilder {
     const Token& lone = fTokens[group.firstToken];
     if (isOneOf(lone.lower, kQuestionWords) || isOneOf(lone.lower, kThatWords))
       return true;
-    const std::size_t next = group.lastToken + 1;
+    // An aside in brackets after an item led by a determiner is read as if it were left out
+    // ("and the whole session (input and display) will be secure"); after a name it rather
+    // spells the name out, and the list goes on ("Reporting and Conformance (DMARC) are").
+    const std::size_t next =
+        lone.role == Role::Determiner ? xPastAside(group.lastToken + 1) : group.lastToken + 1;
     const std::size_t previous = firstLeft.firstToken;
     const bool afterVerb = previous > 0 && fGroupOfToken[previous - 1] != kNone &&
                            fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB;
@@ -1001,9 +1010,15 @@ class StructureBuilder {
     // ("and that for this purpose it can", "des paquets de base et dont l'intégration",
     // "in Testing, or that can be moved"; but "this and that", "the name of the source and
     // that of the binary").
+    // So does one before a subject pronoun and more words ("and that they properly
+    // reconfigure the devices"; not "this and that one").
     if (isOneOf(lone.lower, kRelativeWords) &&
         (single ? xIsWord(next) && !isOneOf(fTokens[next].lower, kListPrepositions)
-                : fTokens[group.firstToken + 1].firstClass == WORD_CLASS_AUXILIARY))
+                : fTokens[group.firstToken + 1].firstClass == WORD_CLASS_AUXILIARY ||
+                      (fTokens[group.firstToken + 1].role == Role::Pronoun &&
+                       (group.firstToken + 2 <= group.lastToken ||
+                        (xIsWord(next) && (fTokens[next].has(WORD_CLASS_VERB) ||
+                                           fTokens[next].has(WORD_CLASS_AUXILIARY)))))))
       return true;
     // A word that can be a verb, before its object.
     if (!single && afterVerb && lone.infinitive && xObjectAt(group.firstToken + 1))
@@ -1191,6 +1206,25 @@ class StructureBuilder {
     const std::size_t c = fTokens[t].chunk;
     return c + 1 < fChunks.size() && fChunks[c + 1].wordClass() >= WORD_CLASS_UNKNOWN &&
            fChunks[c].text.find_first_not_of("/._~:-@") == std::string::npos;
+  }
+
+  // The token after the closing bracket of an aside that opens at token t, in the same
+  // sentence; t when none opens there.
+  std::size_t xPastAside(std::size_t t) const {
+    if (t >= fTokens.size() || fTokens[t].type != Token::Break ||
+        fChunks[fTokens[t].chunk].text.find_first_of("([") == std::string::npos ||
+        fChunks[fTokens[t].chunk].text.find_first_of(")]") != std::string::npos)
+      return t;
+    for (std::size_t k = t + 1; k < fTokens.size(); ++k) {
+      if (fTokens[k].type != Token::Break)
+        continue;
+      const std::string& mark = fChunks[fTokens[k].chunk].text;
+      if (mark.find_first_of(")]") != std::string::npos)
+        return k + 1;
+      if (mark.find_first_of(".!?;:([") != std::string::npos && !xInWordMark(k))
+        return t;
+    }
+    return t;
   }
 
   // The token after verb group g when its verbs are all participles of no tense, kNone
