@@ -171,8 +171,7 @@ RemoteNode::~RemoteNode() {
 void RemoteNode::xOpen(const std::string& endpoint) {
   const CurveKeys& curve = options_.curve;
   sockets_ = std::make_unique<Sockets>();
-  sockets_->context =
-      role_ == Role::Listening && !curve.empty() ? makeContext() : processContext();
+  sockets_->context = role_ == Role::Listening && !curve.empty() ? makeContext() : processContext();
   wakeFd_ = ::eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC);
   if (wakeFd_ < 0)
     throw Error("Cannot make the wake-up descriptor of the remote link");
@@ -355,9 +354,10 @@ bool RemoteNode::xReceive() {
   // handled with the socket free (a caller woken by a reply sends its next call at once).
   std::vector<std::vector<zmq::message_t>> batch;
   {
-    // Never waits for a thread that sends: that thread tells this one of what waits.
-    std::unique_lock lock(socketMutex_, std::try_to_lock);
-    if (!lock || stopping_)
+    // Waits for a sender to let go (a send holds the socket for microseconds): with a
+    // try-lock here, messages were left waiting until the next tick.
+    std::unique_lock lock(socketMutex_);
+    if (stopping_)
       return false;
     try {
       for (std::vector<zmq::message_t> parts; batch.size() < 256; parts.clear()) {
@@ -445,8 +445,7 @@ void RemoteNode::xHandle(std::vector<std::string_view> frames) {
     h.to = role_ == Role::Listening ? peerId : (header ? header->from : 0);
     h.from = role_ == Role::Listening ? 0 : self_;
     h.fields = {AnyValue(text)};
-    xSend(
-        Outgoing{h.to, peer ? std::string() : routing, wire::encodeHeader(h), std::nullopt, 0});
+    xSend(Outgoing{h.to, peer ? std::string() : routing, wire::encodeHeader(h), std::nullopt, 0});
   };
 
   std::optional<wire::Header> header;
@@ -680,7 +679,6 @@ void RemoteNode::xHandleFor(wire::Message m, Peer* peer) {
   }
 }
 
-
 void RemoteNode::xSend(MessageKind kind, std::uint32_t to, std::uint64_t id,
                        std::vector<AnyValue> fields, Body body) {
   wire::Header h{kind, id, to, 0, std::move(fields)};
@@ -713,8 +711,8 @@ void RemoteNode::xSend(Outgoing out) {
     // The process left between routing and sending.
     KO_LOG_VERBOSE(kCategory) << "A message to #" << out.to << " was not sent: " << e.what();
   }
-  // Sending may have taken in the news of a message come meanwhile, and the I/O thread may
-  // have left messages to this thread (it never waits for the socket): it is told.
+  // Sending may have taken in the news of a message come meanwhile, which the socket's
+  // descriptor then no longer tells: the I/O thread is told.
   if (s.get(zmq::sockopt::events) & ZMQ_POLLIN) {
     if (xOnIoThread()) {
       ioReadable_ = true;
@@ -781,19 +779,18 @@ void RemoteNode::xTick() {
     }
   } else if (now >= nextHello_) {
     nextHello_ = now + std::max(options_.heartbeatInterval, std::chrono::milliseconds(250));
-    xSend(
-        Outgoing{0,
-                 {},
-                 wire::encodeHeader(
-                     {MessageKind::Hello,
-                      0,
-                      0,
-                      0,
-                      {AnyValue(wire::kProtocolVersion), AnyValue(options_.processName),
-                       AnyValue(static_cast<std::int64_t>(::getpid())),
-                       AnyValue(static_cast<std::int64_t>(options_.heartbeatInterval.count()))}}),
-                 std::nullopt,
-                 0});
+    xSend(Outgoing{0,
+                   {},
+                   wire::encodeHeader(
+                       {MessageKind::Hello,
+                        0,
+                        0,
+                        0,
+                        {AnyValue(wire::kProtocolVersion), AnyValue(options_.processName),
+                         AnyValue(static_cast<std::int64_t>(::getpid())),
+                         AnyValue(static_cast<std::int64_t>(options_.heartbeatInterval.count()))}}),
+                   std::nullopt,
+                   0});
     if (now - lastNoAnswerLog_ > std::chrono::seconds(10)) {
       lastNoAnswerLog_ = now;
       KO_LOG_INFO(kCategory) << "Waiting for the listening process at " << endpoint_;
