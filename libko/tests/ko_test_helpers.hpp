@@ -4,8 +4,10 @@
 
 #include <stdlib.h>
 
+#include <algorithm>
 #include <chrono>
 #include <condition_variable>
+#include <cstddef>
 #include <filesystem>
 #include <fstream>
 #include <functional>
@@ -14,6 +16,8 @@
 #include <string>
 #include <system_error>
 #include <thread>
+#include <utility>
+#include <vector>
 
 namespace ko::test {
 
@@ -64,6 +68,38 @@ class Counter {
   mutable std::mutex mutex_;
   std::condition_variable cv_;
   int value_ = 0;
+};
+
+// What other threads record, in order, for a test to read and to wait for.
+template <class T>
+class Recorded {
+ public:
+  void add(T value) {
+    std::lock_guard lock(mutex_);
+    values_.push_back(std::move(value));
+    cv_.notify_all();
+  }
+  std::vector<T> all() const {
+    std::lock_guard lock(mutex_);
+    return values_;
+  }
+  // Waits until `count` values have come.
+  bool waitFor(std::size_t count) const {
+    std::unique_lock lock(mutex_);
+    return cv_.wait_for(lock, kBound, [&] { return values_.size() >= count; });
+  }
+  // Waits until `value` has come `times` times.
+  bool waitForValue(const T& value, std::size_t times = 1) const {
+    std::unique_lock lock(mutex_);
+    return cv_.wait_for(lock, kBound, [&] {
+      return static_cast<std::size_t>(std::count(values_.begin(), values_.end(), value)) >= times;
+    });
+  }
+
+ private:
+  mutable std::mutex mutex_;
+  mutable std::condition_variable cv_;
+  std::vector<T> values_;
 };
 
 // For states that publish no notification: polls `pred` until it holds or the bound passes.

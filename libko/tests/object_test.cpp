@@ -2,7 +2,6 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
-#include <mutex>
 #include <stdexcept>
 #include <thread>
 
@@ -185,12 +184,9 @@ TEST_F(ObjectTest, DuplicatesAndMalformedSignaturesAreRefused) {
 TEST_F(ObjectTest, SignalConnectedFromAnotherObject) {
   // A listener service whose method is called from the calculator's signal.
   ko::DynamicObjectBuilder listenerBuilder;
-  std::vector<std::string> heard;
-  std::mutex heardMutex;
-  listenerBuilder.advertiseMethod("onTick", [&](int n, const std::string& what) {
-    std::lock_guard lock(heardMutex);
-    heard.push_back(what + std::to_string(n));
-  });
+  ko::test::Recorded<std::string> heard;
+  listenerBuilder.advertiseMethod(
+      "onTick", [&](int n, const std::string& what) { heard.add(what + std::to_string(n)); });
   AnyObject listener = listenerBuilder.object();
 
   const ko::SignalLink link = obj_->connect(
@@ -203,7 +199,7 @@ TEST_F(ObjectTest, SignalConnectedFromAnotherObject) {
   builder_.dynamicObject()->signal<int, std::string>("ticked")->operator()(2, "tock");
   obj_->disconnect(link);
   obj_->post("ticked", 3, "gone");
-  EXPECT_THAT(heard, ElementsAre("tick1", "tock2"));
+  EXPECT_THAT(heard.all(), ElementsAre("tick1", "tock2"));
   ASSERT_EQ(raw.size(), 2u);
   EXPECT_EQ(raw[0].to<int>(), 3);
 

@@ -10,7 +10,6 @@
 #include <cstddef>
 #include <thread>
 #include <utility>
-#include <vector>
 
 #include "ko/eventloop.hpp"
 #include "ko/log.hpp"

@@ -7,7 +7,6 @@
 #include <filesystem>
 #include <fstream>
 #include <optional>
-#include <set>
 
 #include "ko_test_helpers.hpp"
 #include "path_roots.hpp"

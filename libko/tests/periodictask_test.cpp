@@ -4,7 +4,6 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
-#include <future>
 #include <stdexcept>
 
 #include "ko/log.hpp"
@@ -18,6 +17,7 @@ using ko::test::Gate;
 
 class PeriodicTaskTest : public ::testing::Test {
  protected:
+  Counter calls_;  // of the callback; outlives the task
   std::shared_ptr<ko::EventLoop> loop_ = std::make_shared<ko::EventLoop>("periodic", 4);
   ko::PeriodicTask task_{loop_};
 };
@@ -25,9 +25,8 @@ class PeriodicTaskTest : public ::testing::Test {
 TEST_F(PeriodicTaskTest, StopWaitsForTheRunningCallback) {
   Gate entered, release;
   std::atomic<bool> callbackDone{false};
-  Counter calls;
   task_.setCallback([&] {
-    if (calls.increment() == 1) {
+    if (calls_.increment() == 1) {
       entered.open();
       release.wait();
     }
@@ -52,14 +51,13 @@ TEST_F(PeriodicTaskTest, StopWaitsForTheRunningCallback) {
   EXPECT_TRUE(doneWhenStopReturned);
   EXPECT_FALSE(task_.isRunning());
   EXPECT_FALSE(task_.isStopping());
-  EXPECT_EQ(calls.value(), 1);
+  EXPECT_EQ(calls_.value(), 1);
 }
 
 TEST_F(PeriodicTaskTest, StopFromInsideTheCallbackDoesNotDeadlock) {
-  Counter calls;
   Gate stopReturned;
   task_.setCallback([&] {
-    calls.increment();
+    calls_.increment();
     task_.stop();
     EXPECT_TRUE(task_.isStopping());
     stopReturned.open();
@@ -69,18 +67,17 @@ TEST_F(PeriodicTaskTest, StopFromInsideTheCallbackDoesNotDeadlock) {
   ASSERT_TRUE(stopReturned.wait());
   task_.stop();  // waits for the callback to return
   EXPECT_FALSE(task_.isRunning());
-  EXPECT_EQ(calls.value(), 1);
+  EXPECT_EQ(calls_.value(), 1);
 }
 
 TEST_F(PeriodicTaskTest, CallbacksNeverOverlap) {
   std::atomic<int> inside{0}, overlaps{0};
-  Counter calls;
   task_.setCallback([&] {
     if (inside.fetch_add(1) != 0)
       ++overlaps;
     std::this_thread::yield();
     inside.fetch_sub(1);
-    calls.increment();
+    calls_.increment();
   });
   task_.setUsPeriod(0);
   task_.start();
@@ -89,22 +86,21 @@ TEST_F(PeriodicTaskTest, CallbacksNeverOverlap) {
     task_.start();
     task_.setUsPeriod(i % 2);
   }
-  ASSERT_TRUE(calls.waitFor(300));
+  ASSERT_TRUE(calls_.waitFor(300));
   task_.stop();
   EXPECT_EQ(overlaps.load(), 0);
 }
 
 TEST_F(PeriodicTaskTest, RestartFromTheCallbackCancelsItsOwnStop) {
-  Counter calls;
   task_.setCallback([&] {
-    if (calls.increment() == 1) {
+    if (calls_.increment() == 1) {
       task_.asyncStop();
       task_.start();
     }
   });
   task_.setUsPeriod(0);
   task_.start();
-  ASSERT_TRUE(calls.waitFor(3));
+  ASSERT_TRUE(calls_.waitFor(3));
   task_.stop();
 }
 
@@ -112,9 +108,8 @@ TEST_F(PeriodicTaskTest, RestartFromTheCallbackCancelsItsOwnStop) {
 // stop() returns, the task is stopped for good.
 TEST_F(PeriodicTaskTest, StopFromOutsideWinsOverARestartFromTheCallback) {
   Gate running;
-  Counter calls;
   task_.setCallback([&] {
-    calls.increment();
+    calls_.increment();
     running.open();
     // Wait until the other thread's stop is pending, then try to go on.
     EXPECT_TRUE(eventually([&] { return task_.isStopping(); }));
@@ -125,20 +120,19 @@ TEST_F(PeriodicTaskTest, StopFromOutsideWinsOverARestartFromTheCallback) {
   ASSERT_TRUE(running.wait());
   task_.stop();
   EXPECT_FALSE(task_.isRunning());
-  EXPECT_EQ(calls.value(), 1);
+  EXPECT_EQ(calls_.value(), 1);
 }
 
 TEST_F(PeriodicTaskTest, ThrowingCallbackIsLoggedAndTheTaskGoesOn) {
   ko::log::ScopedCapture cap;
   task_.setName("thrower");
-  Counter calls;
   task_.setCallback([&] {
-    calls.increment();
+    calls_.increment();
     throw std::runtime_error("no motion");
   });
   task_.setUsPeriod(0);
   task_.start();
-  ASSERT_TRUE(calls.waitFor(3));
+  ASSERT_TRUE(calls_.waitFor(3));
   task_.stop();
   EXPECT_TRUE(cap->containsPart("ko.periodictask", ko::log::Error, "'thrower' threw: no motion"));
 }

@@ -8,7 +8,6 @@
 #include <atomic>
 #include <chrono>
 #include <string>
-#include <thread>
 #include <vector>
 #include <zmq.hpp>
 #include <zmq_addon.hpp>
@@ -121,25 +120,16 @@ TEST_F(RemoteTest, FailuresComeBackAsTheirText) {
 
 TEST_F(RemoteTest, SignalsReachSubscribersInOrderUntilTheyLeave) {
   const AnyObject calc = remoteCalc();
-  std::mutex mutex;
-  std::vector<int> heard;
-  test::Counter count;
-  const SignalLink link = calc->connect("changed", [&](std::string, int n) {
-    {
-      std::lock_guard lock(mutex);
-      heard.push_back(n);
-    }
-    count.increment();
-  });
+  test::Recorded<int> heard;
+  const SignalLink link = calc->connect("changed", [&](std::string, int n) { heard.add(n); });
   auto* changed = local.builder.dynamicObject()->signal<std::string, int>("changed");
-  for (int k = 0; k < 50; ++k)
+  std::vector<int> sent;
+  for (int k = 0; k < 50; ++k) {
+    sent.push_back(k);
     (*changed)("level", k);
-  ASSERT_TRUE(count.waitFor(50));
-  {
-    std::lock_guard lock(mutex);
-    for (int k = 0; k < 50; ++k)
-      ASSERT_EQ(heard[static_cast<std::size_t>(k)], k);
   }
+  ASSERT_TRUE(heard.waitFor(50));
+  EXPECT_EQ(heard.all(), sent);
   calc->disconnect(link);
   EXPECT_TRUE(test::eventually([&] { return changed->subscriberCount() == 0; }));
   // A post from the other process triggers the signal here.

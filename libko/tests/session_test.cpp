@@ -4,7 +4,6 @@
 #include <gtest/gtest.h>
 
 #include <functional>
-#include <mutex>
 #include <thread>
 #include <utility>
 #include <vector>
@@ -60,19 +59,14 @@ TEST_F(SessionTest, RegisteredServiceIsFoundInBothScopesAndItsNameIsTaken) {
 // withdrawal that follows it are made by two threads at once; and a subscriber may
 // register a service of its own (announced after it returns, without a deadlock).
 TEST_F(SessionTest, AnnouncementsComeInTheOrderOfTheChanges) {
-  std::mutex mutex;
-  std::vector<std::pair<bool, unsigned>> seen;  // registered?, id
+  ko::test::Recorded<std::pair<bool, unsigned>> announced;  // registered?, id
   session_.serviceRegistered.connect([&](unsigned id, const std::string& name) {
-    {
-      std::lock_guard lock(mutex);
-      seen.emplace_back(true, id);
-    }
+    announced.add({true, id});
     if (name == "first")
       session_.registerService("nested", makeService("n"));
   });
   session_.serviceUnregistered.connect([&](unsigned id, const std::string&) {
-    std::lock_guard lock(mutex);
-    seen.emplace_back(false, id);
+    announced.add({false, id});
   });
   session_.registerService("first", makeService("f"));
   ASSERT_EQ(session_.services().size(), 2u);
@@ -90,7 +84,7 @@ TEST_F(SessionTest, AnnouncementsComeInTheOrderOfTheChanges) {
   withdrawer.join();
   // Of "svc", registrations and withdrawals alternate, each withdrawal of the id just
   // registered.
-  std::lock_guard lock(mutex);
+  const auto seen = announced.all();
   ASSERT_EQ(seen.size(), 2u + 2u * kRounds);
   for (std::size_t i = 2; i + 1 < seen.size(); i += 2) {
     ASSERT_TRUE(seen[i].first) << i;

@@ -7,7 +7,6 @@
 #include <atomic>
 #include <climits>
 #include <cstdlib>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <thread>
@@ -121,19 +120,17 @@ TEST(DeadlockTimeoutTest, ALookupThatNeverAnswersGivesUpInEachScope) {
   DeadlockTimeoutEnv env("0x1F4");
   zutest::Process process;
   ko::Promise<ko::AnyObject> never;
-  std::mutex mutex;
-  std::vector<std::string> scopes;
+  ko::test::Recorded<std::string> scopes;
   process.session->setLookupHook(
       [&](const std::string&,
           const std::string& scope) -> std::optional<ko::Future<ko::AnyObject>> {
-        std::lock_guard lock(mutex);
-        scopes.push_back(scope);
+        scopes.add(scope);
         return never.future();
       });
 
   ko::log::ScopedCapture cap;
   EXPECT_EQ(process.broker->service("Ghost"), nullptr);
-  EXPECT_THAT(scopes, ElementsAre("local", ""));
+  EXPECT_THAT(scopes.all(), ElementsAre("local", ""));
   EXPECT_TRUE(
       cap->contains("ZUBroker", ko::log::Error, "session.service(Ghost) timeout after 30sec."));
   EXPECT_TRUE(

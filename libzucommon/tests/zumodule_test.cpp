@@ -79,7 +79,7 @@ TEST_F(ModuleTest, BuiltInsAnswerThroughCallsByNameAndExitUnregisters) {
   EXPECT_EQ(proxy_.call<ZU::ZUValue>("echo", value).toString(1), R"([42, 0.5, "abc", true])");
   proxy_.call<void>("say", "hello", ZU::ZUValue::makeArray({"mode", 1}));
   proxy_.call<void>("say", "bye");
-  EXPECT_THAT(greeter_->said(), ElementsAre(R"(hello with ["mode", 1])", "bye"));
+  EXPECT_THAT(greeter_->said.all(), ElementsAre(R"(hello with ["mode", 1])", "bye"));
 
   proxy_.call<void>("exit");
   EXPECT_EQ(process_.broker->getModuleByName("Greeter"), nullptr);

@@ -84,7 +84,7 @@ TEST_F(TaskTest, PCallPicksTheOverloadThatTakesTheArguments) {
   const int second = greeter_->pCall(AnyValue::list({"say", "hi", AnyValue::list({"mode", 2})}));
   EXPECT_NE(first, second);
   EXPECT_FALSE(greeter_->wait(second, 0));
-  EXPECT_THAT(greeter_->said(), ::testing::ElementsAre("hello", R"(hi with ["mode", 2])"));
+  EXPECT_THAT(greeter_->said.all(), ::testing::ElementsAre("hello", R"(hi with ["mode", 2])"));
 }
 
 TEST_F(TaskTest, ACallThatFailsOrWhoseArgumentsDoNotConvertEndsItsTaskAndIsLogged) {
@@ -144,7 +144,7 @@ TEST(TaskEnd, ExitWaitsForTheRunningCallAndDropsTheQueuedOnes) {
   exiting.join();
   EXPECT_FALSE(greeter->wait(running, zutest::kBoundMs));
   EXPECT_FALSE(greeter->wait(queued, zutest::kBoundMs));
-  EXPECT_TRUE(greeter->said().empty());
+  EXPECT_TRUE(greeter->said.all().empty());
   EXPECT_TRUE(greeter->hasExited());
   EXPECT_EQ(zutest::errorOf([&] {
               greeter->pCall(AnyValue::list({"say", "later"}));
@@ -173,7 +173,7 @@ TEST_F(TaskTest, PostsFromManyThreadsGetDistinctIdsAndAllEnd) {
   for (const auto& list : ids)
     distinct.insert(list.begin(), list.end());
   EXPECT_EQ(distinct.size(), static_cast<std::size_t>(kThreads * kPosts));
-  EXPECT_EQ(greeter_->said().size(), static_cast<std::size_t>(kThreads * kPosts));
+  EXPECT_EQ(greeter_->said.all().size(), static_cast<std::size_t>(kThreads * kPosts));
 }
 
 }  // namespace

@@ -4,9 +4,7 @@
 #include <atomic>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <string>
-#include <vector>
 
 #include "ko/anyvalue.hpp"
 #include "ko/session.hpp"
@@ -68,9 +66,9 @@ class Greeter : public ZU::ZUModule {
          {"waitForStop", &Greeter::waitForStop, "Blocks until its task is asked to stop."}});
   }
 
-  void say(const std::string& text) { record(text); }
+  void say(const std::string& text) { said.add(text); }
   void say(const std::string& text, const ZU::ZUValue& configuration) {
-    record(text + " with " + configuration.toString(1));
+    said.add(text + " with " + configuration.toString(1));
   }
   ZU::ZUValue echo(const ZU::ZUValue& value) { return value; }
   int add(int a, int b) const { return a + b; }
@@ -90,23 +88,11 @@ class Greeter : public ZU::ZUModule {
     return stopSeen;
   }
 
-  std::vector<std::string> said() const {
-    std::lock_guard lock(fMutex);
-    return fSaid;
-  }
-
   Gate started;
   Gate release;
   std::atomic<int> taskId{-2};
   std::atomic<bool> stopSeen{false};
-
- private:
-  void record(const std::string& s) {
-    std::lock_guard lock(fMutex);
-    fSaid.push_back(s);
-  }
-  mutable std::mutex fMutex;
-  std::vector<std::string> fSaid;
+  ko::test::Recorded<std::string> said;
 };
 
 }  // namespace zutest

@@ -4,11 +4,9 @@
 
 #include <memory>
 #include <string>
-#include <vector>
 
 #include "ko/json.hpp"
 #include "ko_test_helpers.hpp"
-#include "zu/zuerror.h"
 
 namespace {
 

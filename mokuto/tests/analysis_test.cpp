@@ -570,6 +570,17 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"English", "Users reach the mirrors and get used to them.", false},
       {"English", "It loads the image to memory and passes control over.", false},
       {"French", "Il charge le noyau en mémoire et lance init.", false},
+      {"English", "This bypasses the communication channel and gains speed.", false},
+      {"English", "It is run to give root privileges to users and log root activity.", false},
+      {"English", "The packages provide information for maintainers or help with the work.", false},
+      {"English", "I use disks, tapes or films from a good shop and store in a cool place.", false},
+      {"English", "This will allow a review of your text and package name.", true},
+      {"English", "We ship documents in PDF and plain text format.", true},
+      {"English", "It returns the addresses for it and exits.", false},
+      {"English", "It spreads the load over several servers and networks.", true},
+      {"French", "Il a de riches fonctionnalités et aide à identifier les processus.", false},
+      {"English", "Data should be on different disks and machines to resist it.", true},
+      {"French", "J'achète des pommes d'une petite marque et je les range ici.", false},
       {"English", "It sorts the files and lists of names.", true},
       {"English", "Build the package with dpkg-buildpackage and run lintian on it.", false},
       {"English", "Set the version with dch and then insert the comments.", false},
@@ -604,10 +615,12 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);
     analyzer.setLanguage(c.language);
-    const std::string structures = describe(analyzer.analyse(c.text));
+    const ZULingSyntacticAnalysis analysis = analyzer.analyse(c.text);
     const bool enumeration =
-        structures.find("and") != std::string::npos || structures.find("or2") != std::string::npos;
-    EXPECT_EQ(enumeration, c.enumeration) << c.text << ": " << structures;
+        std::any_of(analysis.structures.begin(), analysis.structures.end(), [](const auto& s) {
+          return s.kind == STRUCTURE_AND || (s.kind == STRUCTURE_OR && s.itemCount == 2);
+        });
+    EXPECT_EQ(enumeration, c.enumeration) << c.text << ": " << describe(analysis);
   }
   // Words of one language that another spells alike call for no gesture there: their
   // tags are none of the library's. The answer "No" shakes the head.

@@ -9,7 +9,6 @@
 #include <optional>
 #include <string>
 #include <thread>
-#include <vector>
 
 #include "ko/log.hpp"
 #include "lingtest.h"

@@ -11,7 +11,6 @@
 #include <map>
 #include <memory>
 #include <string>
-#include <vector>
 
 #include "director_rig.h"
 #include "ko/json.hpp"

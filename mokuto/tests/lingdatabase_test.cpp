@@ -43,15 +43,12 @@ void put32(std::string& bytes, std::size_t at, std::uint32_t value) {
 
 class LingDatabaseTest : public ::testing::Test {
  protected:
-  std::string write(const std::string& name, const std::string& bytes) {
-    return folder_.write(name, bytes);
-  }
   lingtest::Folder folder_;
 };
 
 TEST_F(LingDatabaseTest, EveryWordGivesItsRecordsAndBaseForms) {
   ZULingSyntacticAnalyzerBinaryDatabase db;
-  ASSERT_TRUE(db.load(write("fr.bdb", build(kLexicon))));
+  ASSERT_TRUE(db.load(folder_.write("fr.bdb", build(kLexicon))));
   using namespace ZU;
   struct Case {
     std::string word;
@@ -98,7 +95,7 @@ TEST_F(LingDatabaseTest, EveryWordGivesItsRecordsAndBaseForms) {
 
 TEST_F(LingDatabaseTest, FindGivesTheLongestStoredPrefix) {
   ZULingSyntacticAnalyzerBinaryDatabase db;
-  ASSERT_TRUE(db.load(write("fr.bdb", build(kLexicon))));
+  ASSERT_TRUE(db.load(folder_.write("fr.bdb", build(kLexicon))));
   struct Case {
     std::string key;
     std::size_t start;
@@ -182,7 +179,7 @@ TEST_F(LingDatabaseTest, DamagedFilesAreRefusedOrAnswerNotFound) {
     SCOPED_TRACE(c.name);
     std::string bytes = good;
     bytes.replace(c.at, c.with.size(), c.with);
-    const std::string path = write("damaged.bdb", bytes);
+    const std::string path = folder_.write("damaged.bdb", bytes);
     ko::log::ScopedCapture capture(ko::log::Warning);
     ZULingSyntacticAnalyzerBinaryDatabase db;
     EXPECT_EQ(db.load(path), c.refusal == nullptr);
@@ -198,7 +195,7 @@ TEST_F(LingDatabaseTest, DamagedFilesAreRefusedOrAnswerNotFound) {
   }
   // Bytes after the body the header announces are not read.
   ZULingSyntacticAnalyzerBinaryDatabase longer;
-  ASSERT_TRUE(longer.load(write("longer.bdb", good + "tail")));
+  ASSERT_TRUE(longer.load(folder_.write("longer.bdb", good + "tail")));
   std::size_t longestPrefix = 0;
   EXPECT_TRUE(longer.find("ab", 0, longestPrefix).has_value());
 }
@@ -208,14 +205,14 @@ TEST_F(LingDatabaseTest, TruncatedAndOutOfDateFilesAreRefused) {
   ZULingSyntacticAnalyzerBinaryDatabase db;
   for (std::size_t length = 0; length < good.size(); ++length) {
     ko::log::ScopedCapture capture(ko::log::Warning);
-    EXPECT_FALSE(db.load(write("cut.bdb", good.substr(0, length)))) << length;
+    EXPECT_FALSE(db.load(folder_.write("cut.bdb", good.substr(0, length)))) << length;
     EXPECT_EQ(capture->count(), 1u) << length;
     EXPECT_EQ(db.wordClasses("chat")[0].wordClass, ZU::WORD_CLASS_UNKNOWN);
   }
 
   std::string old = good;
   old[0] = 1;
-  const std::string path = write("old.bdb", old);
+  const std::string path = folder_.write("old.bdb", old);
   ko::log::ScopedCapture capture(ko::log::Warning);
   EXPECT_FALSE(db.load(path));
   EXPECT_TRUE(capture->contains(
@@ -240,7 +237,7 @@ TEST_F(LingDatabaseTest, BaseFormsKeptByTagThenFrequency) {
   options.tags = {"word10000-base"};  // the least frequent
   mkbdb::Report report;
   ZULingSyntacticAnalyzerBinaryDatabase db;
-  ASSERT_TRUE(db.load(write("big.bdb", build(text, options, &report))));
+  ASSERT_TRUE(db.load(folder_.write("big.bdb", build(text, options, &report))));
   EXPECT_EQ(report.baseForms, 8000u);
   EXPECT_LT(report.baseFormsKept, 8000u);
   EXPECT_LE(report.baseFormBytes, 65536u);
@@ -266,7 +263,7 @@ TEST(LingLexiconTest, MalformedLinesAreRefusedWithTheirLine) {
 }
 
 TEST_F(LingDatabaseTest, SetLanguageSharesReloadsAndDrops) {
-  const std::string french = write("french.bdb", build(kLexicon));
+  const std::string french = folder_.write("french.bdb", build(kLexicon));
   const std::string missing = (folder_.path() / "nothing.bdb").string();
   auto languages = std::make_shared<const ZU::ZULingLanguageMap>(
       ZU::ZULingLanguageMap{{"French", french}, {"fr_FR", french}, {"Missing", missing}});
@@ -282,7 +279,7 @@ TEST_F(LingDatabaseTest, SetLanguageSharesReloadsAndDrops) {
   // Were the file read again now, it would be refused.
   std::string old = build(kLexicon);
   old[0] = 1;
-  write("french.bdb", old);
+  folder_.write("french.bdb", old);
   analyzer.setLanguage("fr_FR");
   tagger.setLanguage("fr_FR");
   EXPECT_EQ(analyzer.database(), loaded);

@@ -12,7 +12,6 @@
 #include <memory>
 #include <optional>
 #include <set>
-#include <sstream>
 #include <string>
 #include <vector>
 
@@ -23,6 +22,7 @@
 #include "mokuto/zumokutoparser.h"
 #include "robotbodytalk/zurobotbodytalk.h"
 #include "robotsim/robot.h"
+#include "support/behavior_files.h"
 #include "support/fake_robot.h"
 #include "zu/zubroker.h"
 #include "zu/zumodule.h"
@@ -31,6 +31,7 @@
 
 namespace {
 
+using robotsim::simtest::descriptor;
 using testing::Contains;
 using testing::ElementsAre;
 using testing::IsEmpty;
@@ -70,17 +71,6 @@ const std::vector<Behavior> kLibrary = {
     {kSpeakingSit, {}},
     {kExtraSpeaking, {"extra"}},
 };
-
-// A short move of the head, with those tags.
-std::string descriptor(const std::vector<std::string>& tags) {
-  std::ostringstream out;
-  out << "{\"tags\": [";
-  for (std::size_t i = 0; i < tags.size(); ++i)
-    out << (i ? ", " : "") << '"' << tags[i] << '"';
-  out << "], \"duration\": 0.3, \"joints\": {\"HeadYaw\": {\"times\": [0.3], \"keys\": "
-         "[[0.1, [3, -0.1, 0.0], [3, 0.0, 0.0]]]}}}";
-  return out.str();
-}
 
 // The job of an annotated text as the compiler leaves it; "auto:<tag>" stands for one
 // automatic tag.
@@ -138,7 +128,8 @@ class LoaderOnRobot : public testing::Test {
  protected:
   LoaderOnRobot() {
     for (const auto& behavior : kLibrary)
-      library.write(std::string(behavior.path) + "/behavior.json", descriptor(behavior.tags));
+      library.write(std::string(behavior.path) + "/behavior.json",
+                    descriptor(behavior.tags, 0.3, "HeadYaw", 0.1));
     robotsim::RobotOptions options;
     options.speech.backend = robotsim::ZUTextToSpeechOptions::Backend::Timing;
     options.behaviorsRoot = library.path().string();
@@ -205,7 +196,7 @@ TEST_F(LoaderOnRobot, FollowsTheBehaviourManagersEventsWhileSubscribed) {
   loader->subscribeToEvents();
   const auto manager = service("ZUBehaviorManager");
   const std::string added = "animations/Sit/Gestures/New_1";
-  manager->call<void>("installBehavior", added, descriptor({"new"}));
+  manager->call<void>("installBehavior", added, descriptor({"new"}, 0.3, "HeadYaw", 0.1));
   EXPECT_TRUE(ko::test::eventually(
       [this] { return loader->getInstalledTags(ZU::Sitting).count("new") == 1; }));
   manager->call<bool>("removeBehavior", added);

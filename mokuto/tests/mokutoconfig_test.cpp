@@ -57,9 +57,14 @@ void expectDefaults(const MokutoConfig& c) {
   EXPECT_FALSE(c.inputMode2);
 }
 
-TEST(MokutoConfigTest, ResetKeepsOnlyTheFirstPackageAndFourEmptyMaps) {
+// A configuration, and what it logs.
+class MokutoConfigTest : public ::testing::Test {
+ protected:
   ko::log::ScopedCapture cap;
   MokutoConfig c;
+};
+
+TEST_F(MokutoConfigTest, ResetKeepsOnlyTheFirstPackageAndFourEmptyMaps) {
   c.fromZUValue(json(R"([["bodyLanguageMode", "disabled"], ["msPauseBeforeSpeech", 3],
       ["behaviorAtEndOfMokuto", "b"], ["ifBehaviorAtEndOfMokutoIsBlocking", false],
       ["armsBreathingAllowed", false]])"));
@@ -100,9 +105,7 @@ TEST(EnumNamesTest, LookupsMatchTheFirstThreeNamesExactly) {
   EXPECT_THAT(printed(c), ::testing::StartsWith("config: bodyLanguageMode: endOfEnum\n"));
 }
 
-TEST(MokutoConfigFromZUValueTest, SetsEveryKeyAndLaterPairsOverrideEarlierOnes) {
-  ko::log::ScopedCapture cap;
-  MokutoConfig c;
+TEST_F(MokutoConfigTest, SetsEveryKeyAndLaterPairsOverrideEarlierOnes) {
   c.fromZUValue(json(R"([["msPauseBeforeSpeech", 100], ["bodyLanguageMode", "random"],
       ["behaviorAtEndOfMokuto", "animations/Stand/Gestures/Hey_1"],
       ["ifBehaviorAtEndOfMokutoIsBlocking", false], ["armsBreathingAllowed", false],
@@ -166,9 +169,7 @@ INSTANTIATE_TEST_SUITE_P(
                      "pause time can't be negative."}),
     [](const ::testing::TestParamInfo<RejectedCase>& p) { return p.param.name; });
 
-TEST(MokutoConfigFromZUValueTest, GoesOnAfterARejectedPair) {
-  ko::log::ScopedCapture cap;
-  MokutoConfig c;
+TEST_F(MokutoConfigTest, GoesOnAfterARejectedPair) {
   c.fromZUValue(json(R"([["msPauseBeforeSpeech", -5], ["bodyLanguageMode", "Random"],
       ["volume", 1], [5], ["msPauseBeforeSpeech", 20], ["bodyLanguageMode", "random"],
       ["armsBreathingAllowed", 1], ["armsBreathingAllowed", false]])"));
@@ -179,9 +180,7 @@ TEST(MokutoConfigFromZUValueTest, GoesOnAfterARejectedPair) {
   EXPECT_EQ(cap->count(), 4u);
 }
 
-TEST(MokutoConfigFromZUValueTest, MalformedValuesAndElementsAreSkippedSilently) {
-  ko::log::ScopedCapture cap;
-  MokutoConfig c;
+TEST_F(MokutoConfigTest, MalformedValuesAndElementsAreSkippedSilently) {
   for (const char* text :
        {"5", "null", R"("msPauseBeforeSpeech")", R"([5, [], ["msPauseBeforeSpeech"],
             ["msPauseBeforeSpeech", 0, 1], [1, 0], [["msPauseBeforeSpeech"], 0]])"}) {
@@ -196,9 +195,7 @@ TEST(MokutoConfigFromZUValueTest, MalformedValuesAndElementsAreSkippedSilently) 
 }
 
 // Only pairs of a tag and an array count, and only the strings of the array.
-TEST(MokutoConfigWordsTest, AddsTheTagToEachWordKeepsDuplicatesAndSkipsOtherShapes) {
-  ko::log::ScopedCapture cap;
-  MokutoConfig c;
+TEST_F(MokutoConfigTest, AddsTheTagToEachWordKeepsDuplicatesAndSkipsOtherShapes) {
   const ZUValue value = json(R"([["hello", ["hi", "hey"]]])");
   c.updateWordsToTags(value);
   EXPECT_EQ(c.wordsToTags, (Words{{"hey", {"hello"}}, {"hi", {"hello"}}}));
@@ -219,8 +216,7 @@ TEST(MokutoConfigWordsTest, AddsTheTagToEachWordKeepsDuplicatesAndSkipsOtherShap
   EXPECT_EQ(c.wordsToTags.size(), 3u);
 }
 
-TEST(MokutoConfigWordsTest, PrintedFormListsWordsByTag) {
-  MokutoConfig c;
+TEST_F(MokutoConfigTest, PrintedFormListsWordsByTag) {
   c.updateWordsToTags(json(R"([["hello", ["hi", "hey"]], ["greet", ["hi"]], ["hello", ["hey"]]])"));
   EXPECT_EQ(printed(c),
             std::string(kDefaultPrinted) +
@@ -233,9 +229,7 @@ TEST(MokutoConfigWordsTest, PrintedFormListsWordsByTag) {
 
 // Non-strings and animations of unknown posture are logged and the walk goes on; the
 // first element of another shape ends it.
-TEST(MokutoConfigAnimationsTest, StoresEachAnimationUnderItsPostureAndLogsTheRest) {
-  ko::log::ScopedCapture cap;
-  MokutoConfig c;
+TEST_F(MokutoConfigTest, StoresEachAnimationUnderItsPostureAndLogsTheRest) {
   c.updateTagsToAnimations(json(R"([["hello", ["animations/Stand/Gestures/Hey_1",
       "animations/Sit/Gestures/Hey_1", 7, "animations/Stand/Gestures/Hey_1"]],
       ["wave", [null, "animations/Crouch/W", "animations/Stand/W"]],
@@ -319,9 +313,7 @@ INSTANTIATE_TEST_SUITE_P(
         PostureCase{{"animations/", "a/very/long/package/"}, "animations/Sit/a", ZU::Sitting},
         PostureCase{{"pkg/", "animations/"}, "animations/SitOnPod/a", ZU::SittingOnChair}));
 
-TEST(MokutoConfigOutOfRangeTest, PathShorterThanAPackageTriedThrowsAndKeepsWhatWasStored) {
-  ko::log::ScopedCapture cap;
-  MokutoConfig c;
+TEST_F(MokutoConfigTest, PathShorterThanAPackageTriedThrowsAndKeepsWhatWasStored) {
   c.animationsPackages = {"animations/", "a/very/long/package/"};
   EXPECT_THROW(c.xPostureFamilyFormAnimPath("animations/Foo"), std::out_of_range);
   EXPECT_THROW(c.xPostureFamilyFormAnimPath("anim"), std::out_of_range);

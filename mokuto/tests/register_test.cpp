@@ -4,7 +4,6 @@
 #include <chrono>
 #include <future>
 #include <memory>
-#include <string>
 
 #include "ko/log.hpp"
 #include "ko_test_helpers.hpp"

@@ -12,7 +12,6 @@
 #include <iostream>
 #include <map>
 #include <random>
-#include <string>
 #include <thread>
 #include <vector>
 

@@ -10,7 +10,6 @@
 #include <chrono>
 #include <future>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <stdexcept>
 #include <string>
@@ -43,31 +42,15 @@ constexpr const char* kEnd = "ZUMokuto/EndOfMokuto";
 // ---- services of the tests -----------------------------------------------------------------
 
 // The stages entered, in order, as the module reports them.
-struct StageLog {
-  std::mutex mutex;
-  std::condition_variable changed;
-  std::vector<std::pair<Stage, ZU::MKID>> entries;
+struct StageLog : ko::test::Recorded<std::pair<Stage, ZU::MKID>> {
   std::atomic<int> failAt{-1};  // a stage that throws
 
   void enter(Stage stage, ZU::MKID id) {
-    {
-      std::lock_guard lock(mutex);
-      entries.emplace_back(stage, id);
-    }
-    changed.notify_all();
+    add({stage, id});
     if (failAt.load() == static_cast<int>(stage))
       throw std::runtime_error("the stage broke");
   }
-  bool waitFor(Stage stage, ZU::MKID id) {
-    std::unique_lock lock(mutex);
-    return changed.wait_for(lock, kBound, [&] {
-      return std::find(entries.begin(), entries.end(), std::pair{stage, id}) != entries.end();
-    });
-  }
-  std::vector<std::pair<Stage, ZU::MKID>> all() {
-    std::lock_guard lock(mutex);
-    return entries;
-  }
+  bool waitFor(Stage stage, ZU::MKID id) { return waitForValue({stage, id}); }
 };
 
 // ---- the service on the simulated robot, with a scripted speech engine ---------------------

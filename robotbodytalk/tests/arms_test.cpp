@@ -98,7 +98,6 @@ TEST(ArmsIteration, InAnUnknownPostureTheyTakeTheLatestOnceAndOtherwiseWarn) {
   }
 }
 
-// The listening arms wait a second before their first animation, the speaking ones none.
 TEST(ArmsIteration, TheListeningArmsStartAfterASecondTheSpeakingOnesAtOnce) {
   EXPECT_EQ(Arms(1.0).arms.getStartDelay(), 0);
   EXPECT_EQ(Arms(1.0, ZURobotBodyTalkArms::kListening).arms.getStartDelay(), 1);

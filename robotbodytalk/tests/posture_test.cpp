@@ -2,7 +2,6 @@
 // the parts see a new family.
 #include <gtest/gtest.h>
 
-#include <string>
 #include <vector>
 
 #include "robotbodytalk/zurobotbodytalkposture.h"

@@ -4,7 +4,6 @@
 
 #include <chrono>
 #include <future>
-#include <memory>
 #include <string>
 #include <vector>
 
@@ -81,6 +80,7 @@ RobotOptions robotWithTones(const ScratchFolder& folder) {
 
 class AudioPlayerService : public testing::Test {
  protected:
+  AudioPlayerService() { proxy.loadSoundSet("tones"); }
   std::size_t count(const char* operation) const {
     return robot.timeline()->entries("ZUAudioPlayer", operation).size();
   }
@@ -93,7 +93,6 @@ class AudioPlayerService : public testing::Test {
 };
 
 TEST_F(AudioPlayerService, LoadsAndUnloadsSoundSets) {
-  proxy.loadSoundSet("tones");
   proxy.loadSoundSet("tones");  // again: read anew
   EXPECT_THAT(generic.call<std::vector<std::string>>("getLoadedSoundSetsList"),
               ElementsAre("tones"));
@@ -107,7 +106,6 @@ TEST_F(AudioPlayerService, LoadsAndUnloadsSoundSets) {
 }
 
 TEST_F(AudioPlayerService, ARunSoundPlaysTheWholeFile) {
-  proxy.loadSoundSet("tones");
   // As "^runSound(tones/beep, 50)" plays it: synchronous, returning at the end.
   proxy.playSoundSetFile("tones", "beep", 0, 0.5, 0, 0);
   const auto plays = robot.timeline()->entries("ZUAudioPlayer", "playSoundSetFile");
@@ -125,7 +123,6 @@ TEST_F(AudioPlayerService, ARunSoundPlaysTheWholeFile) {
 
 // A posted play ends at its end or at its stop, even a stop that comes before it begins.
 TEST_F(AudioPlayerService, PostedPlaysAreWaitedForAndStopped) {
-  proxy.loadSoundSet("tones");
   const int beep = proxy.post_playSoundSetFile("tones", "beep", 0, 0.3, 0, 0);
   EXPECT_FALSE(proxy.wait(beep, 0));  // 0: no limit; false: the play ended
   EXPECT_TRUE(waiter.waitFor("ZUAudioPlayer", "soundEnded"));
@@ -151,7 +148,6 @@ TEST_F(AudioPlayerService, PostedPlaysAreWaitedForAndStopped) {
 }
 
 TEST_F(AudioPlayerService, StopAllEndsEveryPlay) {
-  proxy.loadSoundSet("tones");
   const int posted = proxy.post_playSoundSetFile("tones", "beep", 0, 1.0, 0, 1);  // looping
   auto direct = std::async(std::launch::async, [this] {
     ZU::ZUAudioPlayerProxy(robot.broker()).playSoundSetFile("tones", "Long", 0, 1.0, 0, 0);
@@ -176,7 +172,6 @@ TEST_F(AudioPlayerService, BadPlaysAreErrors) {
       {"bells", "ding", 0, "Sound set \"bells\" is not loaded"},
       {"tones", "beep", -1, "The position must be a number of seconds from 0"},
   };
-  proxy.loadSoundSet("tones");
   for (const auto& c : cases) {
     EXPECT_THAT(ko::test::errorOf([&] {
                   generic.call<void>("playSoundSetFile", c.set, c.file, c.position, 1.0, 0.0,

@@ -2,16 +2,10 @@
 // drives it: names, tags, preloads, starts, runs and stops with "behaviorStopped" at every
 // end, the library's events, malformed descriptors, and the starter library in share/.
 
-#include <algorithm>
 #include <atomic>
-#include <chrono>
-#include <condition_variable>
 #include <filesystem>
-#include <functional>
 #include <map>
 #include <memory>
-#include <mutex>
-#include <sstream>
 #include <stdexcept>
 #include <string>
 #include <utility>
@@ -27,6 +21,7 @@
 #include "robotsim/jointmodel.h"
 #include "robotsim/robot.h"
 #include "robotsim/zubehaviormanager.h"
+#include "support/behavior_files.h"
 #include "support/timeline_waiter.h"
 #include "zu/zubroker.h"
 #include "zu/zuerror.h"
@@ -39,12 +34,12 @@ namespace {
 namespace fs = std::filesystem;
 using ko::test::errorOf;
 using ko::test::ScratchFolder;
+using simtest::descriptor;
 using testing::ElementsAre;
 using testing::HasSubstr;
 using Behaviors = std::vector<std::pair<std::string, std::string>>;  // path, descriptor
 using Lists = std::vector<std::vector<std::string>>;
 
-constexpr auto kBound = std::chrono::seconds(10);
 constexpr const char* kAdded = "ZUBehaviorManager/BehaviorsAdded";
 constexpr const char* kRemoved = "ZUBehaviorManager/BehaviorsRemoved";
 constexpr const char* kHeyStand = "animations/Stand/Gestures/Hey_1";
@@ -52,19 +47,6 @@ constexpr const char* kHeySit = "animations/Sit/Gestures/Hey_1";
 constexpr const char* kSpeaking = "animations/Stand/BodyTalk/Speaking_1";
 constexpr const char* kLongHead = "animations/Stand/Long_1";
 constexpr const char* kLongArm = "animations/Stand/Long_2";
-
-// A descriptor moving one joint to `angle` in `seconds`.
-std::string descriptor(const std::vector<std::string>& tags, double seconds,
-                       const std::string& joint = "HeadYaw", double angle = 0.3) {
-  std::ostringstream out;
-  out << "{\"tags\": [";
-  for (std::size_t i = 0; i < tags.size(); ++i)
-    out << (i ? ", " : "") << '"' << tags[i] << '"';
-  out << "], \"duration\": " << seconds << ", \"joints\": {\"" << joint << "\": {\"times\": ["
-      << seconds << "], \"keys\": [[" << angle << ", [3, " << -seconds / 3 << ", 0.0], [3, 0.0, "
-      << "0.0]]]}}}";
-  return out.str();
-}
 
 // The simulated robot on a library of these behaviours, written in `folder`.
 RobotOptions robotOn(const ScratchFolder& folder, const Behaviors& behaviors) {
@@ -78,29 +60,12 @@ RobotOptions robotOn(const ScratchFolder& folder, const Behaviors& behaviors) {
 
 // Records the "behaviorStopped" signal; shared with the subscription, which may outlive
 // the test's body.
-struct StoppedRecorder {
-  bool waitFor(const std::string& behavior, long count = 1) {
-    std::unique_lock lock(mutex);
-    return changed.wait_for(lock, kBound, [&] {
-      return std::count(stopped.begin(), stopped.end(), behavior) >= count;
-    });
-  }
-  std::vector<std::string> all() {
-    std::lock_guard lock(mutex);
-    return stopped;
-  }
-  std::mutex mutex;
-  std::condition_variable changed;
-  std::vector<std::string> stopped;
-};
+using StoppedRecorder = ko::test::Recorded<std::string>;
 
 std::shared_ptr<StoppedRecorder> listen(ZU::ZUBehaviorManagerProxy& proxy) {
   auto recorder = std::make_shared<StoppedRecorder>();
-  proxy.getObject()->connect("behaviorStopped", [recorder](const std::string& behavior) {
-    std::lock_guard lock(recorder->mutex);
-    recorder->stopped.push_back(behavior);
-    recorder->changed.notify_all();
-  });
+  proxy.getObject()->connect("behaviorStopped",
+                             [recorder](const std::string& behavior) { recorder->add(behavior); });
   return recorder;
 }
 
@@ -168,10 +133,10 @@ TEST_F(BehaviorManagerService, ResolvesNamesAndListsTags) {
 // Every way a behaviour ends frees its joints and is told: to the subscribers of
 // "behaviorStopped" once, and on the timeline with how it ended.
 TEST_F(BehaviorManagerService, EveryEndFreesTheJointsAndIsTold) {
-  std::map<std::string, long> stops;  // told so far, by behaviour
+  std::map<std::string, std::size_t> stops;  // told so far, by behaviour
   const auto told = [&](std::initializer_list<std::pair<const char*, const char*>> behaviors) {
     for (const auto& [behavior, how] : behaviors) {
-      EXPECT_TRUE(recorder->waitFor(behavior, ++stops[behavior])) << behavior;
+      EXPECT_TRUE(recorder->waitForValue(behavior, ++stops[behavior])) << behavior;
       EXPECT_EQ(howEnded(behavior), how) << behavior;
     }
     EXPECT_TRUE(running().empty());
@@ -242,7 +207,7 @@ TEST_F(BehaviorManagerService, AnUntoldStopIsNotHeardAfterTheNextStart) {
   // Everything told before this second news of kLongArm has been told.
   proxy.startBehavior(kLongArm);
   proxy.stopBehavior(kLongArm);
-  ASSERT_TRUE(recorder->waitFor(kLongArm, 2));
+  ASSERT_TRUE(recorder->waitForValue(kLongArm, 2));
   EXPECT_THAT(recorder->all(), ElementsAre(kLongArm, kLongHead, kLongArm));
   // The timeline keeps both ends.
   EXPECT_EQ(robot.timeline()->entries("ZUBehaviorManager", "behaviorStopped").size(), 4u);
@@ -259,8 +224,8 @@ TEST_F(BehaviorManagerService, AThrowingTimelineListenerIsLoggedAndTheNewsGoOn) 
     proxy.startBehavior(behavior);
     proxy.stopBehavior(behavior);
   }
-  ASSERT_TRUE(recorder->waitFor(kLongHead));
-  ASSERT_TRUE(recorder->waitFor(kLongArm));
+  ASSERT_TRUE(recorder->waitForValue(kLongHead));
+  ASSERT_TRUE(recorder->waitForValue(kLongArm));
   EXPECT_TRUE(cap->containsPart("robotsim.timeline", ko::log::Error, "viewer gone"));
 }
 
@@ -272,7 +237,7 @@ TEST_F(BehaviorManagerService, RefusedStartsAreErrors) {
   EXPECT_THAT(errorOf([&] { proxy.runBehavior("animations/Stand/No"); }),
               HasSubstr("not installed"));
   proxy.stopBehavior(kLongHead);
-  EXPECT_TRUE(recorder->waitFor(kLongHead));
+  EXPECT_TRUE(recorder->waitForValue(kLongHead));
   EXPECT_THAT(recorder->all(), ElementsAre(kLongHead));
 }
 
@@ -290,7 +255,7 @@ TEST_F(BehaviorManagerService, LibraryChangesAreAnnounced) {
   // Removing a running behaviour stops it first.
   proxy.startBehavior(kLongHead);
   EXPECT_TRUE(generic.call<bool>("removeBehavior", kLongHead));
-  EXPECT_TRUE(recorder->waitFor(kLongHead));
+  EXPECT_TRUE(recorder->waitForValue(kLongHead));
   EXPECT_FALSE(fs::exists(folder.path() / kLongHead));
   // A rescan announces what changed on disk; a second one, nothing.
   const std::string yes = "animations/Stand/Gestures/Yes_1";

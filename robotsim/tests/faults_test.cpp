@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <atomic>
 #include <chrono>
+#include <cstdint>
 #include <future>
 #include <memory>
 #include <set>
@@ -17,7 +18,6 @@
 #include "robotsim/faults.h"
 #include "robotsim/robot.h"
 #include "support/recording_module.h"
-#include "zu/zuerror.h"
 #include "zu/zuproxy.h"
 #include "zu/zuserviceproxies.h"
 

@@ -4,7 +4,6 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
-#include <chrono>
 #include <memory>
 #include <string>
 #include <thread>
@@ -176,7 +175,6 @@ TEST(MemoryLifetime, ACallbackHoldingTheServiceMayOutliveItsOwners) {
   ko::waitForReaper();
 }
 
-// Once unsubscribeToEvent returns, no callback of that subscription runs or begins.
 TEST_F(MemoryTest, NoCallbackRunsOnceTheUnsubscribeHasReturned) {
   std::atomic<bool> unsubscribed{false};
   std::atomic<int> late{0};

@@ -54,8 +54,6 @@ TEST(Robot, ServicesAreWithdrawnWhenTheRobotGoesOrCannotStart) {
   EXPECT_TRUE(broker->service("ZUMemory"));
 }
 
-// A change of posture family raises "PostureFamilyChanged" once; unknown families are
-// refused.
 TEST(Robot, PostureFamilyChangesRaiseTheirEventOnce) {
   robotsim::Robot robot(timingRobot());
   const auto listener =

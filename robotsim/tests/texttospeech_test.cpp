@@ -5,10 +5,9 @@
 
 #include <algorithm>
 #include <chrono>
+#include <cstdint>
 #include <memory>
-#include <stdexcept>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include "ko/log.hpp"
@@ -318,7 +317,6 @@ class StopLineHolder : public ko::log::Sink {
   simtest::TimelineWaiter& fWaiter;
 };
 
-// A stop that lands while its posted say begins is never lost.
 TEST(TextToSpeechStops, AStopLandingWhileItsSayBeginsIsNeverLost) {
   Robot robot(timing(1.0));
   simtest::TimelineWaiter started(*robot.timeline);
@@ -345,7 +343,6 @@ class ReadingHolder : public ko::log::Sink {
   ko::test::Gate reading, stopped;
 };
 
-// A stop that lands while its text is registered but not queued yet is never lost.
 TEST(TextToSpeechStops, AStopLandingBeforeItsTextIsQueuedIsNeverLost) {
   ZUTextToSpeechOptions options = espeak();
   options.language = "Japanese";
@@ -394,7 +391,6 @@ TEST(TextToSpeechStops, StopsEndTheSaysStillQueued) {
   }
 }
 
-// A blocking call still queued when its text is stopped is never made.
 TEST(TextToSpeechStops, AStoppedTextsQueuedBlockingCallIsWithdrawn) {
   Robot robot(timing(1.0));
   simtest::TimelineWaiter holds(*robot.timeline);

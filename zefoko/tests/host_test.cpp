@@ -8,7 +8,6 @@
 #include <string>
 #include <vector>
 
-#include "ko/log.hpp"
 #include "ko_test_helpers.hpp"
 #include "ko_test_process.hpp"
 #include "zefoko/host.h"

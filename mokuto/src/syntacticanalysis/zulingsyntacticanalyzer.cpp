@@ -32,6 +32,13 @@ constexpr std::array<std::string_view, 3> kParticles = {"と", "や", "か"};
 constexpr std::array<std::string_view, 2> kAgentWords = {"by", "par"};
 // Determiners that are also the preposition "de": they follow nouns as often as verbs.
 constexpr std::array<std::string_view, 4> kPartitives = {"d", "de", "du", "des"};
+// Prepositions whose complement is rather a list than a verb's: the complement of a noun
+// ("a review of the text and package name") or a pair ("between each directory or file").
+constexpr std::array<std::string_view, 7> kListPrepositions = {"of",  "de",      "d",    "du",
+                                                               "des", "between", "entre"};
+// The preposition of an infinitive that complements a verb: "helps to identify", "aide à
+// identifier".
+constexpr std::array<std::string_view, 2> kInfinitiveWords = {"to", "à"};
 // Words that begin an indirect question or a relative clause.
 constexpr std::array<std::string_view, 10> kQuestionWords = {
     "how", "why", "what", "whether", "comment", "pourquoi", "combien", "quoi", "lorsque", "quand"};
@@ -554,7 +561,8 @@ class StructureBuilder {
   // apples"); after a determiner, an adjective or a preposition, a verb that can be a
   // noun is one ("les pommes", "the walk"), unless an infinitive follows a preposition
   // ("de manger"); a determiner that can be an object pronoun before a verb is one ("je
-  // le mange"). But after a comma or a coordinating word (adverbs between), a word that is
+  // le mange"), after a subject even before a word that can be a noun ("et je les range").
+  // But after a comma or a coordinating word (adverbs between), a word that is
   // first an auxiliary, or first a verb and takes an object (a determiner, a pronoun, a
   // name or a word the lexicon does not know), begins a second action ("and are not
   // requirements", "build it with dpkg-buildpackage and run lintian"), and so does any
@@ -631,7 +639,7 @@ class StructureBuilder {
       if (role == Role::Determiner && token.has(WORD_CLASS_PRONOUN_COMP) && xIsWord(t + 1)) {
         const Token& next = fTokens[t + 1];
         if ((next.has(WORD_CLASS_VERB) || next.has(WORD_CLASS_AUXILIARY)) &&
-            !next.has(WORD_CLASS_NOUN) && !next.has(WORD_CLASS_ADJECTIVE))
+            (subjectBefore || (!next.has(WORD_CLASS_NOUN) && !next.has(WORD_CLASS_ADJECTIVE))))
           role = Role::Clitic;
       }
       if (role == Role::Determiner && subjectBefore &&
@@ -651,6 +659,13 @@ class StructureBuilder {
           token.has(WORD_CLASS_PRONOUN_COMP) && xIsWord(t + 1) &&
           (fTokens[t + 1].has(WORD_CLASS_VERB) || fTokens[t + 1].has(WORD_CLASS_AUXILIARY)))
         role = Role::Clitic;
+      // "This" before a word of the third person singular is the subject of that verb: as
+      // a determiner it would stand before a plural ("this bypasses the channel").
+      if (role == Role::Noun && token.thirdSingular && t > 0 && xIsWord(t - 1) &&
+          fTokens[t - 1].lower == "this" && fTokens[t - 1].has(WORD_CLASS_PRONOUN)) {
+        fTokens[t - 1].role = Role::Pronoun;
+        role = Role::Verb;
+      }
       // The answer "No." or "No, ..." rather than the determiner of "no file".
       if (role == Role::Determiner && token.negativeDeterminer &&
           token.has(WORD_CLASS_INTERJECTION) && !xIsWord(t + 1))
@@ -980,6 +995,32 @@ class StructureBuilder {
         (xObjectAt(group.firstToken + 1) || fTokens[group.firstToken + 1].role == Role::Noun) &&
         xThirdSingularVerbBefore(previous))
       return true;
+    // A noun or verb that can be an infinitive, before its object or a preposition, after
+    // an item that is the complement of a verb of that form and its object: a second action
+    // of the same form ("to give privileges to users and log root activity", "provide
+    // information for maintainers or help with the work"; not "allow a review of the text
+    // and package name", "ship the documents in PDF and plain text").
+    if (lone.infinitive &&
+        (lone.firstClass == WORD_CLASS_NOUN || lone.firstClass == WORD_CLASS_VERB) &&
+        previous > 0 && xIsPreposition(previous - 1) &&
+        !isOneOf(fTokens[previous - 1].lower, kListPrepositions) &&
+        xBaseVerbAndObjectBefore(previous - 1) &&
+        (single
+             ? xIsPreposition(group.lastToken + 1)
+             : fTokens[group.firstToken + 1].role == Role::Noun || xObjectAt(group.firstToken + 1)))
+      return true;
+    // A lone verb of the third person after a pronoun, where the clause's verb is one too:
+    // no list joins a pronoun and such a word ("it returns the addresses for it and exits").
+    if (single && lone.thirdSingular && leftItems == 1 && xIsPronoun(firstLeft.group) &&
+        xThirdSingularVerbBefore(previous))
+      return true;
+    // A lone verb of the third person before the infinitive it governs, where the clause's
+    // verb is one too ("it has features and helps to identify", "il a des fonctionnalités et
+    // aide à identifier"; not "it should be on disks and machines to withstand").
+    if (single && lone.thirdSingular && xIsWord(group.lastToken + 2) &&
+        isOneOf(fTokens[group.lastToken + 1].lower, kInfinitiveWords) &&
+        fTokens[group.lastToken + 2].infinitive && xThirdSingularVerbBefore(previous))
+      return true;
     // The last verb group before the first item: whether it has a verb of a tense ("n'est
     // pas une personne", not "se servant de gettext"), and ends in an infinitive after it
     // ("vous devriez envoyer").
@@ -1143,6 +1184,41 @@ class StructureBuilder {
                fGroups[fGroupOfToken[t]].kind == STRUCTURE_VERB;
     }
     return false;
+  }
+
+  // Whether the tokens before preposition p are a verb group with a verb of the base form
+  // and its object, or its objects joined by commas and coordinating words ("give limited
+  // root privileges to", "use CD-R and DVD-R by").
+  bool xBaseVerbAndObjectBefore(std::size_t p) const {
+    std::size_t end = p;
+    std::size_t first = kNone;
+    while (end > 0 && fGroupOfToken[end - 1] != kNone) {
+      const Group& object = fGroups[fGroupOfToken[end - 1]];
+      if (object.kind != STRUCTURE_NOMINAL || object.lastToken != end - 1)
+        break;
+      first = object.firstToken;
+      if (first == 0)
+        break;
+      const Token& separator = fTokens[first - 1];
+      if (separator.type != Token::Comma && separator.coordination == Coordination::None)
+        break;
+      end = first - 1;
+    }
+    if (first == kNone || first == 0 || fGroupOfToken[first - 1] == kNone)
+      return false;
+    const Group& verb = fGroups[fGroupOfToken[first - 1]];
+    if (verb.kind != STRUCTURE_VERB)
+      return false;
+    for (std::size_t t = verb.firstToken; t <= verb.lastToken; ++t) {
+      if (fTokens[t].role == Role::Verb && fTokens[t].infinitive)
+        return true;
+    }
+    return false;
+  }
+
+  // Whether group g is a lone pronoun.
+  bool xIsPronoun(std::size_t g) const {
+    return fGroups[g].firstToken == fGroups[g].lastToken && fGroups[g].lastRole == Role::Pronoun;
   }
 
   // Whether a clause may begin after token t: a comma, a mark other than a slash

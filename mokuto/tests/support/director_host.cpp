@@ -1,7 +1,5 @@
 #include "director_host.h"
 
-#include <utility>
-
 #include "mokuto/mokutotimechecker.h"
 
 namespace mokutotest {

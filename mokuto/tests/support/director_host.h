@@ -7,14 +7,12 @@
 // Callbacks arrive on the memory service's delivery threads and on the speech engine's
 // blocking-call threads; say and stop on any test thread.
 
-#include <chrono>
-#include <condition_variable>
-#include <cstddef>
 #include <memory>
 #include <mutex>
 #include <string>
 #include <vector>
 
+#include "ko_test_helpers.hpp"
 #include "mokuto/directortask.h"
 #include "mokuto/mkidregister.h"
 #include "mokuto/mktaskinstruction.h"
@@ -25,27 +23,11 @@
 namespace mokutotest {
 
 // A sync observer that keeps every report; the test waits for them with a bound.
-class SyncRecorder : public ZU::DirectorObserver {
+class SyncRecorder : public ZU::DirectorObserver,
+                     public ko::test::Recorded<ZU::DirectorActionReport> {
  public:
-  void onAction(const ZU::DirectorActionReport& report) override {
-    std::lock_guard lock(fMutex);
-    fReports.push_back(report);
-    fChanged.notify_all();
-  }
-  std::vector<ZU::DirectorActionReport> reports() const {
-    std::lock_guard lock(fMutex);
-    return fReports;
-  }
-  bool waitFor(std::size_t count) const {
-    std::unique_lock lock(fMutex);
-    return fChanged.wait_for(lock, std::chrono::seconds(10),
-                             [&] { return fReports.size() >= count; });
-  }
-
- private:
-  mutable std::mutex fMutex;
-  mutable std::condition_variable fChanged;
-  std::vector<ZU::DirectorActionReport> fReports;
+  void onAction(const ZU::DirectorActionReport& report) override { add(report); }
+  std::vector<ZU::DirectorActionReport> reports() const { return all(); }
 };
 
 class DirectorHost : public ZU::ZUModule {

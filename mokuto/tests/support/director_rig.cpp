@@ -1,8 +1,5 @@
 #include "director_rig.h"
 
-#include <chrono>
-#include <fstream>
-#include <sstream>
 #include <utility>
 
 #include "ko/reaper.hpp"
@@ -14,12 +11,11 @@
 #include "robotsim/zumemory.h"
 #include "robotsim/zumotion.h"
 #include "robotsim/zurobotstate.h"
+#include "support/behavior_files.h"
 #include "zu/zuproxy.h"
 #include "zu/zuserviceproxies.h"
 
 namespace mokutotest {
-
-namespace fs = std::filesystem;
 
 namespace {
 
@@ -27,26 +23,14 @@ struct Gesture {
   const char* path;
   double seconds;
   const char* joint;
-  const char* tags;
+  std::vector<std::string> tags;
 };
 // Each on joints of its own: no gesture takes another's joints over.
-constexpr Gesture kGestures[] = {
-    {kShort, 0.3, "LWristYaw", "\"short\""},
-    {kMid, 1.0, "LShoulderRoll", "\"mid\""},
-    {kLongA, 30.0, "LElbowYaw", "\"hello\", \"long\""},
-    {kLongB, 30.0, "RElbowYaw", "\"hello\""},
-    {kLongC, 30.0, "RWristYaw", "\"yeah\""},
-    {kEnd, 0.2, "RShoulderRoll", "\"end\""},
+const Gesture kGestures[] = {
+    {kShort, 0.3, "LWristYaw", {"short"}},          {kMid, 1.0, "LShoulderRoll", {"mid"}},
+    {kLongA, 30.0, "LElbowYaw", {"hello", "long"}}, {kLongB, 30.0, "RElbowYaw", {"hello"}},
+    {kLongC, 30.0, "RWristYaw", {"yeah"}},          {kEnd, 0.2, "RShoulderRoll", {"end"}},
 };
-
-void writeGesture(const fs::path& root, const Gesture& gesture) {
-  const fs::path folder = root / gesture.path;
-  fs::create_directories(folder);
-  std::ofstream out(folder / "behavior.json");
-  out << "{\"tags\": [" << gesture.tags << "], \"duration\": " << gesture.seconds
-      << ", \"joints\": {\"" << gesture.joint << "\": {\"times\": [" << gesture.seconds
-      << "], \"keys\": [[0.2, [3, " << -gesture.seconds / 3 << ", 0.0], [3, 0.0, 0.0]]]}}}";
-}
 
 }  // namespace
 
@@ -72,8 +56,9 @@ std::vector<std::pair<std::string, ko::AnyValue>> raisedEvents(const robotsim::T
 }
 
 const std::string& writeGestureLibrary(const ko::test::ScratchFolder& folder) {
-  for (const auto& gesture : kGestures)
-    writeGesture(folder.path(), gesture);
+  for (const auto& [path, seconds, joint, tags] : kGestures)
+    folder.write(std::string(path) + "/behavior.json",
+                 robotsim::simtest::descriptor(tags, seconds, joint, 0.2));
   return folder.path().native();
 }
 

@@ -9,7 +9,6 @@
 // Built and destroyed by one thread; the destruction ends the host first, then the speech
 // engine, then the other services.
 
-#include <filesystem>
 #include <future>
 #include <map>
 #include <memory>

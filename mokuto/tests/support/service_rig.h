@@ -8,7 +8,6 @@
 //
 // Built and destroyed by one thread; say, stop and the hook's callers on any.
 
-#include <chrono>
 #include <cstddef>
 #include <functional>
 #include <future>

@@ -7,9 +7,9 @@
 namespace bodytalktest {
 
 std::vector<Call> CallLog::calls(const std::string& method) const {
-  std::lock_guard lock(fMutex);
+  const std::vector<Call> recorded = all();
   std::vector<Call> out;
-  std::copy_if(fCalls.begin(), fCalls.end(), std::back_inserter(out),
+  std::copy_if(recorded.begin(), recorded.end(), std::back_inserter(out),
                [&](const Call& c) { return method.empty() || c.method == method; });
   return out;
 }

@@ -36,11 +36,10 @@ struct Call {
   std::chrono::steady_clock::time_point time;
 };
 
-class CallLog {
+class CallLog : public ko::test::Recorded<Call> {
  public:
   void add(std::string method, std::vector<ZU::ZUValue> args) {
-    std::lock_guard lock(fMutex);
-    fCalls.push_back({std::move(method), std::move(args), std::chrono::steady_clock::now()});
+    Recorded::add({std::move(method), std::move(args), std::chrono::steady_clock::now()});
   }
   // Every call, or those of one method, in arrival order.
   std::vector<Call> calls(const std::string& method = "") const;
@@ -49,10 +48,6 @@ class CallLog {
   bool waitFor(const std::string& method, std::size_t count) const {
     return ko::test::eventually([&] { return this->count(method) >= count; });
   }
-
- private:
-  mutable std::mutex fMutex;
-  std::vector<Call> fCalls;
 };
 
 // The lines of a capture with that category and level that contain `part`.

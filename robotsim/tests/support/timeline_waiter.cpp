@@ -1,6 +1,8 @@
 #include "support/timeline_waiter.h"
 
+#include <condition_variable>
 #include <map>
+#include <mutex>
 #include <utility>
 
 namespace robotsim::simtest {

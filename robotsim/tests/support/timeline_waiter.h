@@ -4,11 +4,9 @@
 // without polling.
 
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <string>
 
 #include "robotsim/timeline.h"
