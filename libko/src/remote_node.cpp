@@ -11,6 +11,7 @@
 #include <limits>
 #include <random>
 #include <set>
+#include <utility>
 #include <zmq.hpp>
 #include <zmq_addon.hpp>
 
@@ -26,6 +27,8 @@ namespace ko::detail {
 namespace {
 
 constexpr const char* kCategory = "ko.remote";
+// How often the I/O thread looks for requests that have waited their time, at least.
+constexpr std::chrono::milliseconds kDeadlineTick(100);
 using Clock = std::chrono::steady_clock;
 using wire::MessageKind;
 
@@ -261,10 +264,8 @@ void RemoteNode::stop() {
     std::lock_guard lock(socketMutex_);
     stopping_ = true;
   }
-  if (wakeFd_ >= 0) {
-    const std::uint64_t one = 1;
-    [[maybe_unused]] const auto written = ::write(wakeFd_, &one, sizeof one);
-  }
+  if (wakeFd_ >= 0)
+    xWakeIo();
   if (thread_.joinable())
     thread_.join();
   {
@@ -303,8 +304,6 @@ void RemoteNode::xRun() {
   // On the way of every event and call between processes.
   const os::RealtimeScope realtime;
   ioThread_.store(std::this_thread::get_id());
-  const auto tick = std::clamp(options_.heartbeatInterval / 4, std::chrono::milliseconds(10),
-                               std::chrono::milliseconds(100));
   const auto now = Clock::now();
   hubSeen_ = now;
   nextHello_ = now;
@@ -316,7 +315,7 @@ void RemoteNode::xRun() {
     // ioReadable_, one of another thread wakes this one through wakeFd_.
     ioReadable_ = false;
     const bool more = xReceive();
-    xTick();
+    const auto nap = xTick();
     if (stopping_)
       break;
     if (more || ioReadable_)
@@ -327,7 +326,7 @@ void RemoteNode::xRun() {
         {sockets_->zap ? sockets_->zap->handle() : nullptr, 0, ZMQ_POLLIN, 0},
     };
     try {
-      zmq::poll(items, sockets_->zap ? 3 : 2, tick);
+      zmq::poll(items, sockets_->zap ? 3 : 2, nap);
     } catch (const zmq::error_t& e) {
       if (e.num() != EINTR) {
         KO_LOG_ERROR(kCategory) << "Polling the link failed: " << e.what();
@@ -717,10 +716,14 @@ void RemoteNode::xSend(Outgoing out) {
     if (xOnIoThread()) {
       ioReadable_ = true;
     } else {
-      const std::uint64_t one = 1;
-      [[maybe_unused]] const auto written = ::write(wakeFd_, &one, sizeof one);
+      xWakeIo();
     }
   }
+}
+
+void RemoteNode::xWakeIo() {
+  const std::uint64_t one = 1;
+  [[maybe_unused]] const auto written = ::write(wakeFd_, &one, sizeof one);
 }
 
 void RemoteNode::xSendLocked(Outgoing& out) {
@@ -746,7 +749,7 @@ void RemoteNode::xSendLocked(Outgoing& out) {
     s.send(frameOf(std::move(*out.body)), zmq::send_flags::dontwait);
 }
 
-void RemoteNode::xTick() {
+std::chrono::milliseconds RemoteNode::xTick() {
   const auto now = Clock::now();
   if (role_ == Role::Listening) {
     std::vector<std::pair<std::uint32_t, std::chrono::milliseconds>> silent;
@@ -798,8 +801,16 @@ void RemoteNode::xTick() {
   }
   // Requests that have waited their time.
   std::vector<std::pair<std::uint64_t, Pending>> expired;
+  // The heartbeats are kept a few times per interval; requests with a deadline are looked
+  // at more often.
+  const auto heartbeatTick =
+      std::max(options_.heartbeatInterval / 4, std::chrono::milliseconds(10));
+  std::chrono::milliseconds nap = heartbeatTick;
   {
     std::lock_guard lock(mutex_);
+    ioNapsLong_ = deadlines_ == 0 && heartbeatTick > kDeadlineTick;
+    if (!ioNapsLong_)
+      nap = std::min(heartbeatTick, kDeadlineTick);
     if (deadlines_ > 0) {
       for (auto it = pending_.begin(); it != pending_.end();) {
         if (it->second.deadline && *it->second.deadline <= now) {
@@ -814,18 +825,10 @@ void RemoteNode::xTick() {
   }
   for (auto& [id, p] : expired)
     p.done(Outcome{false, {}, "The " + p.what + " got no answer in time"});
+  return nap;
 }
 
 // ---- requests ---------------------------------------------------------------------------
-
-std::uint64_t RemoteNode::xAddPending(Pending pending) {
-  std::lock_guard lock(mutex_);
-  const std::uint64_t id = nextId_++;
-  if (pending.deadline)
-    ++deadlines_;
-  pending_.emplace(id, std::move(pending));
-  return id;
-}
 
 void RemoteNode::xComplete(std::uint64_t id, std::uint32_t from, Outcome outcome) {
   Pending p;
@@ -895,6 +898,7 @@ void RemoteNode::xRequestWith(MessageKind kind, std::uint32_t to, std::vector<An
     error = "Cannot send the " + what + ": " + e.what();
   }
   wire::Header h{kind, 0, to, 0, std::move(fields)};
+  bool wakeIo = false;
   if (error.empty()) {
     std::lock_guard lock(mutex_);
     if (stoppedForRequests_) {
@@ -910,6 +914,8 @@ void RemoteNode::xRequestWith(MessageKind kind, std::uint32_t to, std::vector<An
       if (timeout.count() > 0) {
         p.deadline = Clock::now() + timeout;
         ++deadlines_;
+        // The I/O thread sleeps for a heartbeat tick, longer than the deadlines' one.
+        wakeIo = std::exchange(ioNapsLong_, false);
       }
       pending_.emplace(h.id, std::move(p));
       out.epoch = epoch_;
@@ -919,6 +925,8 @@ void RemoteNode::xRequestWith(MessageKind kind, std::uint32_t to, std::vector<An
     done(Outcome{false, {}, error});
     return;
   }
+  if (wakeIo && !xOnIoThread())
+    xWakeIo();
   out.header = wire::encodeHeader(h);
   if (!out.body && wire::hasBody(kind))
     out.body = wire::encodeValue(AnyValue());

@@ -192,11 +192,14 @@ class RemoteNode : public std::enable_shared_from_this<RemoteNode> {
   // The frames point into the messages ZeroMQ received, alive for the call.
   void xHandle(std::vector<std::string_view> frames);
   void xHandleFor(wire::Message m, Peer* peer);
-  void xTick();
+  // Returns how long the thread may wait for a message before the next tick.
+  std::chrono::milliseconds xTick();
   void xHandleZap();
 
   // Any thread: sends a message at once.
   void xSend(Outgoing out);
+  // Has the I/O thread look at the socket and its tables again.
+  void xWakeIo();
   // Under socketMutex_.
   void xSendLocked(Outgoing& out);
   void xSend(wire::MessageKind kind, std::uint32_t to, std::uint64_t id,
@@ -208,7 +211,6 @@ class RemoteNode : public std::enable_shared_from_this<RemoteNode> {
   void xRequestWith(wire::MessageKind kind, std::uint32_t to, std::vector<AnyValue> fields,
                     Body body, std::string what, std::chrono::milliseconds timeout,
                     std::function<void(Outcome)> done);
-  std::uint64_t xAddPending(Pending pending);
   void xComplete(std::uint64_t id, std::uint32_t from, Outcome outcome);
   // Fails every pending request to `peer` (every one when nullopt).
   void xFailPending(std::optional<std::uint32_t> peer, const std::string& why);
@@ -267,6 +269,7 @@ class RemoteNode : public std::enable_shared_from_this<RemoteNode> {
   mutable std::condition_variable linkChanged_;
   std::map<std::uint64_t, Pending> pending_;
   std::size_t deadlines_ = 0;  // pending requests with a deadline
+  bool ioNapsLong_ = false;    // the I/O thread waits longer than a deadline may
   std::uint64_t nextId_ = 1;
   bool stoppedForRequests_ = false;
   std::uint64_t epoch_ = 1;                                       // counts the links made
