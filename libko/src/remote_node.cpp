@@ -11,6 +11,7 @@
 #include <limits>
 #include <random>
 #include <set>
+#include <utility>
 #include <zmq.hpp>
 #include <zmq_addon.hpp>
 
@@ -26,6 +27,8 @@ namespace ko::detail {
 namespace {
 
 constexpr const char* kCategory = "ko.remote";
+// How often the I/O thread looks for requests that have waited their time, at least.
+constexpr std::chrono::milliseconds kDeadlineTick(100);
 using Clock = std::chrono::steady_clock;
 using wire::MessageKind;
 
@@ -206,6 +209,7 @@ void RemoteNode::xOpen(const std::string& endpoint) {
       s.set(zmq::sockopt::curve_secretkey, curve.secretKey);
     }
     s.bind(endpoint);
+    socketFd_ = s.get(zmq::sockopt::fd);
     endpoint_ = s.get(zmq::sockopt::last_endpoint);
     instance_ = randomInstance();
   } catch (const zmq::error_t& e) {
@@ -231,6 +235,7 @@ void RemoteNode::xOpenDealer() {
     s.set(zmq::sockopt::curve_publickey, remote::publicKeyOf(curve.secretKey));
     s.set(zmq::sockopt::curve_secretkey, curve.secretKey);
   }
+  socketFd_ = s.get(zmq::sockopt::fd);
   try {
     s.connect(endpoint_);
   } catch (const zmq::error_t& e) {
@@ -239,14 +244,13 @@ void RemoteNode::xOpenDealer() {
 }
 
 void RemoteNode::stop() {
-  {
-    std::lock_guard lock(mutex_);
-    stoppedForRequests_ = true;
-  }
   // Goodbyes, so that the others need not wait for the heartbeat's time-out.
   std::vector<Outgoing> byes;
   {
     std::lock_guard lock(mutex_);
+    if (stoppedForRequests_)
+      return;
+    stoppedForRequests_ = true;
     if (role_ == Role::Connecting && linked_)
       byes.push_back(Outgoing{
           0, {}, wire::encodeHeader({MessageKind::Bye, 0, 0, self_, {}}), std::nullopt, 0});
@@ -254,18 +258,14 @@ void RemoteNode::stop() {
       byes.push_back(
           Outgoing{id, {}, wire::encodeHeader({MessageKind::Bye, 0, id, 0, {}}), std::nullopt, 0});
   }
+  for (auto& b : byes)
+    xSend(std::move(b));
   {
-    std::lock_guard lock(outMutex_);
-    if (stopping_)
-      return;
-    for (auto& b : byes)
-      outbox_.push_back(std::move(b));
+    std::lock_guard lock(socketMutex_);
     stopping_ = true;
   }
-  if (wakeFd_ >= 0) {
-    const std::uint64_t one = 1;
-    [[maybe_unused]] const auto written = ::write(wakeFd_, &one, sizeof one);
-  }
+  if (wakeFd_ >= 0)
+    xWakeIo();
   if (thread_.joinable())
     thread_.join();
   {
@@ -304,21 +304,29 @@ void RemoteNode::xRun() {
   // On the way of every event and call between processes.
   const os::RealtimeScope realtime;
   ioThread_.store(std::this_thread::get_id());
-  const auto tick = std::clamp(options_.heartbeatInterval / 4, std::chrono::milliseconds(10),
-                               std::chrono::milliseconds(100));
   const auto now = Clock::now();
   hubSeen_ = now;
   nextHello_ = now;
   nextPing_ = now + options_.heartbeatInterval;
   lastNoAnswerLog_ = now;
   for (;;) {
+    // The socket's descriptor tells of changes, not of messages that wait: it is waited on
+    // only once none waits. A send may take a change in: one of this thread marks
+    // ioReadable_, one of another thread wakes this one through wakeFd_.
+    ioReadable_ = false;
+    const bool more = xReceive();
+    const auto nap = xTick();
+    if (stopping_)
+      break;
+    if (more || ioReadable_)
+      continue;
     zmq::pollitem_t items[3] = {
-        {sockets_->socket.handle(), 0, ZMQ_POLLIN, 0},
+        {nullptr, socketFd_, ZMQ_POLLIN, 0},
         {nullptr, wakeFd_, ZMQ_POLLIN, 0},
         {sockets_->zap ? sockets_->zap->handle() : nullptr, 0, ZMQ_POLLIN, 0},
     };
     try {
-      zmq::poll(items, sockets_->zap ? 3 : 2, tick);
+      zmq::poll(items, sockets_->zap ? 3 : 2, nap);
     } catch (const zmq::error_t& e) {
       if (e.num() != EINTR) {
         KO_LOG_ERROR(kCategory) << "Polling the link failed: " << e.what();
@@ -328,38 +336,40 @@ void RemoteNode::xRun() {
       std::uint64_t count = 0;
       [[maybe_unused]] const auto read = ::read(wakeFd_, &count, sizeof count);
     }
-    if (items[0].revents & ZMQ_POLLIN)
-      xReceive();
     if (sockets_->zap && (items[2].revents & ZMQ_POLLIN))
       xHandleZap();
-    xFlush();
-    {
-      std::lock_guard lock(outMutex_);
-      if (stopping_ && outbox_.empty())
-        break;
-    }
-    xTick();
   }
-  sockets_->socket.close();
+  {
+    std::lock_guard lock(socketMutex_);
+    sockets_->socket.close();
+  }
   if (sockets_->zap)
     sockets_->zap->close();
   ioThread_.store(std::thread::id());
 }
 
-void RemoteNode::xReceive() {
-  // A bounded batch, so that the outbox is flushed between batches.
-  for (int n = 0; n < 256; ++n) {
-    std::vector<zmq::message_t> parts;
-    std::optional<std::size_t> got;
+bool RemoteNode::xReceive() {
+  // A bounded batch, so that the heartbeats are kept between batches; taken at once, and
+  // handled with the socket free (a caller woken by a reply sends its next call at once).
+  std::vector<std::vector<zmq::message_t>> batch;
+  {
+    // Waits for a sender to let go (a send holds the socket for microseconds): with a
+    // try-lock here, messages were left waiting until the next tick.
+    std::unique_lock lock(socketMutex_);
+    if (stopping_)
+      return false;
     try {
-      got = zmq::recv_multipart(sockets_->socket, std::back_inserter(parts),
-                                zmq::recv_flags::dontwait);
+      for (std::vector<zmq::message_t> parts; batch.size() < 256; parts.clear()) {
+        if (!zmq::recv_multipart(sockets_->socket, std::back_inserter(parts),
+                                 zmq::recv_flags::dontwait))
+          break;
+        batch.push_back(std::move(parts));
+      }
     } catch (const zmq::error_t& e) {
       KO_LOG_ERROR(kCategory) << "Receiving failed: " << e.what();
-      return;
     }
-    if (!got)
-      return;
+  }
+  for (const auto& parts : batch) {
     // Decoded where ZeroMQ received them.
     std::vector<std::string_view> frames;
     frames.reserve(parts.size());
@@ -367,6 +377,7 @@ void RemoteNode::xReceive() {
       frames.emplace_back(p.data<char>(), p.size());
     xHandle(std::move(frames));
   }
+  return batch.size() == 256;
 }
 
 void RemoteNode::xHandleZap() {
@@ -433,8 +444,7 @@ void RemoteNode::xHandle(std::vector<std::string_view> frames) {
     h.to = role_ == Role::Listening ? peerId : (header ? header->from : 0);
     h.from = role_ == Role::Listening ? 0 : self_;
     h.fields = {AnyValue(text)};
-    xSendNow(
-        Outgoing{h.to, peer ? std::string() : routing, wire::encodeHeader(h), std::nullopt, 0});
+    xSend(Outgoing{h.to, peer ? std::string() : routing, wire::encodeHeader(h), std::nullopt, 0});
   };
 
   std::optional<wire::Header> header;
@@ -487,7 +497,7 @@ void RemoteNode::xHandle(std::vector<std::string_view> frames) {
                                        0,
                                        {AnyValue("this process does not know yours: say hello")}}),
                    std::nullopt, 0};
-      xSendNow(std::move(out));
+      xSend(std::move(out));
       return;
     }
     header->from = peerId;  // never taken from the message
@@ -506,7 +516,7 @@ void RemoteNode::xHandle(std::vector<std::string_view> frames) {
       Outgoing out{header->to, {}, wire::encodeHeader(*header), std::nullopt, 0};
       if (frames.size() > 1)
         out.body = std::string(frames[1]);
-      xSendNow(std::move(out));
+      xSend(std::move(out));
       return;
     }
   }
@@ -668,20 +678,6 @@ void RemoteNode::xHandleFor(wire::Message m, Peer* peer) {
   }
 }
 
-void RemoteNode::xSend(Outgoing out) {
-  {
-    std::lock_guard lock(outMutex_);
-    if (stopping_)
-      return;
-    const bool wake = outbox_.empty();
-    outbox_.push_back(std::move(out));
-    if (!wake)
-      return;
-  }
-  const std::uint64_t one = 1;
-  [[maybe_unused]] const auto written = ::write(wakeFd_, &one, sizeof one);
-}
-
 void RemoteNode::xSend(MessageKind kind, std::uint32_t to, std::uint64_t id,
                        std::vector<AnyValue> fields, Body body) {
   wire::Header h{kind, id, to, 0, std::move(fields)};
@@ -703,45 +699,57 @@ void RemoteNode::xReplyError(const wire::Header& request, const std::string& tex
   xSend(MessageKind::Error, request.from, request.id, {AnyValue(text)}, nullptr);
 }
 
-void RemoteNode::xFlush() {
-  std::deque<Outgoing> batch;
-  {
-    std::lock_guard lock(outMutex_);
-    batch.swap(outbox_);
-  }
-  for (auto& out : batch)
-    xSendNow(std::move(out));
-}
-
-void RemoteNode::xSendNow(Outgoing out) {
+void RemoteNode::xSend(Outgoing out) {
+  std::lock_guard socketLock(socketMutex_);
   auto& s = sockets_->socket;
+  if (stopping_ || !s)
+    return;
   try {
-    if (role_ == Role::Listening) {
-      std::string routing = out.routingId;
-      if (routing.empty()) {
-        std::lock_guard lock(mutex_);
-        const auto it = peers_.find(out.to);
-        if (it == peers_.end())
-          return;  // gone meanwhile
-        routing = it->second.routingId;
-      }
-      s.send(zmq::buffer(routing), zmq::send_flags::sndmore | zmq::send_flags::dontwait);
-    } else {
-      std::lock_guard lock(mutex_);
-      if (out.epoch != 0 && out.epoch != epoch_)
-        return;  // for a link that is gone
-    }
-    s.send(zmq::buffer(out.header), out.body ? zmq::send_flags::sndmore | zmq::send_flags::dontwait
-                                             : zmq::send_flags::dontwait);
-    if (out.body)
-      s.send(frameOf(std::move(*out.body)), zmq::send_flags::dontwait);
+    xSendLocked(out);
   } catch (const zmq::error_t& e) {
     // The process left between routing and sending.
     KO_LOG_VERBOSE(kCategory) << "A message to #" << out.to << " was not sent: " << e.what();
   }
+  // Sending may have taken in the news of a message come meanwhile, which the socket's
+  // descriptor then no longer tells: the I/O thread is told.
+  if (s.get(zmq::sockopt::events) & ZMQ_POLLIN) {
+    if (xOnIoThread()) {
+      ioReadable_ = true;
+    } else {
+      xWakeIo();
+    }
+  }
 }
 
-void RemoteNode::xTick() {
+void RemoteNode::xWakeIo() {
+  const std::uint64_t one = 1;
+  [[maybe_unused]] const auto written = ::write(wakeFd_, &one, sizeof one);
+}
+
+void RemoteNode::xSendLocked(Outgoing& out) {
+  auto& s = sockets_->socket;
+  if (role_ == Role::Listening) {
+    std::string routing = out.routingId;
+    if (routing.empty()) {
+      std::lock_guard lock(mutex_);
+      const auto it = peers_.find(out.to);
+      if (it == peers_.end())
+        return;  // gone meanwhile
+      routing = it->second.routingId;
+    }
+    s.send(zmq::buffer(routing), zmq::send_flags::sndmore | zmq::send_flags::dontwait);
+  } else {
+    std::lock_guard lock(mutex_);
+    if (out.epoch != 0 && out.epoch != epoch_)
+      return;  // for a link that is gone
+  }
+  s.send(zmq::buffer(out.header), out.body ? zmq::send_flags::sndmore | zmq::send_flags::dontwait
+                                           : zmq::send_flags::dontwait);
+  if (out.body)
+    s.send(frameOf(std::move(*out.body)), zmq::send_flags::dontwait);
+}
+
+std::chrono::milliseconds RemoteNode::xTick() {
   const auto now = Clock::now();
   if (role_ == Role::Listening) {
     std::vector<std::pair<std::uint32_t, std::chrono::milliseconds>> silent;
@@ -760,7 +768,7 @@ void RemoteNode::xTick() {
     if (now >= nextPing_) {
       nextPing_ = now + options_.heartbeatInterval;
       for (const auto id : all)
-        xSendNow(Outgoing{
+        xSend(Outgoing{
             id, {}, wire::encodeHeader({MessageKind::Ping, 0, id, 0, {}}), std::nullopt, 0});
     }
   } else if (isLinked()) {
@@ -769,24 +777,23 @@ void RemoteNode::xTick() {
       xLinkLost("no sign of life for " + milliseconds(quiet));
     } else if (now >= nextPing_) {
       nextPing_ = now + options_.heartbeatInterval;
-      xSendNow(Outgoing{
+      xSend(Outgoing{
           0, {}, wire::encodeHeader({MessageKind::Ping, 0, 0, self_, {}}), std::nullopt, 0});
     }
   } else if (now >= nextHello_) {
     nextHello_ = now + std::max(options_.heartbeatInterval, std::chrono::milliseconds(250));
-    xSendNow(
-        Outgoing{0,
-                 {},
-                 wire::encodeHeader(
-                     {MessageKind::Hello,
-                      0,
-                      0,
-                      0,
-                      {AnyValue(wire::kProtocolVersion), AnyValue(options_.processName),
-                       AnyValue(static_cast<std::int64_t>(::getpid())),
-                       AnyValue(static_cast<std::int64_t>(options_.heartbeatInterval.count()))}}),
-                 std::nullopt,
-                 0});
+    xSend(Outgoing{0,
+                   {},
+                   wire::encodeHeader(
+                       {MessageKind::Hello,
+                        0,
+                        0,
+                        0,
+                        {AnyValue(wire::kProtocolVersion), AnyValue(options_.processName),
+                         AnyValue(static_cast<std::int64_t>(::getpid())),
+                         AnyValue(static_cast<std::int64_t>(options_.heartbeatInterval.count()))}}),
+                   std::nullopt,
+                   0});
     if (now - lastNoAnswerLog_ > std::chrono::seconds(10)) {
       lastNoAnswerLog_ = now;
       KO_LOG_INFO(kCategory) << "Waiting for the listening process at " << endpoint_;
@@ -794,8 +801,16 @@ void RemoteNode::xTick() {
   }
   // Requests that have waited their time.
   std::vector<std::pair<std::uint64_t, Pending>> expired;
+  // The heartbeats are kept a few times per interval; requests with a deadline are looked
+  // at more often.
+  const auto heartbeatTick =
+      std::max(options_.heartbeatInterval / 4, std::chrono::milliseconds(10));
+  std::chrono::milliseconds nap = heartbeatTick;
   {
     std::lock_guard lock(mutex_);
+    ioNapsLong_ = deadlines_ == 0 && heartbeatTick > kDeadlineTick;
+    if (!ioNapsLong_)
+      nap = std::min(heartbeatTick, kDeadlineTick);
     if (deadlines_ > 0) {
       for (auto it = pending_.begin(); it != pending_.end();) {
         if (it->second.deadline && *it->second.deadline <= now) {
@@ -810,18 +825,10 @@ void RemoteNode::xTick() {
   }
   for (auto& [id, p] : expired)
     p.done(Outcome{false, {}, "The " + p.what + " got no answer in time"});
+  return nap;
 }
 
 // ---- requests ---------------------------------------------------------------------------
-
-std::uint64_t RemoteNode::xAddPending(Pending pending) {
-  std::lock_guard lock(mutex_);
-  const std::uint64_t id = nextId_++;
-  if (pending.deadline)
-    ++deadlines_;
-  pending_.emplace(id, std::move(pending));
-  return id;
-}
 
 void RemoteNode::xComplete(std::uint64_t id, std::uint32_t from, Outcome outcome) {
   Pending p;
@@ -891,6 +898,7 @@ void RemoteNode::xRequestWith(MessageKind kind, std::uint32_t to, std::vector<An
     error = "Cannot send the " + what + ": " + e.what();
   }
   wire::Header h{kind, 0, to, 0, std::move(fields)};
+  bool wakeIo = false;
   if (error.empty()) {
     std::lock_guard lock(mutex_);
     if (stoppedForRequests_) {
@@ -906,6 +914,8 @@ void RemoteNode::xRequestWith(MessageKind kind, std::uint32_t to, std::vector<An
       if (timeout.count() > 0) {
         p.deadline = Clock::now() + timeout;
         ++deadlines_;
+        // The I/O thread sleeps for a heartbeat tick, longer than the deadlines' one.
+        wakeIo = std::exchange(ioNapsLong_, false);
       }
       pending_.emplace(h.id, std::move(p));
       out.epoch = epoch_;
@@ -915,6 +925,8 @@ void RemoteNode::xRequestWith(MessageKind kind, std::uint32_t to, std::vector<An
     done(Outcome{false, {}, error});
     return;
   }
+  if (wakeIo && !xOnIoThread())
+    xWakeIo();
   out.header = wire::encodeHeader(h);
   if (!out.body && wire::hasBody(kind))
     out.body = wire::encodeValue(AnyValue());
@@ -1288,12 +1300,11 @@ void RemoteNode::xLinkLost(const std::string& reason) {
   xFailPending(std::nullopt, "the link with " + endpoint_ + " was lost (" + reason + ")");
   xForget(std::nullopt);
   {
-    // What was queued for the process that is gone must not reach the next one.
-    std::lock_guard lock(outMutex_);
-    outbox_.clear();
+    // What is sent for the link that is gone (an earlier epoch) is dropped from now on.
+    std::lock_guard lock(socketMutex_);
+    sockets_->socket.close();
+    xOpenDealer();
   }
-  sockets_->socket.close();
-  xOpenDealer();
   nextHello_ = Clock::now();
   linkChanged_.notify_all();
   xNotifyLink(false);

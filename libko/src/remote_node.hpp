@@ -3,13 +3,13 @@
 // listening process, a DEALER in each connected one), served by one I/O thread, and the
 // threads that run the calls and deliver the signals that come in.
 //
-// Threads: the I/O thread alone touches the sockets; it decodes headers, routes messages,
-// keeps the directory (listening) and the link state (connected), answers the requests it
-// can answer itself and completes the futures of the replies, never running code of the
-// services nor their callers' continuations. Calls, posts, subscriptions and properties that
-// come in run on the serving threads; the signals of one remote object are delivered in
-// order, one at a time. User threads send through the outbox (a queue and an eventfd that
-// wakes the I/O thread). One mutex guards the node's tables; the outbox has its own; neither
+// Threads: the I/O thread receives; it decodes headers, routes messages, keeps the directory
+// (listening) and the link state (connected), answers the requests it can answer itself and
+// completes the futures of the replies, never running code of the services nor their
+// callers' continuations. Calls, posts, subscriptions and properties that come in run on the
+// serving threads; the signals of one remote object are delivered in order, one at a time.
+// Every thread sends itself, on the socket under its mutex (no hand-over to the I/O thread
+// on the way of a call). One mutex guards the node's tables, the socket has its own; neither
 // is held while a service, a subscriber or a continuation runs.
 
 #include <sys/types.h>
@@ -187,17 +187,21 @@ class RemoteNode : public std::enable_shared_from_this<RemoteNode> {
   void xOpen(const std::string& endpoint);
   void xOpenDealer();
   void xRun();
-  void xReceive();
+  // Returns true when more messages may wait.
+  bool xReceive();
   // The frames point into the messages ZeroMQ received, alive for the call.
   void xHandle(std::vector<std::string_view> frames);
   void xHandleFor(wire::Message m, Peer* peer);
-  void xFlush();
-  void xTick();
-  void xSendNow(Outgoing out);
+  // Returns how long the thread may wait for a message before the next tick.
+  std::chrono::milliseconds xTick();
   void xHandleZap();
 
-  // Any thread: queues a message and wakes the I/O thread.
+  // Any thread: sends a message at once.
   void xSend(Outgoing out);
+  // Has the I/O thread look at the socket and its tables again.
+  void xWakeIo();
+  // Under socketMutex_.
+  void xSendLocked(Outgoing& out);
   void xSend(wire::MessageKind kind, std::uint32_t to, std::uint64_t id,
              std::vector<AnyValue> fields, Body body = {});
   void xReplyError(const wire::Header& request, const std::string& text);
@@ -207,7 +211,6 @@ class RemoteNode : public std::enable_shared_from_this<RemoteNode> {
   void xRequestWith(wire::MessageKind kind, std::uint32_t to, std::vector<AnyValue> fields,
                     Body body, std::string what, std::chrono::milliseconds timeout,
                     std::function<void(Outcome)> done);
-  std::uint64_t xAddPending(Pending pending);
   void xComplete(std::uint64_t id, std::uint32_t from, Outcome outcome);
   // Fails every pending request to `peer` (every one when nullopt).
   void xFailPending(std::optional<std::uint32_t> peer, const std::string& why);
@@ -254,14 +257,19 @@ class RemoteNode : public std::enable_shared_from_this<RemoteNode> {
   std::atomic<std::thread::id> ioThread_{};
   bool xOnIoThread() const;
 
-  std::mutex outMutex_;
-  std::deque<Outgoing> outbox_;
-  bool stopping_ = false;  // under outMutex_
+  // Guards the socket (not the ZAP one): any thread sends, the I/O thread receives. Taken
+  // before mutex_.
+  std::mutex socketMutex_;
+  std::atomic<bool> stopping_ = false;  // set under socketMutex_
+  // The I/O thread's: the socket's descriptor, and whether its own send saw a message wait.
+  int socketFd_ = -1;
+  bool ioReadable_ = false;
 
   mutable std::mutex mutex_;
   mutable std::condition_variable linkChanged_;
   std::map<std::uint64_t, Pending> pending_;
   std::size_t deadlines_ = 0;  // pending requests with a deadline
+  bool ioNapsLong_ = false;    // the I/O thread waits longer than a deadline may
   std::uint64_t nextId_ = 1;
   bool stoppedForRequests_ = false;
   std::uint64_t epoch_ = 1;                                       // counts the links made

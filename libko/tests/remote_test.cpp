@@ -8,6 +8,7 @@
 #include <atomic>
 #include <chrono>
 #include <string>
+#include <thread>
 #include <vector>
 #include <zmq.hpp>
 #include <zmq_addon.hpp>
@@ -35,6 +36,41 @@ RemoteOptions fastOptions(const std::string& name) {
 std::string ipcEndpoint(const char* tag) {
   return "ipc:///tmp/ko-remote-test-" + std::to_string(::getpid()) + "-" + tag;
 }
+
+// A process of another language, speaking the protocol through a raw DEALER socket.
+class RawProcess {
+ public:
+  explicit RawProcess(const std::string& endpoint) : socket_(context_, zmq::socket_type::dealer) {
+    socket_.set(zmq::sockopt::linger, 0);
+    socket_.set(zmq::sockopt::rcvtimeo, static_cast<int>(test::kBound / 1ms));
+    socket_.connect(endpoint);
+  }
+  // A MessagePack array (a header, or a list of arguments).
+  static std::string list(AnyValue::List items) {
+    return wire::encodeValue(AnyValue::list(std::move(items)));
+  }
+  void send(const std::vector<std::string>& frames) {
+    std::vector<zmq::const_buffer> buffers;
+    for (const auto& f : frames)
+      buffers.push_back(zmq::buffer(f));
+    zmq::send_multipart(socket_, buffers);
+  }
+  // The header of the next message that is no ping; raises ko::Error after the tests' bound.
+  wire::Header receive() {
+    for (;;) {
+      std::vector<zmq::message_t> parts;
+      if (!zmq::recv_multipart(socket_, std::back_inserter(parts)))
+        throw Error("no answer");
+      wire::Header h = wire::decodeHeader(parts.at(0).to_string());
+      if (h.kind != wire::MessageKind::Ping)
+        return h;
+    }
+  }
+
+ private:
+  zmq::context_t context_;
+  zmq::socket_t socket_;
+};
 
 // A service of the listening process: arithmetic, failures, a call that never answers, a
 // signal and a property.
@@ -191,29 +227,11 @@ TEST_F(RemoteTest, MessagesThatMakeNoSenseGetAnErrorReply) {
   const std::string at = strict->listen(ipcEndpoint("strict"), small);
   strict->registerService("Calc", local.builder.object());
 
-  zmq::context_t context;
-  zmq::socket_t raw(context, zmq::socket_type::dealer);
-  raw.set(zmq::sockopt::linger, 0);
-  raw.set(zmq::sockopt::rcvtimeo, 10000);
-  raw.connect(at);
-  const auto send = [&](std::vector<std::string> frames) {
-    std::vector<zmq::const_buffer> buffers;
-    for (const auto& f : frames)
-      buffers.push_back(zmq::buffer(f));
-    zmq::send_multipart(raw, buffers);
-  };
-  const auto receive = [&] {
-    for (;;) {
-      std::vector<zmq::message_t> parts;
-      if (!zmq::recv_multipart(raw, std::back_inserter(parts)))
-        throw Error("no answer");
-      wire::Header h = wire::decodeHeader(parts.at(0).to_string());
-      if (h.kind != wire::MessageKind::Ping)
-        return h;
-    }
-  };
-  const auto header = [](AnyValue::List items) { return wire::encodeValue(AnyValue::list(items)); };
-  const auto args = [](AnyValue::List items) { return wire::encodeValue(AnyValue::list(items)); };
+  RawProcess raw(at);
+  const auto send = [&](const std::vector<std::string>& frames) { raw.send(frames); };
+  const auto receive = [&] { return raw.receive(); };
+  const auto header = RawProcess::list;
+  const auto args = RawProcess::list;
 
   send({header({"ping", 0, 0, 0})});
   EXPECT_EQ(receive().kind, wire::MessageKind::Reset);  // no hello yet
@@ -291,6 +309,51 @@ TEST_F(RemoteTest, ConnectedProcessesPublishTheirServicesAgainWhenTheListeningOn
   ASSERT_TRUE(test::eventually([&] { return again->service("Script").hasValue(100); }));
   EXPECT_EQ(again->service("Script").value(10000)->call<int>("twice", 4), 8);
   again->closeLink();
+}
+
+// The link's I/O thread sleeps a whole heartbeat tick (far longer than the tests' bound
+// here) unless woken: messages that come while the process's other threads hold the socket
+// to send must wake it all the same.
+TEST(RemoteLink, MessagesThatComeWhileOtherThreadsSendAreTakenAtOnce) {
+  RemoteOptions sleepy;
+  sleepy.processName = "hub";
+  sleepy.heartbeatInterval = 10min;
+  sleepy.heartbeatTimeout = 20min;
+  Session hub;
+  const std::string at = hub.listen(ipcEndpoint("sleepy"), sleepy);
+  Calculator local;
+  hub.registerService("Calc", local.builder.object());
+  auto* changed = local.builder.dynamicObject()->signal<std::string, int>("changed");
+
+  RawProcess raw(at);
+  raw.send({RawProcess::list({"hello", 0, 0, 0, 1, "raw", 1, 1000})});
+  ASSERT_EQ(raw.receive().kind, wire::MessageKind::Welcome);
+  raw.send({RawProcess::list({"subscribe", 1, 0, 0, "Calc", "changed"})});
+  ASSERT_EQ(raw.receive().kind, wire::MessageKind::Reply);
+
+  // Rounds of calls from the raw process while threads of the hub send signals to it.
+  constexpr int kRounds = 20, kCalls = 20, kSenders = 4, kSignals = 50;
+  std::uint64_t id = 100;
+  for (int round = 0; round < kRounds; ++round) {
+    std::vector<std::thread> senders;
+    for (int t = 0; t < kSenders; ++t)
+      senders.emplace_back([&] {
+        for (int k = 0; k < kSignals; ++k)
+          (*changed)("burst", k);
+      });
+    for (int k = 0; k < kCalls; ++k)
+      raw.send(
+          {RawProcess::list({"call", id++, 0, 0, "Calc", "add", 0}), RawProcess::list({k, 1})});
+    for (auto& s : senders)
+      s.join();
+    int replies = 0;
+    for (int signals = 0; replies < kCalls || signals < kSenders * kSignals;) {
+      const wire::MessageKind kind = raw.receive().kind;
+      ASSERT_TRUE(kind == wire::MessageKind::Reply || kind == wire::MessageKind::Signal);
+      ++(kind == wire::MessageKind::Reply ? replies : signals);
+    }
+  }
+  hub.closeLink();
 }
 
 TEST(RemoteSecurity, OnlyLoopbackAndIpcEndpointsGoWithoutKeys) {
