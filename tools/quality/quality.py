@@ -73,10 +73,10 @@ class Mokuto:
 
     def analyse(self, language, text):
         return json.loads(self.run("analyse", "--structures", "--pause", "0",
-                                   "--language", language, text))
+                                   "--language", language, "--", text))
 
     def emotion(self, language, text):
-        return json.loads(self.run("emotion", "--json", "--language", language, text))["emotion"]
+        return json.loads(self.run("emotion", "--json", "--language", language, "--", text))["emotion"]
 
     def base_forms(self, language, words):
         """The base form of each word's first record, None where there is none."""
