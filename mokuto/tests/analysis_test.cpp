@@ -653,6 +653,17 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"English",
        "It requires that drivers know it, and that they properly reconfigure the devices.", false},
       {"English", "I like this and that one.", true},
+      {"English", "The suffix is a number and the files that we keep in the folder are small.",
+       false},
+      {"French", "Le suffixe est long et les composants qui sont listés sont les caractères.",
+       false},
+      {"French", "J'aime les paquets et les fichiers qui sont listés dans le dossier.", true},
+      {"English", "The zone is example.org and the address components are each a letter.", false},
+      {"English",
+       "keys/server.crt goes to /etc/ssl/certs/server.crt, and keys/server.key goes to "
+       "/etc/ssl/private/server.key.",
+       false},
+      {"English", "Write to team-devel@lists.example.org or team-release@lists.example.org.", true},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

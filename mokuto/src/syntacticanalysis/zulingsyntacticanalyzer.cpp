@@ -1003,6 +1003,11 @@ class StructureBuilder {
     const std::size_t next =
         lone.role == Role::Determiner ? xPastAside(group.lastToken + 1) : group.lastToken + 1;
     const std::size_t previous = firstLeft.firstToken;
+    // A path or a name with marks inside is one word; the first item begins with it, or
+    // with its leading mark ("is ip6.arpa and", "goes to /etc/ssl/certs/host.crt, and").
+    std::size_t lead = xPathStart(previous);
+    if (lead > 0 && xInWordMark(lead - 1))
+      --lead;
     const bool afterVerb = previous > 0 && fGroupOfToken[previous - 1] != kNone &&
                            fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB;
     const bool single = group.firstToken == group.lastToken;
@@ -1037,6 +1042,14 @@ class StructureBuilder {
     // After a comma and a lone item, a word that is first a verb of the third person: a
     // second action ("it is smaller, with only 50 workers, and produces amplifiers").
     if (commaBefore && leftItems == 1 && lone.firstClass == WORD_CLASS_VERB && lone.thirdSingular)
+      return true;
+    // The item followed by the word and the preposition that lead the first item: a second
+    // clause of the same verb ("X goes to Y, and pki/private/host.key goes to
+    // /etc/ssl/private").
+    const std::size_t pathEnd = xPathEnd(next);
+    if (lead >= 2 && xIsWord(pathEnd) && xIsPreposition(pathEnd + 1) && xIsPreposition(lead - 1) &&
+        fTokens[lead - 1].lower == fTokens[pathEnd + 1].lower && xIsWord(lead - 2) &&
+        fTokens[lead - 2].lower == fTokens[pathEnd].lower)
       return true;
     // After a comma and a lone item, an item between commas before a pronoun and its verb:
     // the second clause and a phrase that leads it ("it has various responsibilities, and
@@ -1107,7 +1120,7 @@ class StructureBuilder {
     if (next >= fTokens.size() ||
         (fTokens[next].type != Token::Word && !(leftVerb && xInWordMark(next))))
       return false;
-    const bool beginsClause = previous == 0 || xBeginsClause(previous - 1);
+    const bool beginsClause = lead == 0 || xBeginsClause(lead - 1);
     const Role after = fTokens[next].type == Token::Word ? fTokens[next].role : Role::Interjection;
     const bool canBeVerb = lone.has(WORD_CLASS_VERB) || lone.has(WORD_CLASS_AUXILIARY);
     const bool objectAfter = after == Role::Pronoun || after == Role::Clitic;
@@ -1131,6 +1144,7 @@ class StructureBuilder {
     // first item has a verb of its own: then a verb of a tense there begins the second
     // clause ("n'est pas une personne et les écrans de debconf ne parlent pas").
     std::size_t k = next;
+    bool afterRelative = false;
     while (k < fTokens.size()) {
       if (fGroupOfToken[k] != kNone && fGroups[fGroupOfToken[k]].kind == STRUCTURE_VERB) {
         // A participle that qualifies the item, before its preposition ("the pears picked
@@ -1145,6 +1159,32 @@ class StructureBuilder {
       }
       if (!commaBefore && !leftVerb)
         break;
+      // A relative clause after a subject led by a determiner is passed over up to its
+      // verb, so that the subject's verb follows ("and the files that we keep there are",
+      // "et les composants qui sont listés sont"; not "et les fichiers qui sont listés.").
+      // The two verbs may stand in one group: the second begins at a verb of a tense after
+      // a participle.
+      if (lone.role == Role::Determiner && xIsWord(k) &&
+          isOneOf(fTokens[k].lower, kRelativeWords)) {
+        std::size_t verb = k + 1;
+        while (xIsWord(verb) && (fGroupOfToken[verb] == kNone ||
+                                 fGroups[fGroupOfToken[verb]].kind != STRUCTURE_VERB))
+          ++verb;
+        if (!xIsWord(verb))
+          break;
+        k = fGroups[fGroupOfToken[verb]].lastToken + 1;
+        for (std::size_t t = verb + 1; t + 1 < k; ++t) {
+          if (fTokens[t].participle && fTokens[t + 1].finite &&
+              (fTokens[t + 1].role == Role::Verb || fTokens[t + 1].role == Role::Auxiliary)) {
+            k = t + 1;
+            break;
+          }
+        }
+        afterRelative = true;
+        if (k == fGroups[fGroupOfToken[verb]].lastToken + 1)
+          continue;
+        break;
+      }
       const Token& token = fTokens[k];
       const bool skipped = token.type == Token::Word
                                ? token.role == Role::Preposition || token.role == Role::Adverb ||
@@ -1185,6 +1225,10 @@ class StructureBuilder {
                            xIsPreposition(firstLeft.firstToken) && !isDe(firstLeft.firstToken);
     if (!partitive && (rightPreposition || isDe(group.firstToken)))
       return false;
+    // The verb stands apart from the word before it: a piece of a name is no verb ("or
+    // debian-release@lists", "that gets posted to debian-devel-changes@lists").
+    if (!xSpacedBefore(k) && (k == next || afterRelative))
+      return false;
     if (k == next && !beginsClause)
       return true;
     if (commaBefore && leftItems == 1)
@@ -1206,6 +1250,34 @@ class StructureBuilder {
     const std::size_t c = fTokens[t].chunk;
     return c + 1 < fChunks.size() && fChunks[c + 1].wordClass() >= WORD_CLASS_UNKNOWN &&
            fChunks[c].text.find_first_not_of("/._~:-@") == std::string::npos;
+  }
+
+  // Whether token t follows a space.
+  bool xSpacedBefore(std::size_t t) const {
+    const std::size_t c = fTokens[t].chunk;
+    return c > 0 && fChunks[c - 1].wordClass() < WORD_CLASS_UNKNOWN &&
+           fChunks[c - 1].text.find_first_not_of(' ') == std::string::npos;
+  }
+
+  // Whether the mark at token t joins the words right before and after it into one path or
+  // name ("vpn.example.com", "pki/private").
+  bool xJoiningMark(std::size_t t) const {
+    return t > 0 && xInWordMark(t) && fTokens[t - 1].type == Token::Word &&
+           fTokens[t - 1].chunk + 1 == fTokens[t].chunk;
+  }
+
+  // The first word of the path or name whose word is at token t.
+  std::size_t xPathStart(std::size_t t) const {
+    while (t >= 2 && xJoiningMark(t - 1))
+      t -= 2;
+    return t;
+  }
+
+  // The token after the path or name whose last word so far is right before token t.
+  std::size_t xPathEnd(std::size_t t) const {
+    while (t + 1 < fTokens.size() && xJoiningMark(t))
+      t += 2;
+    return t;
   }
 
   // The token after the closing bracket of an aside that opens at token t, in the same
