@@ -128,6 +128,20 @@ def english_plural(word):
     return word + "s"
 
 
+# The prefixes of the verbs made of "go" and "do": "undergo", "forgo", "redo", "outdo".
+GO_DO_PREFIXES = {"", "under", "for", "fore", "out", "un", "re", "over", "mis"}
+
+
+def english_third_person(word, plurals):
+    """The present of the third person singular: "goes", "undoes", "echoes", "vetoes" (the
+    noun's plural, where WordNet lists it with "es"), but "demos", "tangos"."""
+    if re.search(r"[^aeiou]o$", word):
+        if (word[-2:] in ("go", "do") and word[:-2] in GO_DO_PREFIXES) or word + "es" in plurals:
+            return word + "es"
+        return word + "s"
+    return english_plural(word)
+
+
 def english_ing(word):
     if word.endswith("ie"):
         return word[:-2] + "ying"
@@ -213,7 +227,9 @@ def english(args):
                         analysis(form, word_class, "p", lemma, frequency)
                 elif pos == "verb":
                     analysis(lemma, word_class, "WP", lemma, frequency)
-                    analysis(english_plural(lemma), word_class, "P3s", lemma, frequency)
+                    plurals = exceptions.get((lemma, "noun"), [])
+                    analysis(english_third_person(lemma, plurals), word_class, "P3s", lemma,
+                             frequency)
                     irregular_ing = [f for f in irregular if f.endswith("ing")]
                     irregular_past = [f for f in irregular if not f.endswith("ing")]
                     for form in irregular_ing or [english_ing(lemma)]:
