@@ -440,6 +440,10 @@ TEST_F(RealDatabases, SentencesOfTheThreeLanguages) {
        "nominal[I] verb[was born] nominal[Paris] nominal[I] verb[was] nominal[happy]"},
       {"French", "je suis né à Paris et il faisait froid",
        "nominal[je] verb[suis né] nominal[Paris] nominal[il] verb[faisait] nominal[froid]"},
+      // "A and B and C" where B can be a verb and its object: a second action, then a list.
+      {"English", "They are members of the team and moderate news and announcements.",
+       "nominal[They] verb[are] nominal[members] nominal[the team] and2[moderate news and "
+       "announcements]"},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);
@@ -664,6 +668,19 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
        "/etc/ssl/private/server.key.",
        false},
       {"English", "Write to team-devel@lists.example.org or team-release@lists.example.org.", true},
+      {"English", "The certificate goes to the server and the key goes to the client.", false},
+      {"French", "Il décompresse l'archive et la recompresse.", false},
+      {"English", "The zone is example.org and the records which are listed are short.", false},
+      {"English", "Declare the name of the machine, or set up a static network.", false},
+      {"English",
+       "The advice is to stay out of such debates, and maybe rapidly skim through their content.",
+       false},
+      {"English", "It offers speed, and maybe support for IPv6.", true},
+      {"English", "If SLAAC is activated in the network and IPv6 on the computer, it works.",
+       false},
+      {"English", "In short, software was designed with security and reliability in mind.", true},
+      {"French", "Le premier pourra être /dev/sdb et le second /dev/sdc.", false},
+      {"French", "Les noyaux intègrent le QoS et toute la panoplie des modules.", true},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

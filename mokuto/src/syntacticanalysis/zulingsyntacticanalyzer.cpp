@@ -48,6 +48,12 @@ constexpr std::array<std::string_view, 2> kThatWords = {"que", "qu"};
 constexpr std::array<std::string_view, 9> kRelativeWords = {
     "that", "which", "who", "whom", "whose", "qui", "que", "dont", "où"};
 constexpr std::array<std::string_view, 4> kItemSeparators = {",", "、", "，", "､"};
+// Prefixes that make a verb of a verb ("recompresser", "désarchiver", "repack"), longest
+// first.
+constexpr std::array<std::string_view, 4> kVerbPrefixes = {"dés", "ré", "dé", "re"};
+// The particles of phrasal verbs before their object: "set up a network".
+constexpr std::array<std::string_view, 6> kVerbParticles = {"up",   "out",  "off",
+                                                            "down", "back", "away"};
 // The negations that stand for a whole clause after "or" ("ou non", "or not").
 constexpr std::array<std::string_view, 2> kNotWords = {"non", "not"};
 // Adverbs of sequence: after a coordinating word they announce a second action ("and then
@@ -299,8 +305,37 @@ class Cutter {
       q += cp.length;
     }
     // A stored word can be shorter than the longest stored prefix ("peut" of "peut-êtres").
-    xPushWord(p, q, stored > q - p ? xStored(p, q) : std::nullopt);
+    const std::optional<std::uint32_t> own = stored > q - p ? xStored(p, q) : std::nullopt;
+    std::vector<ZULingClassFeatures> derived;
+    if (!own)
+      derived = xRepeatedVerb(p, q);
+    if (derived.empty())
+      xPushWord(p, q, own);
+    else
+      xPushWord(p, q, std::move(derived));
     return q;
+  }
+
+  // An unknown word made of a prefix of repetition or undoing and a stored verb
+  // ("recompresse", "réattache", "désarchiver", "repack"): the verb records of the verb,
+  // with no base form (the word's is not the verb's).
+  std::vector<ZULingClassFeatures> xRepeatedVerb(std::size_t p, std::size_t q) const {
+    std::vector<ZULingClassFeatures> classes;
+    if (fDatabase == nullptr)
+      return classes;
+    for (const std::string_view prefix : kVerbPrefixes) {
+      if (q - p <= prefix.size() + 1 || fLower.compare(p, prefix.size(), prefix) != 0)
+        continue;
+      if (const std::optional<std::uint32_t> verb = xStored(p + prefix.size(), q)) {
+        for (ZULingClassFeatures& record : fDatabase->wordClassesAt(*verb)) {
+          if (record.wordClass == WORD_CLASS_VERB)
+            classes.push_back(std::move(record));
+        }
+        if (!classes.empty())
+          break;
+      }
+    }
+    return classes;
   }
 
   std::size_t xUnspacedWord(std::size_t p, std::size_t end, CodePoint cp) {
@@ -346,13 +381,18 @@ class Cutter {
   }
 
   void xPushWord(std::size_t begin, std::size_t end, std::optional<std::uint32_t> node) {
+    xPushWord(begin, end,
+              node ? fDatabase->wordClassesAt(*node)
+                   : std::vector<ZULingClassFeatures>{{WORD_CLASS_UNKNOWN, {}}},
+              node);
+  }
+
+  void xPushWord(std::size_t begin, std::size_t end, std::vector<ZULingClassFeatures> classes,
+                 std::optional<std::uint32_t> node = std::nullopt) {
     Chunk chunk;
     chunk.text.assign(fText, begin, end - begin);
     chunk.length = static_cast<std::int32_t>(end - begin);
-    if (node)
-      chunk.classes = fDatabase->wordClassesAt(*node);
-    else
-      chunk.classes.push_back({WORD_CLASS_UNKNOWN, {}});
+    chunk.classes = std::move(classes);
     chunk.node = node;
     if (fText[begin] >= 'A' && fText[begin] <= 'Z') {
       if (chunk.classes.size() == 1 && chunk.classes.front().wordClass == WORD_CLASS_UNKNOWN)
@@ -589,6 +629,7 @@ class StructureBuilder {
     bool verbContext = false;
     bool clauseStart = false;  // after a comma or a coordinating word, adverbs between
     bool then = false;         // and after "then"
+    bool adverbs = false;      // and after an adverb there
     List list = List::None;
     Role previous = Role::Conjunction;
     Role lastContent = Role::Conjunction;
@@ -601,6 +642,7 @@ class StructureBuilder {
         subjectBefore = false;
         verbContext = false;
         clauseStart = token.type == Token::Comma;
+        adverbs = false;
         then = false;
         list = token.type == Token::Comma ? listOf(lastContent) : List::None;
         previousWord = {};
@@ -610,6 +652,7 @@ class StructureBuilder {
         subjectBefore = false;
         verbContext = false;
         clauseStart = true;
+        adverbs = false;
         then = false;
         list = listOf(lastContent);
         previous = token.role;
@@ -625,8 +668,13 @@ class StructureBuilder {
       const bool auxiliary = token.firstClass == WORD_CLASS_AUXILIARY;
       const bool action =
           clauseStart && canBeVerb &&
-          (then || (!token.has(WORD_CLASS_PROPER_NOUN) &&
-                    (auxiliary || (token.firstClass == WORD_CLASS_VERB && xObjectAt(t + 1)))));
+          (then ||
+           (!token.has(WORD_CLASS_PROPER_NOUN) &&
+            (auxiliary || (token.firstClass == WORD_CLASS_VERB && xObjectAt(t + 1)) ||
+             (token.infinitive && xParticleAt(t + 1) && xObjectAt(t + 2)) ||
+             (adverbs && token.infinitive && !token.thirdSingular &&
+              (xObjectAt(t + 1) || (xIsWord(t + 1) && fTokens[t + 1].role == Role::Preposition)) &&
+              xBaseVerbBefore(t)))));
       if (action) {
         role = auxiliary ? Role::Auxiliary : Role::Verb;
       } else if (list == List::Verbal && canBeVerb &&
@@ -689,6 +737,7 @@ class StructureBuilder {
       token.role = role;
       subjectBefore = role == Role::Pronoun && beginsClause;
       clauseStart = clauseStart && role == Role::Adverb;
+      adverbs = clauseStart;
       then = clauseStart && (then || isOneOf(token.lower, kThenWords));
       verbContext = role == Role::Pronoun || role == Role::Auxiliary || role == Role::Clitic ||
                     (verbContext && role == Role::Adverb);
@@ -699,6 +748,41 @@ class StructureBuilder {
       previous = role;
       previousWord = token.lower;
     }
+  }
+
+  // Whether token t is the particle of a phrasal verb ("set up", "turn off").
+  bool xParticleAt(std::size_t t) const {
+    return xIsWord(t) && isOneOf(fTokens[t].lower, kVerbParticles) &&
+           (fTokens[t].has(WORD_CLASS_PREPOSITION) || fTokens[t].has(WORD_CLASS_ADVERB));
+  }
+
+  // Whether the last verb before the coordinating word or comma that leads to token t (past
+  // adverbs), in the same sentence, is of the base form: after "to" or an auxiliary, or at
+  // the head of its clause ("to stay out of such debates, and maybe skim through").
+  bool xBaseVerbBefore(std::size_t t) const {
+    while (t > 0 && xIsWord(t - 1) && fTokens[t - 1].role == Role::Adverb)
+      --t;
+    while (t > 0) {
+      --t;
+      const Token& token = fTokens[t];
+      if (token.type == Token::Break) {
+        if (xInWordMark(t))
+          continue;
+        return false;
+      }
+      if (token.type == Token::Comma || token.coordination != Coordination::None)
+        continue;
+      if (token.role == Role::Subordinator || isOneOf(token.lower, kRelativeWords) ||
+          isOneOf(token.lower, kQuestionWords))
+        return false;
+      if (token.role == Role::Verb || token.role == Role::Auxiliary) {
+        if (!token.infinitive || token.role == Role::Auxiliary)
+          return false;
+        return t == 0 || !xIsWord(t - 1) || fTokens[t - 1].lower == "to" ||
+               fTokens[t - 1].role == Role::Auxiliary;
+      }
+    }
+    return false;
   }
 
   // Whether token t may begin the object of a verb before it: a determiner, a pronoun, a
@@ -938,6 +1022,15 @@ class StructureBuilder {
       }
       if (before.empty())
         continue;
+      // "A and B and C" with no comma, where B begins with a word that can be a verb before
+      // its object: the first word joins a second action, and the things are those that the
+      // second joins ("they are delegates of the leader and moderate news and
+      // announcements").
+      if (after.size() >= 2 && !commaBefore && before.size() == 1 &&
+          xVerbBeforeObject(after.front().group)) {
+        consumed[c] = true;
+        continue;
+      }
       if (fSpaced && xStartsClause(after.front(), before.back(), commaBefore, before.size()))
         continue;
       for (std::size_t w : words)
@@ -957,6 +1050,15 @@ class StructureBuilder {
       structures.push_back(std::move(structure));
     }
     return structures;
+  }
+
+  // Whether nominal group g begins with a word that can be a verb of a tense or of the base
+  // form, and goes on.
+  bool xVerbBeforeObject(std::size_t g) const {
+    const Token& first = fTokens[fGroups[g].firstToken];
+    return fGroups[g].firstToken < fGroups[g].lastToken && first.has(WORD_CLASS_VERB) &&
+           (first.infinitive || first.thirdSingular) && !first.has(WORD_CLASS_PROPER_NOUN) &&
+           (first.role == Role::Noun || first.role == Role::Adjective);
   }
 
   // A nominal group ending in its noun or pronoun: the only items of a Japanese particle,
@@ -1008,8 +1110,10 @@ class StructureBuilder {
     std::size_t lead = xPathStart(previous);
     if (lead > 0 && xInWordMark(lead - 1))
       --lead;
-    const bool afterVerb = previous > 0 && fGroupOfToken[previous - 1] != kNone &&
-                           fGroups[fGroupOfToken[previous - 1]].kind == STRUCTURE_VERB;
+    // The verb before the first item, or before the path that the item ends ("is
+    // example.org and").
+    const bool afterVerb = lead > 0 && fGroupOfToken[lead - 1] != kNone &&
+                           fGroups[fGroupOfToken[lead - 1]].kind == STRUCTURE_VERB;
     const bool single = group.firstToken == group.lastToken;
     // A relative word before the rest of its clause, or before an auxiliary read as a noun
     // ("and that for this purpose it can", "des paquets de base et dont l'intégration",
@@ -1024,6 +1128,8 @@ class StructureBuilder {
                        (group.firstToken + 2 <= group.lastToken ||
                         (xIsWord(next) && (fTokens[next].has(WORD_CLASS_VERB) ||
                                            fTokens[next].has(WORD_CLASS_AUXILIARY)))))))
+      return true;
+    if (leftItems == 1 && right.firstToken == group.firstToken && xGappedClause(group, lead, next))
       return true;
     // A word that can be a verb, before its object.
     if (!single && afterVerb && lone.infinitive && xObjectAt(group.firstToken + 1))
@@ -1239,6 +1345,56 @@ class StructureBuilder {
     return afterVerb || (previous > 0 && xIsPreposition(previous - 1)) ||
            (leftVerb && (previous != fGroups[firstLeft.group].firstToken ||
                          isOneOf(fTokens[previous].lower, kPartitives)));
+  }
+
+  // A second clause whose verb is left out: a subject like the first clause's, then a
+  // complement like the first item ("le premier pourra être /dev/sdb et le second
+  // /dev/sdc", "if SLAAC is activated in your network and IPv6 on your computer", "si SLAAC
+  // est actif sur le réseau et IPv6 actif sur un ordinateur"). The first item, or the path
+  // that it ends, which begins at lead, follows the verb of its clause, maybe through a
+  // preposition and a word of the predicate that the right group then ends with; the
+  // clause's subject begins it; next is the token after the right group.
+  bool xGappedClause(const Group& right, std::size_t lead, std::size_t next) const {
+    if (next >= fTokens.size() || lead < 2)
+      return false;
+    std::size_t p = lead - 1;
+    const bool preposition = xIsPreposition(p);
+    if (preposition)
+      --p;
+    if (fGroupOfToken[p] == kNone)
+      return false;
+    if (fGroups[fGroupOfToken[p]].kind == STRUCTURE_NOMINAL) {
+      const Group& predicate = fGroups[fGroupOfToken[p]];
+      if (predicate.firstToken != p || right.firstToken == right.lastToken ||
+          fTokens[right.lastToken].lower != fTokens[p].lower || p == 0)
+        return false;
+      --p;
+    }
+    const std::size_t g = fGroupOfToken[p];
+    if (g == kNone || fGroups[g].kind != STRUCTURE_VERB || fGroups[g].lastToken != p ||
+        !xFiniteGroup(g) || fGroups[g].firstToken == 0)
+      return false;
+    const std::size_t s = fGroupOfToken[fGroups[g].firstToken - 1];
+    if (s == kNone || fGroups[s].kind != STRUCTURE_NOMINAL ||
+        (fGroups[s].firstToken > 0 && fTokens[fGroups[s].firstToken - 1].type == Token::Break))
+      return false;
+    if (fGroups[s].firstToken > 0 && !xBeginsClause(fGroups[s].firstToken - 1))
+      return false;
+    // Both subjects led by a determiner, both pronouns or both names.
+    const auto subjectKind = [](const Token& token) {
+      if (token.role == Role::Determiner || token.role == Role::Pronoun)
+        return static_cast<int>(token.role);
+      return token.has(WORD_CLASS_PROPER_NOUN) || token.firstClass == WORD_CLASS_UNKNOWN ? -1 : 0;
+    };
+    const int kind = subjectKind(fTokens[fGroups[s].firstToken]);
+    if (kind == 0 || kind != subjectKind(fTokens[right.firstToken]))
+      return false;
+    if (preposition)
+      return xIsPreposition(next) && !isOneOf(fTokens[next].lower, kListPrepositions);
+    // A path, or a nominal group led by a determiner, right after the subject, as the first
+    // item after the verb (not the complement of a noun: "et toute la panoplie des modules").
+    return xInWordMark(next) || (xIsWord(next) && fTokens[next].role == Role::Determiner &&
+                                 !isOneOf(fTokens[next].lower, kPartitives));
   }
 
   // A mark inside a path, an option or an address, right before the word it leads
