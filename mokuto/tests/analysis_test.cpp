@@ -681,6 +681,12 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"English", "In short, software was designed with security and reliability in mind.", true},
       {"French", "Le premier pourra être /dev/sdb et le second /dev/sdc.", false},
       {"French", "Les noyaux intègrent le QoS et toute la panoplie des modules.", true},
+      {"English", "The kernel learns about any newly added device and hands out a pair of numbers.",
+       false},
+      {"English",
+       "The daemon handles activation of the interfaces and a user interface controls this daemon.",
+       false},
+      {"French", "Ils sont séparés par des virgules et c'est l'opérateur qui décide.", false},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

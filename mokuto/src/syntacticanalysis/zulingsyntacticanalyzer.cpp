@@ -671,7 +671,8 @@ class StructureBuilder {
           (then ||
            (!token.has(WORD_CLASS_PROPER_NOUN) &&
             (auxiliary || (token.firstClass == WORD_CLASS_VERB && xObjectAt(t + 1)) ||
-             (token.infinitive && xParticleAt(t + 1) && xObjectAt(t + 2)) ||
+             ((token.infinitive || token.thirdSingular) && xParticleAt(t + 1) &&
+              xObjectAt(t + 2)) ||
              (adverbs && token.infinitive && !token.thirdSingular &&
               (xObjectAt(t + 1) || (xIsWord(t + 1) && fTokens[t + 1].role == Role::Preposition)) &&
               xBaseVerbBefore(t)))));
@@ -1145,6 +1146,14 @@ class StructureBuilder {
         (xObjectAt(object) || fTokens[object].role == Role::Noun) &&
         xThirdSingularVerbBefore(previous))
       return true;
+    // A subject led by a determiner, with a noun between, whose last word can be a verb of
+    // the third person before that verb's object, where the clause's verb is one too ("handles
+    // activation and configuration of interfaces and a user interface controls this daemon").
+    if (lone.role == Role::Determiner && group.lastToken > group.firstToken + 1 &&
+        fTokens[group.lastToken].thirdSingular && xIsWord(next) &&
+        fTokens[next].role == Role::Determiner && !isOneOf(fTokens[next].lower, kPartitives) &&
+        xThirdSingularVerbBefore(previous))
+      return true;
     // After a comma and a lone item, a word that is first a verb of the third person: a
     // second action ("it is smaller, with only 50 workers, and produces amplifiers").
     if (commaBefore && leftItems == 1 && lone.firstClass == WORD_CLASS_VERB && lone.thirdSingular)
@@ -1408,11 +1417,14 @@ class StructureBuilder {
            fChunks[c].text.find_first_not_of("/._~:-@") == std::string::npos;
   }
 
-  // Whether token t follows a space.
+  // Whether token t follows a space, or the apostrophe of an elided word ("c'est").
   bool xSpacedBefore(std::size_t t) const {
     const std::size_t c = fTokens[t].chunk;
-    return c > 0 && fChunks[c - 1].wordClass() < WORD_CLASS_UNKNOWN &&
-           fChunks[c - 1].text.find_first_not_of(' ') == std::string::npos;
+    if (c == 0 || fChunks[c - 1].wordClass() >= WORD_CLASS_UNKNOWN)
+      return false;
+    const std::string& before = fChunks[c - 1].text;
+    return before.find_first_not_of(' ') == std::string::npos || before == "'" ||
+           before == "\u2019";
   }
 
   // Whether the mark at token t joins the words right before and after it into one path or
