@@ -687,6 +687,13 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
        "The daemon handles activation of the interfaces and a user interface controls this daemon.",
        false},
       {"French", "Ils sont séparés par des virgules et c'est l'opérateur qui décide.", false},
+      {"English", "It is enough to open these files and re-save them as UTF-8.", false},
+      {"English",
+       "Note that ACLs are processed in their order and that an earlier entry that fits has "
+       "precedence.",
+       false},
+      {"French",
+       "Ce champ indique si le système doit être vérifié au démarrage et dans quel ordre.", false},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

@@ -40,8 +40,9 @@ constexpr std::array<std::string_view, 7> kListPrepositions = {"of",  "de",     
 // identifier".
 constexpr std::array<std::string_view, 2> kInfinitiveWords = {"to", "à"};
 // Words that begin an indirect question or a relative clause.
-constexpr std::array<std::string_view, 10> kQuestionWords = {
-    "how", "why", "what", "whether", "comment", "pourquoi", "combien", "quoi", "lorsque", "quand"};
+constexpr std::array<std::string_view, 14> kQuestionWords = {
+    "how",  "why",   "what",    "whether", "comment", "pourquoi", "combien",
+    "quoi", "quand", "lorsque", "quel",    "quelle",  "quels",    "quelles"};
 // The conjunction that begins a second subordinate clause ("si vous n'êtes pas ... et que
 // vous utilisez").
 constexpr std::array<std::string_view, 2> kThatWords = {"que", "qu"};
@@ -546,7 +547,7 @@ class StructureBuilder {
         fTokens.push_back(std::move(token));
         continue;
       }
-      if (wordClass < WORD_CLASS_UNKNOWN)
+      if (wordClass < WORD_CLASS_UNKNOWN || xHyphenatedPrefix(c))
         continue;
       Token token;
       token.type = Token::Word;
@@ -598,6 +599,17 @@ class StructureBuilder {
   }
 
   bool xIsWord(std::size_t t) const { return t < fTokens.size() && fTokens[t].type == Token::Word; }
+
+  // Whether chunk c is a prefix of repetition or undoing joined by a hyphen to the verb it
+  // qualifies ("re-save", "ré-installer"): the verb stands for both.
+  bool xHyphenatedPrefix(std::size_t c) const {
+    if (c + 2 >= fChunks.size() || fChunks[c + 1].text != "-" ||
+        fChunks[c + 1].wordClass() != WORD_CLASS_LINK_BETWEEN_WORDS ||
+        std::none_of(fChunks[c + 2].classes.begin(), fChunks[c + 2].classes.end(),
+                     [](const ZULingClassFeatures& r) { return r.wordClass == WORD_CLASS_VERB; }))
+      return false;
+    return isOneOf(lowercase(fChunks[c].text), kVerbPrefixes);
+  }
 
   // Where words are spaced: the first class is the word's guess, which its neighbours
   // correct. After a comma or a coordinating word, a word that can be read as the word
@@ -1121,10 +1133,12 @@ class StructureBuilder {
     // "in Testing, or that can be moved"; but "this and that", "the name of the source and
     // that of the binary").
     // So does one before a subject pronoun and more words ("and that they properly
-    // reconfigure the devices"; not "this and that one").
+    // reconfigure the devices"; not "this and that one"), and one before a determiner ("and
+    // that an earlier entry has precedence").
     if (isOneOf(lone.lower, kRelativeWords) &&
         (single ? xIsWord(next) && !isOneOf(fTokens[next].lower, kListPrepositions)
                 : fTokens[group.firstToken + 1].firstClass == WORD_CLASS_AUXILIARY ||
+                      fTokens[group.firstToken + 1].role == Role::Determiner ||
                       (fTokens[group.firstToken + 1].role == Role::Pronoun &&
                        (group.firstToken + 2 <= group.lastToken ||
                         (xIsWord(next) && (fTokens[next].has(WORD_CLASS_VERB) ||
