@@ -694,6 +694,8 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
        false},
       {"French",
        "Ce champ indique si le système doit être vérifié au démarrage et dans quel ordre.", false},
+      {"French", "On voit ce qui se passe dans la communauté et ce à quoi ses membres pensent.",
+       false},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

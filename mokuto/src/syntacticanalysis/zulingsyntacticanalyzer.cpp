@@ -1144,6 +1144,14 @@ class StructureBuilder {
                         (xIsWord(next) && (fTokens[next].has(WORD_CLASS_VERB) ||
                                            fTokens[next].has(WORD_CLASS_AUXILIARY)))))))
       return true;
+    // "ce" before a relative word, or before a preposition and "quoi" or a relative word,
+    // leads a relative clause ("ce qui se passe dans la communauté et ce à quoi ses membres
+    // sont occupés").
+    if (single && lone.lower == "ce" && xIsWord(next) &&
+        (isOneOf(fTokens[next].lower, kRelativeWords) ||
+         (xIsPreposition(next) && xIsWord(next + 1) &&
+          (fTokens[next + 1].lower == "quoi" || isOneOf(fTokens[next + 1].lower, kRelativeWords)))))
+      return true;
     if (leftItems == 1 && right.firstToken == group.firstToken && xGappedClause(group, lead, next))
       return true;
     // A word that can be a verb, before its object.
