@@ -381,4 +381,9 @@ std::size_t FaultPlan::hanging() const {
   return fHanging;
 }
 
+std::uint64_t FaultPlan::lifts() const {
+  std::lock_guard lock(fMutex);
+  return fLifts;
+}
+
 }  // namespace robotsim

@@ -30,7 +30,7 @@ Robot::Robot(RobotOptions options, std::shared_ptr<ZU::ZUBroker> broker)
   try {
     ZUMemoryOptions memory;
     memory.timeline = fTimeline;
-    xStart<ZUMemory>("ZUMemory", memory);
+    fMemory = xStart<ZUMemory>("ZUMemory", memory);
     fMotion = xStart<ZUMotion>("ZUMotion", fTimeline);
     fMotion->sampleAngles(options.angleSamplesPerSecond);
     xStart<ZUBehaviorManager>("ZUBehaviorManager", fTimeline, options.behaviorsRoot, fFaults);

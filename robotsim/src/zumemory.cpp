@@ -122,6 +122,7 @@ void ZUMemory::raiseEvent(const std::string& key, const ZU::ZUValue& value) {
       for (const auto& [module, subscription] : subscribers->second) {
         Inbox& inbox = fInboxes[module];
         inbox.queue.push_back(Delivery{key, subscription, stored});
+        ++fUndelivered[key];
         if (!inbox.draining) {
           inbox.draining = true;
           wake.push_back(module);
@@ -250,8 +251,10 @@ void ZUMemory::xDrain(const std::string& module) {
       inbox.queue.pop_front();
       // Decided under the lock that an unsubscribe takes: either it comes first and the
       // delivery is dropped, or it waits for the callback to return.
-      if (!xIsCurrent(delivery))
+      if (!xIsCurrent(delivery)) {
+        xDone(delivery.event);
         continue;
+      }
       inbox.delivering = delivery.subscription.serial;
       inbox.thread = std::this_thread::get_id();
     }
@@ -261,9 +264,27 @@ void ZUMemory::xDrain(const std::string& module) {
       Inbox& inbox = fInboxes[module];
       inbox.delivering = 0;
       inbox.thread = {};
+      xDone(delivery.event);
     }
     fDelivered.notify_all();
   }
+}
+
+void ZUMemory::xDone(const std::string& key) {
+  --fUndelivered[key];
+  ++fDeliveredCount[key];
+}
+
+std::size_t ZUMemory::undelivered(const std::string& key) const {
+  std::lock_guard lock(fMutex);
+  const auto it = fUndelivered.find(key);
+  return it == fUndelivered.end() ? 0 : it->second;
+}
+
+std::uint64_t ZUMemory::delivered(const std::string& key) const {
+  std::lock_guard lock(fMutex);
+  const auto it = fDeliveredCount.find(key);
+  return it == fDeliveredCount.end() ? 0 : it->second;
 }
 
 bool ZUMemory::xIsCurrent(const Delivery& delivery) const {

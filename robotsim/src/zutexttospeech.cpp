@@ -447,10 +447,20 @@ void ZUTextToSpeech::xRaiseBookmark(std::int32_t number,
     xRaise(kCurrentBookMarkEvent, ZU::ZUValue(number));
     return;
   }
+  // Held back by the fault plan: withdrawn if the plan is lifted meanwhile, so that it never
+  // comes into a text spoken without faults.
+  const std::uint64_t lifts = fOptions.faults ? fOptions.faults->lifts() : 0;
   ko::getEventLoop()->postDelayed(
-      [weakSelf = weak_from_this(), number] {
-        if (const auto self = std::static_pointer_cast<ZUTextToSpeech>(weakSelf.lock()))
-          self->xRaise(kCurrentBookMarkEvent, ZU::ZUValue(number));
+      [weakSelf = weak_from_this(), number, lifts] {
+        const auto self = std::static_pointer_cast<ZUTextToSpeech>(weakSelf.lock());
+        if (!self)
+          return;
+        if (self->fOptions.faults && self->fOptions.faults->lifts() != lifts) {
+          KO_LOG_VERBOSE(kCategory)
+              << "Bookmark " << number << " held back by the lifted faults: not reported";
+          return;
+        }
+        self->xRaise(kCurrentBookMarkEvent, ZU::ZUValue(number));
       },
       delay);
 }

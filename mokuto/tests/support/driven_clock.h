@@ -7,13 +7,21 @@
 // this time. While rounds are held, a round of the director's watch for a bookmark ends only
 // when the director is woken (a bookmark, a stop), never by running out.
 //
-// Any thread may wait on it; the time is an atomic.
+// The events that end a limit come in real time, which a loaded machine stretches, whereas
+// the robot delivers them at once. So, once watching deliveries, a limit runs out only when
+// none of them is on its way (until then the wait goes on), and one that arrived meanwhile
+// ends the wait as a wake-up would: the waiter looks again, and its limit begins anew.
+//
+// Any thread may wait on it; the time is an atomic. Watch before the service's first wait.
 
 #include <atomic>
 #include <chrono>
 #include <condition_variable>
+#include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <mutex>
+#include <utility>
 
 #include "mokuto/mokutoclock.h"
 
@@ -34,10 +42,27 @@ class DrivenClock : public ZU::MokutoClock {
       return status;
     }
     const auto real = std::chrono::duration_cast<std::chrono::microseconds>(duration * fScale);
+    const std::uint64_t before = fDelivered ? fDelivered() : 0;
     const std::cv_status status = condition.wait_for(lock, real);
-    if (status == std::cv_status::timeout && wait == Wait::Limit)
+    if (status == std::cv_status::timeout && wait == Wait::Limit) {
+      if (fUndelivered) {
+        while (fUndelivered() > 0) {
+          if (condition.wait_for(lock, kDeliveryPoll) == std::cv_status::no_timeout)
+            return std::cv_status::no_timeout;
+        }
+        if (fDelivered() != before)
+          return std::cv_status::no_timeout;
+      }
       fNowUs.fetch_add(duration.count());
+    }
     return status;
+  }
+
+  // The events that may end a limit: how many are on their way, how many arrived so far.
+  void watchDeliveries(std::function<std::size_t()> undelivered,
+                       std::function<std::uint64_t()> delivered) {
+    fUndelivered = std::move(undelivered);
+    fDelivered = std::move(delivered);
   }
 
   void holdRounds(bool hold) { fHoldRounds = hold; }
@@ -51,7 +76,11 @@ class DrivenClock : public ZU::MokutoClock {
   }
 
  private:
+  static constexpr auto kDeliveryPoll = std::chrono::milliseconds(5);
+
   const double fScale;
+  std::function<std::size_t()> fUndelivered;
+  std::function<std::uint64_t()> fDelivered;
   std::atomic<std::int64_t> fNowUs{0};
   std::atomic<bool> fHoldRounds{false};
   std::atomic<int> fHeldRounds{0};

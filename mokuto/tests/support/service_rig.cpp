@@ -9,6 +9,12 @@
 
 namespace mokutotest {
 
+namespace {
+
+constexpr const char* kBookmarkEvent = "ZUTextToSpeech/CurrentBookMark";
+
+}  // namespace
+
 ServiceRig::ServiceRig(double scale)
     : clock(std::make_shared<DrivenClock>(scale)),
       faults(std::make_shared<robotsim::FaultPlan>(std::vector<robotsim::Fault>{}, scale)) {
@@ -19,6 +25,9 @@ ServiceRig::ServiceRig(double scale)
   options.behaviorsRoot = writeGestureLibrary(fLibrary);
   options.faults = faults;
   robot = std::make_unique<robotsim::Robot>(options);
+  // The director's limits wait for bookmarks, which the robot's memory delivers.
+  clock->watchDeliveries([memory = robot->memory()] { return memory->undelivered(kBookmarkEvent); },
+                         [memory = robot->memory()] { return memory->delivered(kBookmarkEvent); });
   fWaiter.emplace(*robot->timeline());
   ZU::ZUAudioPlayerProxy(robot->broker()).loadSoundSet("bells");
 

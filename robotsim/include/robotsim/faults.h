@@ -16,7 +16,8 @@
 //                                                are never reported
 //   ZUTextToSpeech.bookmarks:duplicate[=N,...]   reported twice
 //   ZUTextToSpeech.bookmarks:reorder[=N,...]     reported after the next mark (or the end)
-//   ZUTextToSpeech.bookmarks:delay=DURATION[@N,...]   reported DURATION late
+//   ZUTextToSpeech.bookmarks:delay=DURATION[@N,...]   reported DURATION late (not at all
+//                                                     if the plan is lifted meanwhile)
 //   ZUBehaviorManager.behaviorStopped:never      the signal "behaviorStopped" never comes
 //
 // SERVICE is one of the robot's services, OPERATION one of its published methods, the
@@ -108,6 +109,9 @@ class FaultPlan {
                       std::chrono::milliseconds bound) const;
   // The calls that hang now.
   std::size_t hanging() const;
+  // How often the plan was lifted: a bookmark held back under one plan is not reported
+  // once it is lifted.
+  std::uint64_t lifts() const;
 
  private:
   std::chrono::steady_clock::duration xScaled(std::chrono::milliseconds delay) const;

@@ -16,6 +16,7 @@
 #include "robotsim/faults.h"
 #include "robotsim/timeline.h"
 #include "robotsim/zuaudioplayer.h"
+#include "robotsim/zumemory.h"
 #include "robotsim/zumotion.h"
 #include "robotsim/zutexttospeech.h"
 #include "zu/zubroker.h"
@@ -50,6 +51,7 @@ class Robot {
 
   const std::shared_ptr<ZU::ZUBroker>& broker() const noexcept { return fBroker; }
   const std::shared_ptr<Timeline>& timeline() const noexcept { return fTimeline; }
+  const std::shared_ptr<ZUMemory>& memory() const noexcept { return fMemory; }
   const std::shared_ptr<ZUTextToSpeech>& speech() const noexcept { return fSpeech; }
   // The plan of the options; null when there is none.
   const std::shared_ptr<FaultPlan>& faults() const noexcept { return fFaults; }
@@ -65,6 +67,7 @@ class Robot {
   std::shared_ptr<ZU::ZUBroker> fBroker;
   std::shared_ptr<FaultPlan> fFaults;
   std::shared_ptr<Timeline> fTimeline;
+  std::shared_ptr<ZUMemory> fMemory;
   std::shared_ptr<ZUTextToSpeech> fSpeech;
   std::shared_ptr<ZUMotion> fMotion;
   std::shared_ptr<ZUAudioPlayer> fAudioPlayer;

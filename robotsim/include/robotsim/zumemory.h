@@ -80,6 +80,12 @@ class ZUMemory : public ZU::ZUModule {
   // The modules subscribed to the event, sorted.
   std::vector<std::string> getSubscribers(const std::string& name);
 
+  // ---- for the clocks of tests, which let no time pass while an event is on its way ----
+  // The deliveries of the key still queued or in their callback.
+  std::size_t undelivered(const std::string& key) const;
+  // The deliveries of the key over so far (the callback returned, or it was dropped).
+  std::uint64_t delivered(const std::string& key) const;
+
  private:
   struct Subscription {
     std::string module;
@@ -107,6 +113,8 @@ class ZUMemory : public ZU::ZUModule {
   void xDeliver(const Delivery& delivery);
   // With fMutex held.
   bool xIsCurrent(const Delivery& delivery) const;
+  // With fMutex held: one delivery of the key is over.
+  void xDone(const std::string& key);
 
   const ZUMemoryOptions fOptions;
   std::shared_ptr<ko::EventLoop> fDeliveryLoop;
@@ -118,6 +126,8 @@ class ZUMemory : public ZU::ZUModule {
   std::map<std::string, Inbox> fInboxes;                                      // by module
   std::condition_variable fDelivered;                                         // a callback returned
   std::uint64_t fNextSerial = 1;
+  std::map<std::string, std::size_t> fUndelivered;       // by key
+  std::map<std::string, std::uint64_t> fDeliveredCount;  // by key
 };
 
 }  // namespace robotsim
