@@ -696,6 +696,22 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
        "Ce champ indique si le système doit être vérifié au démarrage et dans quel ordre.", false},
       {"French", "On voit ce qui se passe dans la communauté et ce à quoi ses membres pensent.",
        false},
+      {"English",
+       "The first desktop uses the mutter manager, Plasma uses kwin, and Xfce (which we show "
+       "later) has xfwm.",
+       false},
+      {"French",
+       "Le câble va au port central, qui permet de relier les commutateurs et sur lequel tout le "
+       "trafic passe.",
+       false},
+      {"French",
+       "Le module est intégré dans les noyaux fournis par Debian et les outils Unix de base le "
+       "gèrent sans peine.",
+       false},
+      {"French", "Changer le propriétaire ou les droits d'un fichier le modifie.", true},
+      {"French",
+       "Il ne faut pas donner plus que les droits utiles et il convient de garder des copies.",
+       false},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

@@ -48,6 +48,15 @@ constexpr std::array<std::string_view, 14> kQuestionWords = {
 constexpr std::array<std::string_view, 2> kThatWords = {"que", "qu"};
 constexpr std::array<std::string_view, 9> kRelativeWords = {
     "that", "which", "who", "whom", "whose", "qui", "que", "dont", "où"};
+// The relative pronouns that follow a preposition ("sur lequel", "à qui", "on which"), and
+// the forms that hold the preposition.
+constexpr std::array<std::string_view, 8> kPrepositionRelatives = {
+    "lequel", "laquelle", "lesquels", "lesquelles", "quoi", "qui", "which", "whom"};
+constexpr std::array<std::string_view, 6> kContractedRelatives = {
+    "auquel", "auxquels", "auxquelles", "duquel", "desquels", "desquelles"};
+// French subject pronouns that no coordinating word joins to another subject ("Paul et
+// elle sont", but never "Paul et il sont").
+constexpr std::array<std::string_view, 6> kCliticSubjects = {"il", "ils", "on", "je", "j", "tu"};
 constexpr std::array<std::string_view, 4> kItemSeparators = {",", "、", "，", "､"};
 // Prefixes that make a verb of a verb ("recompresser", "désarchiver", "repack"), longest
 // first.
@@ -1114,9 +1123,14 @@ class StructureBuilder {
       return true;
     // An aside in brackets after an item led by a determiner is read as if it were left out
     // ("and the whole session (input and display) will be secure"); after a name it rather
-    // spells the name out, and the list goes on ("Reporting and Conformance (DMARC) are").
+    // spells the name out, and the list goes on ("Reporting and Conformance (DMARC) are"),
+    // unless it is a relative clause ("and Xfce (which we present later) has xfwm").
+    const std::size_t bracket = group.lastToken + 1;
     const std::size_t next =
-        lone.role == Role::Determiner ? xPastAside(group.lastToken + 1) : group.lastToken + 1;
+        lone.role == Role::Determiner ||
+                (xIsWord(bracket + 1) && isOneOf(fTokens[bracket + 1].lower, kRelativeWords))
+            ? xPastAside(bracket)
+            : bracket;
     const std::size_t previous = firstLeft.firstToken;
     // A path or a name with marks inside is one word; the first item begins with it, or
     // with its leading mark ("is ip6.arpa and", "goes to /etc/ssl/certs/host.crt, and").
@@ -1143,6 +1157,17 @@ class StructureBuilder {
                        (group.firstToken + 2 <= group.lastToken ||
                         (xIsWord(next) && (fTokens[next].has(WORD_CLASS_VERB) ||
                                            fTokens[next].has(WORD_CLASS_AUXILIARY)))))))
+      return true;
+    // A relative pronoun after a preposition leads a relative clause ("qui permet de relier
+    // les commutateurs et sur lequel tout le trafic passe", "et auquel il tient").
+    if ((right.firstToken != group.firstToken && isOneOf(lone.lower, kPrepositionRelatives)) ||
+        isOneOf(lone.lower, kContractedRelatives))
+      return true;
+    // A French subject pronoun before its verb begins a clause, whatever leads the first item
+    // ("ne pas donner plus que les droits utiles et il convient de").
+    if (single && lone.role == Role::Pronoun && isOneOf(lone.lower, kCliticSubjects) &&
+        xIsWord(next) && fGroupOfToken[next] != kNone &&
+        fGroups[fGroupOfToken[next]].kind == STRUCTURE_VERB)
       return true;
     // "ce" before a relative word, or before a preposition and "quoi" or a relative word,
     // leads a relative clause ("ce qui se passe dans la communauté et ce à quoi ses membres
@@ -1280,6 +1305,13 @@ class StructureBuilder {
     // ("changing its owner or its rights of a file changes") unless the clause of the
     // first item has a verb of its own: then a verb of a tense there begins the second
     // clause ("n'est pas une personne et les écrans de debconf ne parlent pas").
+    // The prepositional groups are passed over too where an object pronoun and a verb of a
+    // tense follow them, and the first item's clause has a verb of a tense before the
+    // participles that qualify its nouns ("est intégré dans les noyaux fournis par Debian et
+    // les programmes Unix de base le gèrent"; not "changer le propriétaire ou les droits
+    // d'un fichier le modifie").
+    const bool cliticVerb =
+        !commaBefore && !leftVerb && xCliticVerbAfter(next) && xFiniteClauseBefore(previous);
     std::size_t k = next;
     bool afterRelative = false;
     while (k < fTokens.size()) {
@@ -1294,7 +1326,7 @@ class StructureBuilder {
         k = end;
         continue;
       }
-      if (!commaBefore && !leftVerb)
+      if (!commaBefore && !leftVerb && !cliticVerb)
         break;
       // A relative clause after a subject led by a determiner is passed over up to its
       // verb, so that the subject's verb follows ("and the files that we keep there are",
@@ -1499,6 +1531,34 @@ class StructureBuilder {
         return kNone;
     }
     return fGroups[g].lastToken + 1;
+  }
+
+  // Whether a verb group that begins with an object pronoun and has a verb of a tense
+  // follows token t, past prepositions, nouns, determiners, adjectives and adverbs ("de base
+  // le gèrent").
+  bool xCliticVerbAfter(std::size_t t) const {
+    while (xIsWord(t) && !isOneOf(fTokens[t].lower, kRelativeWords)) {
+      const Token& token = fTokens[t];
+      if (token.role == Role::Clitic) {
+        const std::size_t g = fGroupOfToken[t];
+        return g != kNone && fGroups[g].firstToken == t && xFiniteGroup(g);
+      }
+      if (token.role != Role::Preposition && token.role != Role::Noun &&
+          token.role != Role::Determiner && token.role != Role::Adjective &&
+          token.role != Role::Adverb)
+        return false;
+      ++t;
+    }
+    return false;
+  }
+
+  // Whether the clause before token t has a verb of a tense, past the participles that
+  // qualify its nouns ("est intégré dans les noyaux fournis par Debian").
+  bool xFiniteClauseBefore(std::size_t t) const {
+    std::size_t g = xVerbGroupBefore(t);
+    while (g != kNone && !xFiniteGroup(g) && xParticipleGroupEnd(g) != kNone)
+      g = xVerbGroupBefore(fGroups[g].firstToken);
+    return g != kNone && xFiniteGroup(g);
   }
 
   // Whether group g has a verb of a tense.
