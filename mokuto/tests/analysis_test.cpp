@@ -712,6 +712,18 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"French",
        "Il ne faut pas donner plus que les droits utiles et il convient de garder des copies.",
        false},
+      {"English",
+       "The filter weighs the IP address/sender/recipient triplet and looks in its table whether "
+       "it was seen.",
+       false},
+      {"English",
+       "Two options are needed to turn on logging, and the log_max_size setting needs to be set.",
+       false},
+      {"English", "Set the log_level, the max_size, and the dry_run in the file.", true},
+      {"French",
+       "Le journal est gardé dans un dossier et chaque entrée commençant par une date (suivie "
+       "d'un point) marque la fin d'une session.",
+       false},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

@@ -1193,6 +1193,12 @@ class StructureBuilder {
         (xObjectAt(object) || fTokens[object].role == Role::Noun) &&
         xThirdSingularVerbBefore(previous))
       return true;
+    // A lone verb of the third person before a preposition, after a clause whose verb is one
+    // too: a second action ("it considers the sender/recipient triplet and checks in its
+    // database whether").
+    if (single && lone.thirdSingular && lone.firstClass == WORD_CLASS_VERB && xIsPreposition(next) &&
+        !isOneOf(fTokens[next].lower, kListPrepositions) && xThirdSingularVerbBefore(previous))
+      return true;
     // A subject led by a determiner, with a noun between, whose last word can be a verb of
     // the third person before that verb's object, where the clause's verb is one too ("handles
     // activation and configuration of interfaces and a user interface controls this daemon").
@@ -1279,8 +1285,12 @@ class StructureBuilder {
         (!fTokens[leftLast].finite || xFiniteBetween(fGroups[leftGroup].firstToken, leftLast) ||
          (fGroups[leftGroup].firstToken < leftLast &&
           fTokens[fGroups[leftGroup].firstToken].role == Role::Auxiliary));
+    // After a comma, a name whose words are joined by marks goes on past a group led by a
+    // determiner ("and the smtpd_recipient_restrictions parameter needs"; but "ltmain.sh, and
+    // Makefile.in may be ignored" stays a list).
     if (next >= fTokens.size() ||
-        (fTokens[next].type != Token::Word && !(leftVerb && xInWordMark(next))))
+        (fTokens[next].type != Token::Word && !(leftVerb && xInWordMark(next)) &&
+         !(commaBefore && lone.role == Role::Determiner && xJoiningMark(next))))
       return false;
     const bool beginsClause = lead == 0 || xBeginsClause(lead - 1);
     const Role after = fTokens[next].type == Token::Word ? fTokens[next].role : Role::Interjection;
@@ -1314,7 +1324,19 @@ class StructureBuilder {
         !commaBefore && !leftVerb && xCliticVerbAfter(next) && xFiniteClauseBefore(previous);
     std::size_t k = next;
     bool afterRelative = false;
+    bool afterParticiple = false;
+    // After a subject led by a determiner and a participle phrase, an aside in brackets, then
+    // a word that can be a verb of the third person before its object: that verb, which its
+    // neighbours made a noun ("et chaque ligne débutant par From (suivi d'une espace) marque
+    // le début").
+    bool asideVerb = false;
     while (k < fTokens.size()) {
+      if (afterParticiple && lone.role == Role::Determiner && xPastAside(k) != k) {
+        k = xPastAside(k);
+        asideVerb = xIsWord(k) && fTokens[k].has(WORD_CLASS_VERB) && fTokens[k].thirdSingular &&
+                    xIsWord(k + 1) && fTokens[k + 1].role == Role::Determiner;
+        break;
+      }
       if (fGroupOfToken[k] != kNone && fGroups[fGroupOfToken[k]].kind == STRUCTURE_VERB) {
         // A participle that qualifies the item, before its preposition ("the pears picked
         // in May", "all of the packages listed in this field must be"), unless the item is
@@ -1324,6 +1346,7 @@ class StructureBuilder {
             fTokens[end].role != Role::Preposition)
           break;
         k = end;
+        afterParticiple = true;
         continue;
       }
       if (!commaBefore && !leftVerb && !cliticVerb)
@@ -1365,13 +1388,13 @@ class StructureBuilder {
         break;
       ++k;
     }
-    if (k >= fTokens.size() || fGroupOfToken[k] == kNone ||
-        fGroups[fGroupOfToken[k]].kind != STRUCTURE_VERB)
+    if (!asideVerb && (k >= fTokens.size() || fGroupOfToken[k] == kNone ||
+                       fGroups[fGroupOfToken[k]].kind != STRUCTURE_VERB))
       return false;
     // Not the verb of a preposition or of a determiner ("in order to ease", "this install
     // file"); but the pronoun of a preposition may come before the verb ("a few of them
     // were").
-    if (leftVerb && k != next &&
+    if (leftVerb && k != next && !asideVerb &&
         (!xFiniteGroup(fGroupOfToken[k]) || fTokens[k - 1].type != Token::Word ||
          (fTokens[k - 1].role == Role::Preposition && fTokens[k].role != Role::Pronoun &&
           fTokens[k].role != Role::Clitic && !xAdverbialPreposition(k - 1)) ||
@@ -1396,7 +1419,7 @@ class StructureBuilder {
       return false;
     // The verb stands apart from the word before it: a piece of a name is no verb ("or
     // debian-release@lists", "that gets posted to debian-devel-changes@lists").
-    if (!xSpacedBefore(k) && (k == next || afterRelative))
+    if (!xSpacedBefore(k) && (k == next || afterRelative || xInWordMark(k - 1)))
       return false;
     if (k == next && !beginsClause)
       return true;
@@ -1608,7 +1631,8 @@ class StructureBuilder {
           continue;
         return false;
       }
-      if (token.coordination != Coordination::None)
+      // A piece of a path or name is no verb ("the address/sender/recipient triplet").
+      if (token.coordination != Coordination::None || xJoiningMark(t + 1))
         continue;
       if (token.role == Role::Subordinator || isOneOf(token.lower, kRelativeWords) ||
           isOneOf(token.lower, kQuestionWords))
