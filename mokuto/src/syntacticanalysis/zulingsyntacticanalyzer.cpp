@@ -1258,8 +1258,7 @@ class StructureBuilder {
     // pour les lancer").
     if (right.firstToken != group.firstToken &&
         isOneOf(fTokens[right.firstToken].lower, kInfinitiveLeads) &&
-        fTokens[group.lastToken].infinitive && xPronounsBefore(group) &&
-        xLedInfinitiveBefore(lead))
+        fTokens[group.lastToken].infinitive && xPronounsBefore(group) && xLedInfinitiveBefore(lead))
       return true;
     // A noun or verb that can be an infinitive, before its object or a preposition, after
     // an item that is the complement of a verb of that form and its object: a second action
@@ -1683,7 +1682,6 @@ class StructureBuilder {
            fTokens[p + 1].thirdSingular;
   }
 
-  // Whether the sentence before token t has a verb of the present participle.
   // Whether verb group g has a present participle and begins the text, or follows a comma,
   // a preposition or a coordinating word ("by choosing", ", adding", "and running").
   bool xLeadingGerund(std::size_t g) const {
@@ -1711,8 +1709,10 @@ class StructureBuilder {
   // whose last word is an infinitive, led by "de", "à" or "pour" ("de nommer le fichier
   // preseed.cfg").
   bool xLedInfinitiveBefore(std::size_t t) const {
-    while (t > 0 && (xInWordMark(t - 1) || (fGroupOfToken[t - 1] != kNone &&
-                                            fGroups[fGroupOfToken[t - 1]].kind == STRUCTURE_NOMINAL)))
+    const auto nominal = [&](std::size_t u) {
+      return fGroupOfToken[u] != kNone && fGroups[fGroupOfToken[u]].kind == STRUCTURE_NOMINAL;
+    };
+    while (t > 0 && (xInWordMark(t - 1) || nominal(t - 1)))
       t = xInWordMark(t - 1) ? t - 1 : fGroups[fGroupOfToken[t - 1]].firstToken;
     if (t < 2 || fGroupOfToken[t - 1] == kNone)
       return false;
@@ -1722,6 +1722,7 @@ class StructureBuilder {
            isOneOf(fTokens[verb.firstToken - 1].lower, kInfinitiveLeads);
   }
 
+  // Whether the sentence before token t has a verb of the present participle.
   bool xGerundBefore(std::size_t t) const {
     while (t > 0) {
       --t;
