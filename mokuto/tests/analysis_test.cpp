@@ -724,6 +724,12 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
        "Le journal est gardé dans un dossier et chaque entrée commençant par une date (suivie "
        "d'un point) marque la fin d'une session.",
        false},
+      {"English",
+       "It lets you build a system by choosing a set of the packages, configuring them with a "
+       "tool, adding specific software, and executing custom scripts at the end.",
+       false},
+      {"French", "Il suffit de nommer le document notes.txt et de le placer à la racine du disque.",
+       false},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

@@ -39,6 +39,8 @@ constexpr std::array<std::string_view, 7> kListPrepositions = {"of",  "de",     
 // The preposition of an infinitive that complements a verb: "helps to identify", "aide à
 // identifier".
 constexpr std::array<std::string_view, 2> kInfinitiveWords = {"to", "à"};
+// Prepositions that lead a French infinitive of a second action ("et de le placer").
+constexpr std::array<std::string_view, 4> kInfinitiveLeads = {"de", "d", "à", "pour"};
 // Words that begin an indirect question or a relative clause.
 constexpr std::array<std::string_view, 14> kQuestionWords = {
     "how",  "why",   "what",    "whether", "comment", "pourquoi", "combien",
@@ -1244,6 +1246,20 @@ class StructureBuilder {
     // editing the template"; not "I like apples and swimming").
     if (single && lone.gerund && afterVerb && xGerundBefore(previous))
       return true;
+    // A present participle before its object, after an item that is the object of one that
+    // leads its phrase: the next action of a series ("by choosing a set of packages, adding
+    // some software, and running scripts"; not "by adding salt and pepper", "our bug
+    // tracking system and mailing lists").
+    if (!single && lone.gerund && afterVerb && xLeadingGerund(fGroupOfToken[lead - 1]))
+      return true;
+    // "de", "à" or "pour" before an infinitive, its object pronouns between or not, after
+    // an item that is the object of an infinitive led by one of those: a second action
+    // ("de renommer le document notes.txt et de le ranger", "pour copier les fichiers et
+    // pour les lancer").
+    if (right.firstToken != group.firstToken &&
+        isOneOf(fTokens[right.firstToken].lower, kInfinitiveLeads) &&
+        fTokens[group.lastToken].infinitive && xPronounsBefore(group) && xLedInfinitiveBefore(lead))
+      return true;
     // A noun or verb that can be an infinitive, before its object or a preposition, after
     // an item that is the complement of a verb of that form and its object: a second action
     // of the same form ("to give privileges to users and log root activity", "provide
@@ -1664,6 +1680,46 @@ class StructureBuilder {
   bool xAdverbialPreposition(std::size_t p) const {
     return p > 0 && xIsWord(p - 1) && fTokens[p - 1].role == Role::Adverb && xIsWord(p + 1) &&
            fTokens[p + 1].thirdSingular;
+  }
+
+  // Whether verb group g has a present participle and begins the text, or follows a comma,
+  // a preposition or a coordinating word ("by choosing", ", adding", "and running").
+  bool xLeadingGerund(std::size_t g) const {
+    const Group& verb = fGroups[g];
+    bool gerund = false;
+    for (std::size_t t = verb.firstToken; t <= verb.lastToken; ++t)
+      gerund = gerund || (fTokens[t].type == Token::Word && fTokens[t].role == Role::Verb &&
+                          fTokens[t].gerund);
+    if (!gerund || verb.firstToken == 0)
+      return gerund;
+    const Token& before = fTokens[verb.firstToken - 1];
+    return before.type == Token::Comma || xIsPreposition(verb.firstToken - 1) ||
+           (before.type == Token::Word && before.coordination != Coordination::None);
+  }
+
+  // Whether every word of group g before its last one can be an object pronoun.
+  bool xPronounsBefore(const Group& g) const {
+    for (std::size_t t = g.firstToken; t < g.lastToken; ++t)
+      if (!fTokens[t].has(WORD_CLASS_PRONOUN_COMP))
+        return false;
+    return true;
+  }
+
+  // Whether the nominal groups and marks that end before token t follow a verb group
+  // whose last word is an infinitive, led by "de", "à" or "pour" ("de nommer le fichier
+  // preseed.cfg").
+  bool xLedInfinitiveBefore(std::size_t t) const {
+    const auto nominal = [&](std::size_t u) {
+      return fGroupOfToken[u] != kNone && fGroups[fGroupOfToken[u]].kind == STRUCTURE_NOMINAL;
+    };
+    while (t > 0 && (xInWordMark(t - 1) || nominal(t - 1)))
+      t = xInWordMark(t - 1) ? t - 1 : fGroups[fGroupOfToken[t - 1]].firstToken;
+    if (t < 2 || fGroupOfToken[t - 1] == kNone)
+      return false;
+    const Group& verb = fGroups[fGroupOfToken[t - 1]];
+    return verb.kind == STRUCTURE_VERB && fTokens[verb.lastToken].infinitive &&
+           verb.firstToken > 0 && xIsWord(verb.firstToken - 1) &&
+           isOneOf(fTokens[verb.firstToken - 1].lower, kInfinitiveLeads);
   }
 
   // Whether the sentence before token t has a verb of the present participle.
