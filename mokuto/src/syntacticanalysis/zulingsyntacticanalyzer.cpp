@@ -1198,8 +1198,9 @@ class StructureBuilder {
     // A lone verb of the third person before a preposition, after a clause whose verb is one
     // too: a second action ("it considers the sender/recipient triplet and checks in its
     // database whether").
-    if (single && lone.thirdSingular && lone.firstClass == WORD_CLASS_VERB && xIsPreposition(next) &&
-        !isOneOf(fTokens[next].lower, kListPrepositions) && xThirdSingularVerbBefore(previous))
+    if (single && lone.thirdSingular && lone.firstClass == WORD_CLASS_VERB &&
+        xIsPreposition(next) && !isOneOf(fTokens[next].lower, kListPrepositions) &&
+        xThirdSingularVerbBefore(previous))
       return true;
     // A subject led by a determiner, with a noun between, whose last word can be a verb of
     // the third person before that verb's object, where the clause's verb is one too ("handles
