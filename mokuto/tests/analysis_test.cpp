@@ -730,6 +730,10 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
        false},
       {"French", "Il suffit de nommer le document notes.txt et de le placer à la racine du disque.",
        false},
+      {"English", "The best way is to skip the usual traps and get quick replies.", false},
+      {"English", "Use the flag to filter results and target precise data.", false},
+      {"English", "I want to buy red apples and green organic pears.", true},
+      {"English", "The page shows the open bugs and release critical issues.", true},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);
