@@ -734,6 +734,11 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
       {"English", "Use the flag to filter results and target precise data.", false},
       {"English", "I want to buy red apples and green organic pears.", true},
       {"English", "The page shows the open bugs and release critical issues.", true},
+      {"English",
+       "The stub is kept as a small package, relying on the new one and shipping only the basic "
+       "files.",
+       false},
+      {"English", "It works by relying on the tracking system and mailing lists.", true},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

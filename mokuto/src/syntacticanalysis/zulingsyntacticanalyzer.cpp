@@ -1276,6 +1276,15 @@ class StructureBuilder {
     // tracking system and mailing lists").
     if (!single && lone.gerund && afterVerb && xLeadingGerund(fGroupOfToken[lead - 1]))
       return true;
+    // So does one before its object, adverbs between, after an item led by the preposition of
+    // such a participle ("relying on the new one and shipping only the basic files";
+    // not "relying on the tracking system and mailing lists").
+    if (!single && lone.gerund && lead >= 2 && xIsPreposition(lead - 1) &&
+        !isOneOf(fTokens[lead - 1].lower, kListPrepositions) && fGroupOfToken[lead - 2] != kNone &&
+        fGroups[fGroupOfToken[lead - 2]].kind == STRUCTURE_VERB &&
+        fGroups[fGroupOfToken[lead - 2]].lastToken == lead - 2 &&
+        xLeadingGerund(fGroupOfToken[lead - 2]) && xObjectAt(object))
+      return true;
     // "de", "à" or "pour" before an infinitive, its object pronouns between or not, after
     // an item that is the object of an infinitive led by one of those: a second action
     // ("de renommer le document notes.txt et de le ranger", "pour copier les fichiers et
