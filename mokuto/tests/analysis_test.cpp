@@ -730,6 +730,15 @@ TEST_F(RealDatabases, OnlyThingsAreEnumerated) {
        false},
       {"French", "Il suffit de nommer le document notes.txt et de le placer à la racine du disque.",
        false},
+      {"English", "The best way is to skip the usual traps and get quick replies.", false},
+      {"English", "Use the flag to filter results and target precise data.", false},
+      {"English", "I want to buy red apples and green organic pears.", true},
+      {"English", "The page shows the open bugs and release critical issues.", true},
+      {"English",
+       "The stub is kept as a small package, relying on the new one and shipping only the basic "
+       "files.",
+       false},
+      {"English", "It works by relying on the tracking system and mailing lists.", true},
   };
   for (const Case& c : cases) {
     ZULingSyntacticAnalyzer analyzer(languages_);

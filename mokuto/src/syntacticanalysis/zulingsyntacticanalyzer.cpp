@@ -826,6 +826,22 @@ class StructureBuilder {
     }
   }
 
+  // Whether token t is an adjective or an adverb, and the words after it up to a noun are
+  // too ("quick replies", "precise data").
+  bool xQualifiedNounAt(std::size_t t) const {
+    if (!xIsWord(t) || (fTokens[t].role != Role::Adjective && fTokens[t].role != Role::Adverb))
+      return false;
+    while (xIsWord(t) && (fTokens[t].role == Role::Adjective || fTokens[t].role == Role::Adverb))
+      ++t;
+    return xIsWord(t) && fTokens[t].has(WORD_CLASS_NOUN);
+  }
+
+  // Whether token t is a verb of the base form led by "to" ("to avoid").
+  bool xToInfinitiveAt(std::size_t t) const {
+    return t > 0 && xIsWord(t) && fTokens[t].role == Role::Verb && fTokens[t].infinitive &&
+           xIsWord(t - 1) && fTokens[t - 1].lower == "to";
+  }
+
   // Where words are not spaced (Japanese): after a verb or an auxiliary, a word that
   // can be an auxiliary is one ("食べ" + "ない").
   void xUnspacedRoles() {
@@ -1181,8 +1197,15 @@ class StructureBuilder {
       return true;
     if (leftItems == 1 && right.firstToken == group.firstToken && xGappedClause(group, lead, next))
       return true;
-    // A word that can be a verb, before its object.
-    if (!single && afterVerb && lone.infinitive && xObjectAt(group.firstToken + 1))
+    // A word that can be a verb, before its object. After an infinitive led by "to" and its
+    // object, a word that is first a verb or a noun may also begin a second action before an
+    // object that an adjective or an adverb leads ("to skip the usual traps and get quick
+    // replies", "to filter results and target precise data"; not "to buy red apples and green
+    // organic pears", nor "shows the open bugs and release critical issues").
+    if (!single && afterVerb && lone.infinitive &&
+        (xObjectAt(group.firstToken + 1) ||
+         ((lone.firstClass == WORD_CLASS_VERB || lone.firstClass == WORD_CLASS_NOUN) &&
+          xQualifiedNounAt(group.firstToken + 1) && xToInfinitiveAt(lead - 1))))
       return true;
     // A verb of the third person before its object (adverbs between), after a clause whose
     // verb is one too or of the simple past ("it loads the image to the memory and hands
@@ -1252,6 +1275,15 @@ class StructureBuilder {
     // some software, and running scripts"; not "by adding salt and pepper", "our bug
     // tracking system and mailing lists").
     if (!single && lone.gerund && afterVerb && xLeadingGerund(fGroupOfToken[lead - 1]))
+      return true;
+    // So does one before its object, adverbs between, after an item led by the preposition of
+    // such a participle ("relying on the new one and shipping only the basic files";
+    // not "relying on the tracking system and mailing lists").
+    if (!single && lone.gerund && lead >= 2 && xIsPreposition(lead - 1) &&
+        !isOneOf(fTokens[lead - 1].lower, kListPrepositions) && fGroupOfToken[lead - 2] != kNone &&
+        fGroups[fGroupOfToken[lead - 2]].kind == STRUCTURE_VERB &&
+        fGroups[fGroupOfToken[lead - 2]].lastToken == lead - 2 &&
+        xLeadingGerund(fGroupOfToken[lead - 2]) && xObjectAt(object))
       return true;
     // "de", "à" or "pour" before an infinitive, its object pronouns between or not, after
     // an item that is the object of an infinitive led by one of those: a second action
