@@ -12,8 +12,10 @@
 // none of them is on its way (until then the wait goes on), and one that arrived meanwhile
 // ends the wait as a wake-up would: the waiter looks again, and its limit begins anew.
 //
-// Any thread may wait on it; the time is an atomic. Watch before the service's first wait.
+// Any thread may wait on it; the time is an atomic, the held rounds are under a mutex of
+// their own. Watch before the service's first wait.
 
+#include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <condition_variable>
@@ -22,6 +24,7 @@
 #include <functional>
 #include <mutex>
 #include <utility>
+#include <vector>
 
 #include "mokuto/mokutoclock.h"
 
@@ -33,14 +36,8 @@ class DrivenClock : public ZU::MokutoClock {
 
   std::cv_status waitFor(std::condition_variable& condition, std::unique_lock<std::mutex>& lock,
                          std::chrono::microseconds duration, Wait wait) override {
-    if (wait == Wait::Round && fHoldRounds.load()) {
-      ++fHeldRounds;
-      std::cv_status status = std::cv_status::timeout;
-      while (fHoldRounds.load() && status == std::cv_status::timeout)
-        status = condition.wait_for(lock, std::chrono::milliseconds(5));
-      --fHeldRounds;
-      return status;
-    }
+    if (wait == Wait::Round && xHeldRound(condition, lock))
+      return std::cv_status::no_timeout;
     const auto real = std::chrono::duration_cast<std::chrono::microseconds>(duration * fScale);
     const std::uint64_t before = fDelivered ? fDelivered() : 0;
     const std::cv_status status = condition.wait_for(lock, real);
@@ -65,9 +62,22 @@ class DrivenClock : public ZU::MokutoClock {
     fDelivered = std::move(delivered);
   }
 
-  void holdRounds(bool hold) { fHoldRounds = hold; }
+  // Released, the held rounds end at once: a waiter may be on its way into its wait, so they
+  // are woken until none is left.
+  void holdRounds(bool hold) {
+    std::unique_lock held(fHeldMutex);
+    fHoldRounds = hold;
+    while (!hold && !fHeld.empty()) {
+      for (std::condition_variable* condition : fHeld)
+        condition->notify_all();
+      fHeldLeft.wait_for(held, kDeliveryPoll);
+    }
+  }
   // The threads waiting in a held round now.
-  int heldRounds() const { return fHeldRounds.load(); }
+  int heldRounds() const {
+    std::lock_guard held(fHeldMutex);
+    return static_cast<int>(fHeld.size());
+  }
 
   // The limits that ran out so far, in the robot's time.
   std::chrono::milliseconds now() const {
@@ -78,12 +88,32 @@ class DrivenClock : public ZU::MokutoClock {
  private:
   static constexpr auto kDeliveryPoll = std::chrono::milliseconds(5);
 
+  // A held round waits without a deadline: a timed wait that its notify reaches only after
+  // the deadline (a loaded machine) reports a timeout, and the round would miss its wake-up.
+  bool xHeldRound(std::condition_variable& condition, std::unique_lock<std::mutex>& lock) {
+    {
+      std::lock_guard held(fHeldMutex);
+      if (!fHoldRounds)
+        return false;
+      fHeld.push_back(&condition);
+    }
+    condition.wait(lock);
+    {
+      std::lock_guard held(fHeldMutex);
+      fHeld.erase(std::find(fHeld.begin(), fHeld.end(), &condition));
+    }
+    fHeldLeft.notify_all();
+    return true;
+  }
+
   const double fScale;
   std::function<std::size_t()> fUndelivered;
   std::function<std::uint64_t()> fDelivered;
   std::atomic<std::int64_t> fNowUs{0};
-  std::atomic<bool> fHoldRounds{false};
-  std::atomic<int> fHeldRounds{0};
+  mutable std::mutex fHeldMutex;
+  bool fHoldRounds = false;                     // with fHeldMutex
+  std::vector<std::condition_variable*> fHeld;  // the held rounds' conditions, with fHeldMutex
+  std::condition_variable fHeldLeft;            // a held round ended
 };
 
 }  // namespace mokutotest
